@@ -1,0 +1,45 @@
+// The nine errors that this system makes. Each constructor makes one error value of kDVErrorDomain; errors of extensions and of the
+// platform are passed on as they come, or stand beneath one of these.
+#pragma once
+
+#include <cstdint>
+#include <optional>
+#include <string>
+#include <string_view>
+
+#include "platform/QXError.h"
+#include "platform/QXURL.h"
+#include "platform/identifiers.h"
+
+namespace docuvend {
+
+inline constexpr const char* kDVErrorDomain = "DVErrorDomain";
+
+// The codes stand on the wire: they are never renumbered.
+enum class DVErrorCode : std::int64_t {
+  clientLacksEntitlement = 1,
+  notPermitted = 2,
+  invalidBookmarkableString = 3,
+  invalidParameter = 4,
+  notFound = 5,
+  notFoundURL = 6,
+  pluginOperationFailed = 7,
+  proxyNotFound = 8,
+  sandboxExtensionFailed = 9,
+};
+
+[[nodiscard]] QXError DVClientLacksEntitlement();
+[[nodiscard]] QXError DVNotPermittedError();
+[[nodiscard]] QXError DVInvalidBookmarkableStringError();
+// `parameter` is the parameter's name; text "parameter" carries it, text "value" the offending value if there is one.
+[[nodiscard]] QXError DVInvalidParameterError(std::string_view parameter, const std::optional<std::string>& value);
+// Text "identifier" carries what was not found.
+[[nodiscard]] QXError DVNotFoundError(const ProviderID& identifier);
+[[nodiscard]] QXError DVNotFoundError(const QXError& underlying);
+[[nodiscard]] QXError DVNotFoundErrorURL(const QXURL& url);
+[[nodiscard]] QXError DVPluginOperationFailedError(const std::optional<QXError>& underlying);
+// Text "identifier" carries the provider's identifier.
+[[nodiscard]] QXError DVProxyNotFoundError(const std::optional<ProviderID>& provider);
+[[nodiscard]] QXError DVSandboxExtensionFailedError(const std::optional<QXURL>& url);
+
+}  // namespace docuvend

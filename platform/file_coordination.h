@@ -1,0 +1,49 @@
+// The file-coordination service and what it asks of a provider.
+#pragma once
+
+#include <memory>
+#include <optional>
+#include <string>
+
+#include "platform/QXURL.h"
+#include "platform/queue.h"
+
+namespace docuvend {
+
+// Names a reader or a writer to the provider; only printed.
+struct QXCoordinationID {
+  std::string value;
+};
+
+// What a provider object answers. Called on threads of the service's choosing.
+class QXDocuvend {
+ public:
+  QXDocuvend() = default;
+  QXDocuvend(const QXDocuvend&) = delete;
+  QXDocuvend& operator=(const QXDocuvend&) = delete;
+  virtual ~QXDocuvend() = default;
+
+  // The directory whose files this object provides; absent: none yet.
+  [[nodiscard]] virtual std::optional<QXURL> _providedItemsURL() const = 0;
+  [[nodiscard]] virtual std::shared_ptr<QXOperationQueue> _providedItemsOperationQueue() const = 0;
+  // Under which identity the service knows this object.
+  [[nodiscard]] virtual std::optional<std::string> _fileReactorID() const = 0;
+
+  // A writer has finished with a file in the directory.
+  virtual void _writerWithID(const QXCoordinationID& writer, const QXURL& didFinishWritingForURL) = 0;
+};
+
+class QXFileCoordinator {
+ public:
+  QXFileCoordinator() = default;
+  QXFileCoordinator(const QXFileCoordinator&) = delete;
+  QXFileCoordinator& operator=(const QXFileCoordinator&) = delete;
+  virtual ~QXFileCoordinator() = default;
+
+  // Each addition counts; the service keeps the object alive until it has been removed as often.
+  virtual void _addDocuvend(std::shared_ptr<QXDocuvend> provider) = 0;
+  // Removing an object that is not there is harmless.
+  virtual void _removeDocuvend(const std::shared_ptr<QXDocuvend>& provider) = 0;
+};
+
+}  // namespace docuvend

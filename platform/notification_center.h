@@ -1,0 +1,25 @@
+// System-wide notifications between processes.
+#pragma once
+
+#include <functional>
+#include <string>
+
+namespace docuvend {
+
+inline constexpr const char* kQXFirstUnlockNotification = "com.orvane.mobile.gatewardd.first_unlock";
+
+// When a notification reaches an observer; the values are the platform's.
+enum class QXSuspensionBehavior { deliverImmediately = 4 };
+
+class QXNotificationCenter {
+ public:
+  QXNotificationCenter() = default;
+  QXNotificationCenter(const QXNotificationCenter&) = delete;
+  QXNotificationCenter& operator=(const QXNotificationCenter&) = delete;
+  virtual ~QXNotificationCenter() = default;
+
+  // Calls back on the main run loop each time the notification is posted, for the life of the process.
+  virtual void addObserver(const std::string& notification, std::function<void()> callback, QXSuspensionBehavior behavior) = 0;
+};
+
+}  // namespace docuvend

@@ -1,0 +1,36 @@
+// Property lists in files.
+#pragma once
+
+#include <istream>
+#include <memory>
+#include <optional>
+#include <string>
+
+#include "platform/QXError.h"
+#include "platform/QXValue.h"
+
+namespace docuvend {
+
+class QXPropertyLists {
+ public:
+  // Both may be absent, and both may be present; the caller looks at the error to know whether reading went well.
+  struct ReadResult {
+    std::optional<QXValue> value;
+    std::optional<QXError> error;
+  };
+
+  QXPropertyLists() = default;
+  QXPropertyLists(const QXPropertyLists&) = delete;
+  QXPropertyLists& operator=(const QXPropertyLists&) = delete;
+  virtual ~QXPropertyLists() = default;
+
+  // An input stream on a file; null when none can be created.
+  [[nodiscard]] virtual std::unique_ptr<std::istream> openStream(const std::string& path) = 0;
+  // Parses one property list. Size, depth and the values that XML cannot carry are bounded.
+  [[nodiscard]] virtual ReadResult read(std::istream& stream) = 0;
+  // Writes the XML encoding so that a reader sees the old file or the new one, and the new one is on disk when this returns. A file
+  // that could not be read as a property list is kept beside under another name before it is first overwritten. False: not written.
+  [[nodiscard]] virtual bool writeXMLAtomically(const QXDictionary& dictionary, const std::string& path) = 0;
+};
+
+}  // namespace docuvend

@@ -1,0 +1,30 @@
+// What confined processes may open.
+#pragma once
+
+#include <optional>
+#include <string>
+#include <string_view>
+
+#include "platform/rpc.h"
+
+namespace docuvend {
+
+inline constexpr std::string_view kQXSandboxFileWriteData = "file-write-data";
+
+class QXSandbox {
+ public:
+  QXSandbox() = default;
+  QXSandbox(const QXSandbox&) = delete;
+  QXSandbox& operator=(const QXSandbox&) = delete;
+  virtual ~QXSandbox() = default;
+
+  // Issues a read-write extension for the file at that path: printable text that whoever holds it can redeem for an open file.
+  // None when the platform refuses one for this path.
+  [[nodiscard]] virtual std::optional<std::string> issueReadWriteExtension(const std::string& path) = 0;
+
+  // 0: the process that the token identifies may perform the operation on the path. Any other number: it may not, or the question
+  // could not be answered. Leaves no trace.
+  [[nodiscard]] virtual int checkWithoutReport(const QXAuditToken& token, std::string_view operation, const std::string& path) = 0;
+};
+
+}  // namespace docuvend

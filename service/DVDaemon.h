@@ -1,0 +1,75 @@
+// What a client may ask of the daemon, at the named service "com.orvane.Docuvend".
+//
+// Header-only and made of platform values alone: client libraries include it too. URLs are file URLs; an absent error is success; on
+// failure every value beside the error is absent. Replies come once, on a thread of the RPC layer at the client.
+#pragma once
+
+#include <functional>
+#include <optional>
+#include <string>
+#include <string_view>
+#include <tuple>
+
+#include "platform/QXValue.h"
+#include "platform/identifiers.h"
+#include "platform/rpc_protocol.h"
+
+namespace docuvend {
+
+inline constexpr const char* kDVServiceName = "com.orvane.Docuvend";
+
+class DVDaemon {
+ public:
+  using Done = std::function<void()>;
+  using ErrorReply = std::function<void(std::optional<QXError>)>;
+  // An error; the item's sandbox token; its hidden sibling's URL; the sibling's token. A token may be absent on success: the platform
+  // refused to issue it.
+  using SandboxReply = std::function<void(std::optional<QXError>, std::optional<QXData> itemToken, std::optional<QXURL> siblingURL,
+                                          std::optional<QXData> siblingToken)>;
+  // Keyed by provider identifier; each value a dictionary with "documentStorageURL" and "providerIdentifier", or less.
+  using ProvidersReply = std::function<void(std::optional<QXError>, std::optional<QXDictionary> providers)>;
+  using StringReply = std::function<void(std::optional<std::string> bookmarkableString, std::optional<QXError>)>;
+  using DocumentReply = std::function<void(std::optional<QXURL>, std::optional<QXData> itemToken, std::optional<QXURL> siblingURL,
+                                           std::optional<QXData> siblingToken, std::optional<QXError>)>;
+
+  DVDaemon() = default;
+  DVDaemon(const DVDaemon&) = delete;
+  DVDaemon& operator=(const DVDaemon&) = delete;
+  virtual ~DVDaemon() = default;
+
+  // Makes sure that the daemon runs. Needs no right.
+  virtual void wakeUpCompletion(Done completion) = 0;
+
+  // Grants the consumer the item and issues tokens for it. Needs "com.orvane.docuvend.acl-write".
+  virtual void extendSandboxForFileURL(std::optional<QXURL> url, std::optional<ProviderID> fromProviderID,
+                                       std::optional<ConsumerID> toConsumerID, SandboxReply completionHandler) = 0;
+
+  // Has the provider materialise the item. Needs "com.orvane.docuvend.acl-read" or "com.orvane.docuvend.acl-write", and a grant.
+  virtual void startProvidingItemAtURL(std::optional<QXURL> url, std::optional<ProviderID> fromProviderID,
+                                       std::optional<ConsumerID> forConsumerID, ErrorReply completionHandler) = 0;
+
+  // Lists the providers. Needs either entitlement.
+  virtual void providersCompletionHandler(ProvidersReply completionHandler) = 0;
+
+  // Names the document in a form that outlives its URL. Needs no right. Neither string nor error: no provider owns the URL.
+  virtual void bookmarkableStringFromDocumentURL(std::optional<QXURL> url, StringReply completion) = 0;
+
+  // The way back, with fresh tokens. Needs a grant to the caller itself. Never answered when the provider named in the string is not
+  // registered: the caller sets its own deadline.
+  virtual void documentURLFromBookmarkableString(std::optional<std::string> string, DocumentReply completion) = 0;
+};
+
+template <>
+struct QXProtocolTable<DVDaemon> {
+  static constexpr std::string_view name = "DVDaemon";
+  static constexpr auto operations = std::tuple{
+      QXOperation<&DVDaemon::wakeUpCompletion>{"wakeUpCompletion:"},
+      QXOperation<&DVDaemon::extendSandboxForFileURL>{"extendSandboxForFileURL:fromProviderID:toConsumerID:completionHandler:"},
+      QXOperation<&DVDaemon::startProvidingItemAtURL>{"startProvidingItemAtURL:fromProviderID:forConsumerID:completionHandler:"},
+      QXOperation<&DVDaemon::providersCompletionHandler>{"providersCompletionHandler:"},
+      QXOperation<&DVDaemon::bookmarkableStringFromDocumentURL>{"bookmarkableStringFromDocumentURL:completion:"},
+      QXOperation<&DVDaemon::documentURLFromBookmarkableString>{"documentURLFromBookmarkableString:completion:"},
+  };
+};
+
+}  // namespace docuvend
