@@ -1,0 +1,45 @@
+#include "platform/fake/FakeSandbox.h"
+
+namespace docuvend::fake_platform {
+
+void FakeSandbox::refuseIssuing(const std::string& path) {
+  const std::lock_guard lock(mutex_);
+  refused_.insert(path);
+}
+
+void FakeSandbox::setAnswer(int code) {
+  const std::lock_guard lock(mutex_);
+  answer_ = code;
+}
+
+void FakeSandbox::setAnswer(const std::string& path, int code) {
+  const std::lock_guard lock(mutex_);
+  answers_[path] = code;
+}
+
+std::vector<std::string> FakeSandbox::issueCalls() const {
+  const std::lock_guard lock(mutex_);
+  return issueCalls_;
+}
+
+std::vector<FakeSandbox::Check> FakeSandbox::checks() const {
+  const std::lock_guard lock(mutex_);
+  return checks_;
+}
+
+std::optional<std::string> FakeSandbox::issueReadWriteExtension(const std::string& path) {
+  const std::lock_guard lock(mutex_);
+  issueCalls_.push_back(path);
+  if (refused_.contains(path)) return std::nullopt;
+  return "token:" + path;
+}
+
+int FakeSandbox::checkWithoutReport(const QXAuditToken& token, std::string_view operation, const std::string& path) {
+  const std::lock_guard lock(mutex_);
+  checks_.push_back({token, std::string(operation), path});
+  if (token == QXAuditToken{} || operation != kQXSandboxFileWriteData) return kRefused;
+  const auto found = answers_.find(path);
+  return found == answers_.end() ? answer_ : found->second;
+}
+
+}  // namespace docuvend::fake_platform

@@ -1,0 +1,54 @@
+// The sandbox in memory.
+//
+// Differs from the real one: a token is "token:" and the path, whatever lies at the path; the answer to a check is what the test has
+// set, except that the zero token and any operation but writing are refused as the platform refuses them. May be used from any thread.
+#pragma once
+
+#include <map>
+#include <mutex>
+#include <set>
+#include <string>
+#include <vector>
+
+#include "platform/sandbox.h"
+
+namespace docuvend::fake_platform {
+
+class FakeSandbox final : public QXSandbox {
+ public:
+  static constexpr int kAllowed = 0;
+  static constexpr int kRefused = 1;
+
+  struct Check {
+    QXAuditToken token;
+    std::string operation;
+    std::string path;
+    friend bool operator==(const Check&, const Check&) = default;
+  };
+
+  // From now on no token is issued for the path.
+  void refuseIssuing(const std::string& path);
+  // What every check answers that nothing else was set for; at first kRefused.
+  void setAnswer(int code);
+  // What a check of that path answers.
+  void setAnswer(const std::string& path, int code);
+
+  // The paths that tokens were asked for, in order, refused ones included.
+  [[nodiscard]] std::vector<std::string> issueCalls() const;
+  // What was checked, in order.
+  [[nodiscard]] std::vector<Check> checks() const;
+
+  std::optional<std::string> issueReadWriteExtension(const std::string& path) override;
+  int checkWithoutReport(const QXAuditToken& token, std::string_view operation, const std::string& path) override;
+
+ private:
+  mutable std::mutex mutex_;
+  // Guarded by mutex_.
+  std::set<std::string> refused_;
+  std::map<std::string, int> answers_;
+  int answer_ = kRefused;
+  std::vector<std::string> issueCalls_;
+  std::vector<Check> checks_;
+};
+
+}  // namespace docuvend::fake_platform
