@@ -133,6 +133,17 @@ class DVExtensionDocuvend final : public QXDocuvend, public std::enable_shared_f
  private:
   explicit DVExtensionDocuvend(std::shared_ptr<QXExtension> extension);
 
+  void extensionRequestBegan(std::optional<QXUUID> request, std::optional<QXError> error, const RequestHandler& handler);
+
+  void registrationRequestAnswered(std::int32_t retryCount, std::optional<QXError> error, std::optional<VendorProxy> proxy,
+                                   FinishHandler finish, ErrorCompletion completion);
+  void initialSetupAnswered(std::int32_t retryCount, std::optional<QXError> error, const FinishHandler& finish, ErrorCompletion completion);
+  void operationQueueRegister(const ErrorCompletion& completion);
+
+  void changeRequestAnswered(const QXURL& url, const std::optional<QXError>& error, const std::optional<VendorProxy>& proxy,
+                             const FinishHandler& finish);
+  void changeAnswered(const QXURL& url, const std::optional<QXError>& error, const FinishHandler& finish);
+
   // Fixed after construction
   std::shared_ptr<QXOperationQueue> operationQueue_;
   std::shared_ptr<QXQueue> memberQueue_;

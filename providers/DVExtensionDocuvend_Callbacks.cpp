@@ -1,0 +1,49 @@
+#include <utility>
+
+#include "common/DVLog.h"
+#include "providers/DVExtensionDocuvend.h"
+
+namespace docuvend {
+
+void DVExtensionDocuvend::_writerWithID(const QXCoordinationID& writer, const QXURL& didFinishWritingForURL) {
+  const QXURL& url = didFinishWritingForURL;
+  dvLog("[INFO] QXFileCoordinator is telling us the item at URL %@ was changed by writer ID %@.", url, writer.value);
+  // Looked up afresh: since this object was registered, the directory may have passed to another provider.
+  bool excludedURL = false;
+  const std::shared_ptr<DVExtensionDocuvend> provider = providerForURL(url, &excludedURL);
+  if (provider != nullptr) {
+    dvLog("[DEBUG] The item at URL %@ is provided by the etxension %@", url, provider->identifier());
+    provider->itemChangedAtURL(url);
+  } else if (!excludedURL) {
+    dvLog("[ERROR] Could not find any extension that provides an item at URL %@", url);
+  }
+}
+
+void DVExtensionDocuvend::itemChangedAtURL(const QXURL& url) {
+  dvLog("[DEBUG] %s", "-[DVExtensionDocuvend itemChangedAtURL:]");
+  performExtensionRequest(
+      [strongSelf = shared_from_this(), url](std::optional<QXError> error, std::optional<VendorProxy> proxy, FinishHandler finish) {
+        strongSelf->changeRequestAnswered(url, error, proxy, finish);
+      });
+}
+
+// Unlike the forwarded operations and the registration, a change ends its request also when there is no proxy.
+void DVExtensionDocuvend::changeRequestAnswered(const QXURL& url, const std::optional<QXError>& error,
+                                                const std::optional<VendorProxy>& proxy, const FinishHandler& finish) {
+  if (error) {
+    dvLog("[ERROR] Cannot tell extension %@ that item at URL %@ has changed.", identifier(), url);
+    finish();
+    return;
+  }
+  proxy->call<&_QXDocuvendVendor::_itemChangedAtURL>(url,
+                                                     [strongSelf = shared_from_this(), url, finish](std::optional<QXError> replyError) {
+                                                       strongSelf->changeAnswered(url, replyError, finish);
+                                                     });
+}
+
+void DVExtensionDocuvend::changeAnswered(const QXURL& url, const std::optional<QXError>& error, const FinishHandler& finish) {
+  if (error) dvLog("[ERROR] Could not tell extension %@ that item at URL %@ has changed. Error: %@", identifier(), url, error);
+  finish();
+}
+
+}  // namespace docuvend
