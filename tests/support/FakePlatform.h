@@ -1,0 +1,69 @@
+// A whole platform of fakes, installed for the test's process.
+//
+// A process can install one platform only, so every test that makes one of these needs a process of its own, as each test here has.
+// Everything of the fakes is reached through its members. Queues are turned by hand on the thread that made it.
+#pragma once
+
+#include <memory>
+#include <string>
+#include <string_view>
+
+#include "platform/QXPlatform.h"
+#include "platform/fake/FakeApplicationRegistry.h"
+#include "platform/fake/FakeDeviceLock.h"
+#include "platform/fake/FakeExtensionHost.h"
+#include "platform/fake/FakeFileCoordinator.h"
+#include "platform/fake/FakeFileSystem.h"
+#include "platform/fake/FakeLog.h"
+#include "platform/fake/FakeNotificationCenter.h"
+#include "platform/fake/FakePropertyLists.h"
+#include "platform/fake/FakeQueues.h"
+#include "platform/fake/FakeRpc.h"
+#include "platform/fake/FakeSandbox.h"
+
+namespace docuvend::fake_platform {
+
+struct FakePlatform {
+  FakePlatform() {
+    QXPlatform::install({queues, log, rpc, applicationRegistry, sandbox, extensionHost, fileCoordinator, deviceLock, notificationCenter,
+                         fileSystem, propertyLists});
+  }
+  FakePlatform(const FakePlatform&) = delete;
+  FakePlatform& operator=(const FakePlatform&) = delete;
+
+  // Installs a well-formed provider bundle: its record, its group's container with the storage directory in it, and an extension whose
+  // initial setup succeeds. It is not announced: give the extensions to `extensionHost.setExtensions`.
+  std::shared_ptr<FakeExtension> installProvider(const std::string& identifier, int version = 1) {
+    applicationRegistry.setProviderRecord(identifier, "group." + identifier, containerPath(identifier));
+    fileSystem.addDirectory(storagePath(identifier));
+    auto extension = std::make_shared<FakeExtension>(identifier, version);
+    extension->vendor().respond("_performInitialSetupWithCompletion:", [](const QXArray&) {
+      return QXArray{QXValue(), QXValue(), QXValue()};
+    });
+    return extension;
+  }
+
+  // Where `installProvider` puts things.
+  [[nodiscard]] static std::string containerPath(const std::string& identifier) { return "/containers/group." + identifier; }
+  [[nodiscard]] static std::string storagePath(const std::string& identifier) { return containerPath(identifier) + "/Docuvend Storage"; }
+  [[nodiscard]] static QXURL storageURL(const std::string& identifier) {
+    return QXURL::fileURL(storagePath(identifier), QXURLKind::directory);
+  }
+  [[nodiscard]] static QXURL itemURL(const std::string& identifier, std::string_view name) {
+    return storageURL(identifier).appendingPathComponent(name, QXURLKind::file);
+  }
+
+  FakeQueues queues;
+  FakeLog log;
+  FakeRpcService rpc;
+  FakeApplicationRegistry applicationRegistry;
+  FakeSandbox sandbox;
+  FakeExtensionHost extensionHost;
+  FakeFileCoordinator fileCoordinator;
+  FakeDeviceLock deviceLock;
+  FakeNotificationCenter notificationCenter{queues.mainRunLoop()};
+  FakeFileSystem fileSystem;
+  FakePropertyLists propertyLists{fileSystem};
+};
+
+}  // namespace docuvend::fake_platform
