@@ -1,0 +1,79 @@
+#include <array>
+
+#include "common/DVErrors.h"
+#include "common/DVLog.h"
+#include "providers/DVExtensionDocuvend.h"
+#include "service/DVRequests.h"
+#include "service/DVRpcServicer.h"
+#include "service/DVSandboxTokens.h"
+
+namespace docuvend {
+namespace {
+
+constexpr std::array kGranters = {kDVWriteEntitlement};
+
+}  // namespace
+
+struct DVRpcServicer::SandboxRequest {
+  QXURL url;
+  ProviderID providerID;
+  ConsumerID consumerID;
+  Provider provider;
+  SandboxReply reply;
+};
+
+void DVRpcServicer::extendSandboxForFileURL(std::optional<QXURL> url, std::optional<ProviderID> fromProviderID,
+                                            std::optional<ConsumerID> toConsumerID, SandboxReply completionHandler) {
+  dvLog("[DEBUG] Serving: %@", dvOperationName<&DVDaemon::extendSandboxForFileURL>());
+  if (!clientHasOneOfAllowedEntitlements(kGranters)) {
+    if (completionHandler) dvSubmitError(std::move(completionHandler), DVClientLacksEntitlement());
+    return;
+  }
+
+  Provider provider;
+  auto error = dvMissingParameter(url, fromProviderID, toConsumerID);
+  if (!error) {
+    provider = DVExtensionDocuvend::providerWithIdentifier(*fromProviderID);
+    if (!provider) error = DVNotFoundError(*fromProviderID);
+  }
+  if (error) {
+    dvLog("[ERROR] Could not extend sandbox for URL %@ from provider ID %@ to consumer ID %@, error: %@", url, fromProviderID, toConsumerID,
+          *error);
+    dvSubmitError(std::move(completionHandler), *std::move(error));
+    return;
+  }
+
+  SandboxRequest request{*std::move(url), *std::move(fromProviderID), *std::move(toConsumerID), provider, std::move(completionHandler)};
+  const QXURL itemURL = request.url;
+  provider->itemIDForURL(itemURL, [strongSelf = shared_from_this(), request = std::move(request)](std::optional<QXError> failure,
+                                                                                                  std::optional<ItemID> itemID) {
+    strongSelf->recordGrantAndIssueTokens(request, failure, itemID);
+  });
+}
+
+void DVRpcServicer::recordGrantAndIssueTokens(const SandboxRequest& request, const std::optional<QXError>& error,
+                                              const std::optional<ItemID>& itemID) const {
+  // An extension that answers with neither error nor identifier has failed as well: there is no item that could be granted.
+  if (error || !itemID) {
+    dvReplyWithError(request.reply, DVPluginOperationFailedError(error));
+    return;
+  }
+  if (const auto store = accessControlStore()) store->allowProviderWithIdentifier(request.providerID, *itemID, request.consumerID);
+  replyWithTokens(request);
+}
+
+void DVRpcServicer::replyWithTokens(const SandboxRequest& request) const {
+  const auto issued = dvIssueTokens(*request.provider, request.url);
+  const auto* tokens = std::get_if<DVSandboxTokens>(&issued);
+  if (tokens == nullptr) {
+    dvLog("[ERROR] Failed to extend sandbox for URL %@ from provider ID %@ to consumer ID %@.", request.url, request.providerID,
+          request.consumerID);
+    dvReplyWithError(request.reply, DVSandboxExtensionFailedError(request.url));
+    return;
+  }
+  dvLog("[INFO] Successfully extended sandbox for URL %@ from provider ID %@ to consumer ID %@.", request.url, request.providerID,
+        request.consumerID);
+  if (request.reply) request.reply(/*error=*/std::nullopt, tokens->item, tokens->siblingURL, tokens->sibling);
+}
+
+}  // namespace docuvend
