@@ -1,0 +1,17 @@
+// The form of bundle identifiers and group names, which are also names of directories and words on command lines.
+#pragma once
+
+#include <string>
+#include <string_view>
+
+namespace docuvend::linux_platform {
+
+inline constexpr std::size_t kLongestIdentifier = 128;
+
+// Parts of letters, digits and "-" joined by single dots, not beginning with "-", at most kLongestIdentifier bytes.
+[[nodiscard]] bool isBundleIdentifier(std::string_view text);
+
+// True when `name` is `identifier`, or begins with it and a dot.
+[[nodiscard]] bool isBelowIdentifier(std::string_view name, std::string_view identifier);
+
+}  // namespace docuvend::linux_platform

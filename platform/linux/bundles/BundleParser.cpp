@@ -1,0 +1,158 @@
+#include "platform/linux/bundles/BundleParser.h"
+
+#include <fcntl.h>
+#include <linux/openat2.h>
+#include <sys/stat.h>
+#include <sys/syscall.h>
+#include <unistd.h>
+
+#include <cerrno>
+#include <optional>
+#include <string_view>
+#include <system_error>
+
+#include "platform/linux/base/UniqueDescriptor.h"
+#include "platform/linux/bundles/BundleIdentifier.h"
+
+namespace docuvend::linux_platform {
+namespace {
+
+constexpr const char* kInfoName = "Info.plist";
+constexpr const char* kEntitlementsName = "Entitlements.plist";
+constexpr std::string_view kIdentifierKey = "QXBundleIdentifier";
+constexpr std::string_view kExecutableKey = "QXBundleExecutable";
+constexpr std::string_view kGroupsKey = "QXGroups";
+constexpr std::string_view kGroupMembersKey = "QXGroupMembers";
+constexpr mode_t kExecutableBits = S_IXUSR | S_IXGRP | S_IXOTH;
+
+enum class Presence { needed, optional };
+
+using Problem = std::optional<BundleProblem>;
+
+BundleProblem problem(std::string text) { return {std::move(text)}; }
+
+// Reads text about the bundle's files into values and says what is wrong with the first that does not fit.
+class Parser {
+ public:
+  Parser(const std::string& directory, QXPropertyLists& propertyLists) : directory_(directory), propertyLists_(propertyLists) {}
+
+  Problem parse() {
+    directoryDescriptor_.reset(::open(directory_.c_str(), O_PATH | O_DIRECTORY | O_NOFOLLOW | O_CLOEXEC));
+    if (!directoryDescriptor_) return problem("cannot be opened: " + std::system_category().message(errno));
+    result_.bundle.directory = directory_;
+    if (auto wrong = readDictionary(kInfoName, Presence::needed, result_.bundle.info)) return wrong;
+    if (auto wrong = readDictionary(kEntitlementsName, Presence::optional, result_.bundle.entitlements)) return wrong;
+    if (auto wrong = takeIdentifier()) return wrong;
+    if (auto wrong = takeExecutable()) return wrong;
+    if (auto wrong = takeGroups()) return wrong;
+    if (auto wrong = takeGroupMembers()) return wrong;
+    return takeVersion();
+  }
+
+  [[nodiscard]] ParsedBundle take() { return std::move(result_); }
+
+ private:
+  Problem readDictionary(const char* name, Presence presence, QXDictionary& target) {
+    struct stat status {};
+    if (::fstatat(directoryDescriptor_.get(), name, &status, AT_SYMLINK_NOFOLLOW) != 0) {
+      if (errno == ENOENT && presence == Presence::optional) return std::nullopt;
+      return problem(errno == ENOENT ? std::string("has no ") + name : std::string(name) + ": " + std::system_category().message(errno));
+    }
+    if (!S_ISREG(status.st_mode)) return problem(std::string(name) + " is not a regular file");
+    addVersion(status);
+    const auto stream = propertyLists_.openStream(directory_ + "/" + name);
+    if (!stream) return problem(std::string(name) + " cannot be opened");
+    auto read = propertyLists_.read(*stream);
+    if (read.error) return problem(std::string(name) + " is no property list: " + read.error->description());
+    auto* dictionary = read.value ? read.value->as<QXDictionary>() : nullptr;
+    if (dictionary == nullptr) return problem(std::string(name) + " holds no dictionary");
+    target = std::move(*dictionary);
+    return std::nullopt;
+  }
+
+  Problem takeIdentifier() {
+    const auto* identifier = qxFind<std::string>(result_.bundle.info, kIdentifierKey);
+    if (identifier == nullptr) return problem("Info.plist has no string " + std::string(kIdentifierKey));
+    if (!isBundleIdentifier(*identifier)) return problem("its identifier is malformed");
+    result_.bundle.identifier = *identifier;
+    return std::nullopt;
+  }
+
+  Problem takeExecutable() {
+    const auto* relative = qxFind<std::string>(result_.bundle.info, kExecutableKey);
+    if (relative == nullptr || relative->empty()) return problem("Info.plist has no string " + std::string(kExecutableKey));
+    open_how how{};
+    how.flags = O_PATH | O_CLOEXEC;
+    how.resolve = RESOLVE_BENEATH | RESOLVE_NO_SYMLINKS | RESOLVE_NO_MAGICLINKS;
+    const UniqueDescriptor file(static_cast<int>(::syscall(SYS_openat2, directoryDescriptor_.get(), relative->c_str(), &how, sizeof(how))));
+    if (!file) {
+      if (errno == EXDEV) return problem("its executable lies outside the bundle");
+      if (errno == ELOOP) return problem("its executable is a link, or lies behind one");
+      return problem("its executable cannot be opened: " + std::system_category().message(errno));
+    }
+    struct stat status {};
+    if (::fstat(file.get(), &status) != 0 || !S_ISREG(status.st_mode)) return problem("its executable is not a regular file");
+    if ((status.st_mode & kExecutableBits) == 0) return problem("its executable may not be executed");
+    addVersion(status);
+    result_.bundle.executable = directory_ + "/" + *relative;
+    return std::nullopt;
+  }
+
+  Problem takeStrings(const QXValue& value, std::string_view key, std::vector<std::string>& target) {
+    const auto* array = value.as<QXArray>();
+    if (array == nullptr) return problem(std::string(key) + " is not made of arrays of strings");
+    for (const auto& element : *array) {
+      const auto* text = element.as<std::string>();
+      if (text == nullptr) return problem(std::string(key) + " is not made of arrays of strings");
+      if (!isBundleIdentifier(*text)) return problem(std::string(key) + " has a malformed name");
+      target.push_back(*text);
+    }
+    return std::nullopt;
+  }
+
+  Problem takeGroups() {
+    const auto found = result_.bundle.info.find(kGroupsKey);
+    return found == result_.bundle.info.end() ? std::nullopt : takeStrings(found->second, kGroupsKey, result_.wantedGroups);
+  }
+
+  Problem takeGroupMembers() {
+    const auto found = result_.bundle.info.find(kGroupMembersKey);
+    if (found == result_.bundle.info.end()) return std::nullopt;
+    const auto* groups = found->second.as<QXDictionary>();
+    if (groups == nullptr) return problem(std::string(kGroupMembersKey) + " is not a dictionary");
+    for (const auto& [group, members] : *groups) {
+      if (auto wrong = takeStrings(members, kGroupMembersKey, result_.groupMembers[group])) return wrong;
+    }
+    return std::nullopt;
+  }
+
+  Problem takeVersion() {
+    struct stat status {};
+    if (::fstat(directoryDescriptor_.get(), &status) != 0) return problem(std::system_category().message(errno));
+    addVersion(status);
+    return std::nullopt;
+  }
+
+  void addVersion(const struct stat& status) {
+    auto& version = result_.bundle.version;
+    for (const auto number : {std::uint64_t{status.st_dev}, std::uint64_t{status.st_ino}, static_cast<std::uint64_t>(status.st_ctim.tv_sec),
+                              static_cast<std::uint64_t>(status.st_ctim.tv_nsec)}) {
+      version += (version.empty() ? "" : ".") + std::to_string(number);
+    }
+  }
+
+  const std::string& directory_;
+  QXPropertyLists& propertyLists_;
+  UniqueDescriptor directoryDescriptor_;
+  ParsedBundle result_;
+};
+
+}  // namespace
+
+std::variant<ParsedBundle, BundleProblem> parseBundle(const std::string& directory, QXPropertyLists& propertyLists) {
+  Parser parser(directory, propertyLists);
+  if (auto wrong = parser.parse()) return *wrong;
+  return parser.take();
+}
+
+}  // namespace docuvend::linux_platform

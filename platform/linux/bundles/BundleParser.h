@@ -1,0 +1,29 @@
+// Reads one bundle's directory.
+#pragma once
+
+#include <map>
+#include <string>
+#include <variant>
+#include <vector>
+
+#include "platform/linux/bundles/Bundle.h"
+#include "platform/property_list.h"
+
+namespace docuvend::linux_platform {
+
+// A bundle as its own files describe it. What depends on other bundles and on where containers lie is still empty in `bundle`.
+struct ParsedBundle {
+  Bundle bundle;
+  std::vector<std::string> wantedGroups;
+  std::map<std::string, std::vector<std::string>, std::less<>> groupMembers;  // group to identifiers of other bundles
+};
+
+// Why a directory is no bundle, in one line.
+struct BundleProblem {
+  std::string text;
+};
+
+// `directory` is absolute and has no link in it. A bundle has none either on the way to its property lists and its executable.
+[[nodiscard]] std::variant<ParsedBundle, BundleProblem> parseBundle(const std::string& directory, QXPropertyLists& propertyLists);
+
+}  // namespace docuvend::linux_platform

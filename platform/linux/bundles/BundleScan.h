@@ -1,0 +1,46 @@
+// Looks through the bundle directories. What is wrong with a bundle is logged once, and again only after a look that found it mended.
+#pragma once
+
+#include <map>
+#include <set>
+#include <string>
+#include <vector>
+
+#include "platform/linux/base/Paths.h"
+#include "platform/linux/bundles/BundleParser.h"
+#include "platform/log.h"
+
+namespace docuvend::linux_platform {
+
+using BundleMap = std::map<std::string, Bundle, std::less<>>;
+
+// Used by one thread at a time. The property lists and the log outlive it.
+class BundleScan {
+ public:
+  BundleScan(const Paths& paths, QXPropertyLists& propertyLists, QXLogHandle& log)
+      : paths_(paths), propertyLists_(propertyLists), log_(log) {}
+
+  // Every sound bundle of the system's and then of the user's directory. Of several with one identifier the system's wins, then the
+  // first by name of directory. Directories whose name begins with "." are not looked at: an installer copies under such a name, then
+  // renames. Links are no bundles. Creates nothing.
+  [[nodiscard]] BundleMap run();
+
+ private:
+  void scanDirectory(const std::string& root);
+  void add(ParsedBundle parsed);
+  [[nodiscard]] BundleMap resolve();
+  void report(const std::string& text);
+
+  const Paths paths_;
+  QXPropertyLists& propertyLists_;
+  QXLogHandle& log_;
+
+  std::vector<ParsedBundle> found_;     // of the look that is going on
+  std::set<std::string> reported_;      // by the look that is going on
+  std::set<std::string> lastReported_;  // by the one before
+};
+
+// The real paths of the directories directly below `root` that may be bundles, in order of name.
+[[nodiscard]] std::vector<std::string> bundleDirectories(const std::string& root);
+
+}  // namespace docuvend::linux_platform

@@ -1,0 +1,52 @@
+// The two command lines of a launch, as functions of values: what bubblewrap builds, and what docuvend-confine takes away inside it.
+#pragma once
+
+#include <cstdint>
+#include <optional>
+#include <string>
+#include <vector>
+
+#include "platform/linux/launch/ConfinedLaunch.h"
+#include "platform/linux/launch/HostLayout.h"
+#include "platform/linux/launch/policy/ConfinePolicy.h"
+
+namespace docuvend::linux_platform {
+
+// Threads count as processes. The kernel counts them per user and user namespace (from 5.14 on), so this is one extension's own number.
+inline constexpr std::uint64_t kExtensionProcesses = 256;
+// The first Landlock level of a kernel that counts so; below it no limit is set, for it would count all of the user's processes.
+inline constexpr int kProcessLimitLevel = 2;
+// Private writable memory of each process of an extension (RLIMIT_DATA: an address-space limit would count files that it maps). A build
+// with a memory sanitizer reserves terabytes of it at the start of every process, so there is none then.
+#if defined(__SANITIZE_ADDRESS__) || defined(__SANITIZE_THREAD__)
+#define DOCUVEND_SHADOW_MEMORY 1
+#elif defined(__has_feature)
+#if __has_feature(address_sanitizer) || __has_feature(thread_sanitizer)
+#define DOCUVEND_SHADOW_MEMORY 1
+#endif
+#endif
+#ifdef DOCUVEND_SHADOW_MEMORY
+inline constexpr std::optional<std::uint64_t> kExtensionMemory;
+#else
+inline constexpr std::optional<std::uint64_t> kExtensionMemory = std::uint64_t{4} << 30U;
+#endif
+
+// Where docuvend-confine is found inside.
+inline constexpr const char* kHelperPath = "/.docuvend-confine";
+
+// A launch whose directories exist; every path is absolute and free of links.
+struct LaunchSubject {
+  LaunchKind kind = LaunchKind::application;
+  std::string bundleDirectory;
+  std::string executable;
+  std::vector<std::string> arguments;  // for the executable
+  std::string container;
+  std::vector<std::string> groups;
+  std::string publicSockets;      // for an application
+  int descriptionDescriptor = 0;  // where bubblewrap reads the description
+};
+
+[[nodiscard]] ConfinePolicy confinePolicy(const LaunchSubject& subject, const HostLayout& host);
+[[nodiscard]] std::vector<std::string> launchArguments(const LaunchSubject& subject, const HostLayout& host);
+
+}  // namespace docuvend::linux_platform

@@ -1,0 +1,48 @@
+// What docuvend-confine is told to do, as its arguments say it. The launcher writes them, docuvend-confine reads them.
+//
+//   docuvend-confine [--read-execute PATH | --read PATH | --read-write PATH | --device PATH]... --descriptors COUNT
+//                    [--processes COUNT] [--memory BYTES] -- EXECUTABLE [ARGUMENT...]
+#pragma once
+
+#include <cstdint>
+#include <optional>
+#include <string>
+#include <variant>
+#include <vector>
+
+namespace docuvend::linux_platform {
+
+enum class PathAccess {
+  readExecute,
+  read,
+  readWrite,  // everything but executing and making device files
+  device,     // one device file: reading and writing
+};
+
+struct ConfinePolicy {
+  struct Rule {
+    PathAccess access;
+    std::string path;  // absolute; with everything below it
+    friend bool operator==(const Rule&, const Rule&) = default;
+  };
+
+  std::vector<Rule> rules;  // what no rule names is out of reach
+  int descriptors = 3;      // 0 to this number, exclusive, stay open; every other is closed
+  std::optional<std::uint64_t> processes;
+  std::optional<std::uint64_t> memory;  // bytes of private writable memory per process
+
+  friend bool operator==(const ConfinePolicy&, const ConfinePolicy&) = default;
+};
+
+struct ConfineCommand {
+  ConfinePolicy policy;
+  std::vector<std::string> command;  // [0] is the absolute path of the executable
+  friend bool operator==(const ConfineCommand&, const ConfineCommand&) = default;
+};
+
+// Without a program name in front.
+[[nodiscard]] std::vector<std::string> confineArguments(const ConfineCommand& command);
+// The reverse, or what is wrong in words.
+[[nodiscard]] std::variant<ConfineCommand, std::string> parseConfineArguments(const std::vector<std::string>& arguments);
+
+}  // namespace docuvend::linux_platform

@@ -1,0 +1,54 @@
+// Runs inside a confinement, between bubblewrap and the bundle's executable: takes away what the mounts leave open, then becomes the
+// executable. Its arguments are described in platform/linux/launch/policy/ConfinePolicy.h; it reads nothing else.
+#include <sys/resource.h>
+#include <unistd.h>
+
+#include <cerrno>
+#include <climits>
+#include <cstdio>
+#include <optional>
+#include <string>
+#include <vector>
+
+#include "platform/linux/launch/policy/ConfinePolicy.h"
+#include "platform/linux/launch/policy/Landlock.h"
+
+namespace docuvend::linux_platform {
+namespace {
+
+constexpr int kFailed = 125;
+
+int fail(const std::string& why) {
+  std::fprintf(stderr, "docuvend-confine: %s\n", why.c_str());
+  return kFailed;
+}
+
+std::optional<QXError> limit(__rlimit_resource resource, std::optional<std::uint64_t> most) {
+  if (!most) return std::nullopt;
+  const rlimit limit{*most, *most};
+  if (::setrlimit(resource, &limit) != 0) return QXError::system(errno, "cannot set a limit");
+  return std::nullopt;
+}
+
+int run(const std::vector<std::string>& arguments) {
+  auto parsed = parseConfineArguments(arguments);
+  if (const auto* problem = std::get_if<std::string>(&parsed)) return fail(*problem);
+  auto& [policy, command] = std::get<ConfineCommand>(parsed);
+
+  if (const auto error = limit(RLIMIT_NPROC, policy.processes)) return fail(error->description());
+  if (const auto error = limit(RLIMIT_DATA, policy.memory)) return fail(error->description());
+  if (const auto error = restrictToRules(policy.rules, landlockLevel())) return fail(error->description());
+  if (::close_range(static_cast<unsigned>(policy.descriptors), UINT_MAX, 0) != 0) return fail("cannot close the other descriptors");
+
+  std::vector<char*> words;
+  words.reserve(command.size() + 1);
+  for (auto& word : command) words.push_back(word.data());
+  words.push_back(nullptr);
+  ::execv(words[0], words.data());
+  return fail(QXError::system(errno, "cannot execute " + command[0]).description());
+}
+
+}  // namespace
+}  // namespace docuvend::linux_platform
+
+int main(int count, char** words) { return docuvend::linux_platform::run({words + 1, words + count}); }
