@@ -1,6 +1,7 @@
 #include "platform/fake/FakePropertyLists.h"
 
 #include <algorithm>
+#include <cmath>
 #include <cstdint>
 #include <filesystem>
 #include <iterator>
@@ -36,9 +37,10 @@ bool isCarried(const QXValue& value) {
   switch (value.kind()) {
     case QXValueKind::boolean:
     case QXValueKind::integer:
-    case QXValueKind::real:
     case QXValueKind::data:
       return true;
+    case QXValueKind::real:
+      return std::isfinite(*value.as<double>());
     case QXValueKind::string:
       return isCarried(*value.as<std::string>());
     case QXValueKind::array: {

@@ -1,0 +1,27 @@
+// Where a path leads: the kernel's name of what exists, and the rest that does not exist yet.
+#pragma once
+
+#include <string>
+#include <variant>
+
+namespace docuvend::linux_platform {
+
+struct FilePlace {
+  std::string existing;  // absolute, without links, "." and ".."
+  std::string missing;   // components below it, without "." and ".."; empty when all of the path exists
+
+  // The errno value when the path leads nowhere.
+  using Result = std::variant<FilePlace, int>;
+
+  // Links are followed, those too that point to what does not exist yet. ENOENT when a missing component is followed by "..".
+  [[nodiscard]] static Result ofItem(const std::string& path);
+  // ENOENT when there is no such directory, ENOTDIR when it is something else.
+  [[nodiscard]] static Result ofDirectory(const std::string& path);
+
+  // True when this place is somewhere below that directory; false for the directory itself.
+  [[nodiscard]] bool isBelow(const FilePlace& directory) const;
+
+  friend bool operator==(const FilePlace&, const FilePlace&) = default;
+};
+
+}  // namespace docuvend::linux_platform

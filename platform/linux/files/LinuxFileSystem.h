@@ -1,0 +1,29 @@
+// Files and directories of this machine. Without state of its own; may be used from any thread.
+//
+// A relationship is read off the kernel's names of the two places (see the source). One place seen through a bind mount elsewhere is
+// another place. Errors other than the missing directory are of the system's domain, with the errno value.
+#pragma once
+
+#include <optional>
+#include <string>
+#include <variant>
+
+#include "platform/file_system.h"
+#include "platform/linux/base/Paths.h"
+
+namespace docuvend::linux_platform {
+
+class LinuxFileSystem : public QXFileSystem {
+ public:
+  explicit LinuxFileSystem(const Paths& paths) : home_(paths.home) {}
+
+  std::string homeDirectory() override { return home_; }
+  bool exists(const std::string& path) override;
+  std::optional<QXError> createDirectory(const std::string& path) override;
+  std::variant<QXRelationship, QXError> relationship(const QXURL& directory, const QXURL& item) override;
+
+ private:
+  const std::string home_;
+};
+
+}  // namespace docuvend::linux_platform
