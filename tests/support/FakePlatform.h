@@ -31,19 +31,26 @@ struct FakePlatform {
   FakePlatform(const FakePlatform&) = delete;
   FakePlatform& operator=(const FakePlatform&) = delete;
 
-  // Installs a well-formed provider bundle: its record, its group's container with the storage directory in it, and an extension whose
-  // initial setup succeeds. It is not announced: give the extensions to `extensionHost.setExtensions`.
-  std::shared_ptr<FakeExtension> installProvider(const std::string& identifier, int version = 1) {
+  // A well-formed provider bundle: its record, and its group's container with the storage directory in it.
+  void installProviderBundle(const std::string& identifier) {
     applicationRegistry.setProviderRecord(identifier, "group." + identifier, containerPath(identifier));
     fileSystem.addDirectory(storagePath(identifier));
+  }
+  // The bundle, and an extension whose initial setup succeeds. It is not announced: give the extensions to
+  // `extensionHost.setExtensions`.
+  std::shared_ptr<FakeExtension> installProvider(const std::string& identifier, int version = 1) {
+    installProviderBundle(identifier);
     auto extension = std::make_shared<FakeExtension>(identifier, version);
-    extension->vendor().respond("_performInitialSetupWithCompletion:", [](const QXArray&) {
-      return QXArray{QXValue(), QXValue(), QXValue()};
-    });
+    succeedSetup(*extension);
     return extension;
   }
+  static void succeedSetup(FakeExtension& extension) {
+    extension.vendor().respond("_performInitialSetupWithCompletion:", [](const QXArray&) {
+      return QXArray{QXValue(), QXValue(), QXValue()};
+    });
+  }
 
-  // Where `installProvider` puts things.
+  // Where `installProviderBundle` puts things.
   [[nodiscard]] static std::string containerPath(const std::string& identifier) { return "/containers/group." + identifier; }
   [[nodiscard]] static std::string storagePath(const std::string& identifier) { return containerPath(identifier) + "/Docuvend Storage"; }
   [[nodiscard]] static QXURL storageURL(const std::string& identifier) {

@@ -1,0 +1,98 @@
+// What the tests of this folder share: a platform of fakes, and extensions that leave their traces in the log, so that the order between
+// messages, requests and completions can be read off one list.
+#pragma once
+
+#include <gtest/gtest.h>
+
+#include <functional>
+#include <memory>
+#include <optional>
+#include <string>
+#include <string_view>
+#include <vector>
+
+#include "platform/QXError.h"
+#include "providers/DVExtensionDocuvend.h"
+#include "tests/support/FakePlatform.h"
+
+namespace docuvend {
+
+using fake_platform::FakeExtension;
+using fake_platform::FakePlatform;
+
+inline const std::string kCellar = "com.orvane.cellar";
+inline const std::string kAttic = "com.orvane.attic";
+inline const std::string kShed = "com.orvane.shed";
+
+using Lines = std::vector<std::string>;
+using Extensions = std::vector<std::shared_ptr<QXExtension>>;
+
+// Writes "~ begin" and "~ cancel N" into the log, and tells `onIdentifier` when it is asked for its identifier.
+class TracingExtension : public FakeExtension {
+ public:
+  TracingExtension(FakePlatform& platform, std::optional<std::string> identifier, int version)
+      : FakeExtension(std::move(identifier), version), platform_(platform) {}
+
+  [[nodiscard]] std::optional<std::string> identifier() const override {
+    if (onIdentifier) onIdentifier();
+    return FakeExtension::identifier();
+  }
+  void beginExtensionRequest(BeginCompletion completion) override {
+    trace("begin");
+    FakeExtension::beginExtensionRequest(std::move(completion));
+  }
+  void cancelExtensionRequest(const QXUUID& request) override {
+    trace("cancel " + std::to_string(request.bytes.back()));
+    FakeExtension::cancelExtensionRequest(request);
+  }
+
+  std::function<void()> onIdentifier;
+
+ private:
+  void trace(const std::string& what) { platform_.log.defaultLog().write(QXLogType::defaultType, "~ " + what); }
+
+  FakePlatform& platform_;
+};
+
+class ProvidersTest : public testing::Test {
+ protected:
+  // The log so far: "TYPE: text" for each message, traces as they are. Forgets it.
+  Lines written() {
+    static constexpr const char* kTypes[] = {"default", "info", "debug", "fault"};
+    Lines lines;
+    for (const auto& entry : platform.log.entries()) {
+      const bool isTrace = entry.text.starts_with("~");
+      lines.push_back(isTrace ? entry.text : kTypes[static_cast<int>(entry.type)] + (": " + entry.text));
+    }
+    platform.log.clear();
+    return lines;
+  }
+  void trace(const std::string& what) { platform.log.defaultLog().write(QXLogType::defaultType, "~ " + what); }
+
+  // An installed extension; it answers begin requests, and nothing else yet.
+  std::shared_ptr<TracingExtension> install(const std::string& identifier, int version = 1) {
+    platform.installProviderBundle(identifier);
+    return std::make_shared<TracingExtension>(platform, identifier, version);
+  }
+  std::shared_ptr<TracingExtension> installReady(const std::string& identifier, int version = 1) {
+    auto extension = install(identifier, version);
+    FakePlatform::succeedSetup(*extension);
+    return extension;
+  }
+
+  // Discovers exactly these and finishes the pass.
+  void discover(Extensions extensions) {
+    DVExtensionDocuvend::createInstancesCompletion(/*completion=*/{});
+    platform.extensionHost.setExtensions(std::move(extensions));
+    platform.queues.runAll();
+  }
+
+  static QXURL file(const std::string& path) { return QXURL::fileURL(path, QXURLKind::file); }
+  static QXURL directory(const std::string& path) { return QXURL::fileURL(path, QXURLKind::directory); }
+
+  FakePlatform platform;
+  const QXError broken = QXError::make("TestDomain", 7, "broken");
+  const QXError lost = QXError::make("TestDomain", 8, "lost");
+};
+
+}  // namespace docuvend
