@@ -1,0 +1,42 @@
+#include "platform/linux/sandbox/SandboxServicer.h"
+
+#include <string>
+
+namespace docuvend::linux_platform {
+namespace {
+
+std::string textOf(const std::optional<QXData>& token) { return token ? token->text() : std::string(); }
+
+}  // namespace
+
+void SandboxServicer::redeemToken(std::optional<QXData> token, std::optional<bool> forWriting, FileReply completionHandler) {
+  auto redeemed = sandbox_.redeem(caller(), textOf(token), forWriting.value_or(false) ? TokenUse::writing : TokenUse::reading);
+  if (auto* error = std::get_if<QXError>(&redeemed)) {
+    noteRefusal(*error);
+    if (completionHandler) completionHandler(std::move(*error), /*file=*/{});
+    return;
+  }
+  if (completionHandler) completionHandler(/*error=*/{}, toValue(std::move(std::get<UniqueDescriptor>(redeemed))));
+}
+
+void SandboxServicer::replaceItemWithToken(std::optional<QXData> itemToken, std::optional<QXData> bySiblingWithToken,
+                                           ErrorReply completionHandler) {
+  auto error = sandbox_.replaceItem(caller(), textOf(itemToken), textOf(bySiblingWithToken));
+  if (error) noteRefusal(*error);
+  if (completionHandler) completionHandler(std::move(error));
+}
+
+QXAuditToken SandboxServicer::caller() const {
+  const auto connection = connection_.lock();
+  return connection ? connection->auditToken() : QXAuditToken{};
+}
+
+void SandboxServicer::noteRefusal(const QXError& error) {
+  if (noted_ || error.code != static_cast<std::int64_t>(SandboxErrorCode::badToken)) return;
+  noted_ = true;
+  const auto connection = connection_.lock();
+  const int pid = connection ? connection->processIdentifier() : 0;
+  log_.write(QXLogType::defaultType, "[NOTICE] Refusing a sandbox token from PID " + std::to_string(pid) + ": " + error.description());
+}
+
+}  // namespace docuvend::linux_platform

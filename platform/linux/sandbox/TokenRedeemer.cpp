@@ -1,0 +1,149 @@
+// A token names a path, and between any two looks at a path others may have renamed what lies there. So a path is resolved once, to O_PATH
+// descriptors of the directory and of the file; what is then examined, opened and handed out is that file and nothing else. Opening goes
+// through the process's own descriptor, which names an object, not a path; it does not wait (a lease would make it), and afterwards
+// the open file is compared with the one that was examined.
+//
+// A rename has no such form: it takes names. Both names are single components in one directory that is held open, so nothing outside that
+// directory can be meant, and what has the item's name afterwards is compared with the sibling that was examined.
+
+#include "platform/linux/sandbox/TokenRedeemer.h"
+
+#include <fcntl.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include <cerrno>
+#include <cstdio>
+#include <optional>
+#include <string>
+
+namespace docuvend::linux_platform {
+namespace {
+
+// The sibling vanished or appeared in between that often: somebody does it on purpose.
+constexpr int kCreationTries = 8;
+constexpr mode_t kSiblingMode = 0600;
+constexpr int kNeverWaiting = O_NONBLOCK | O_NOCTTY | O_CLOEXEC;
+
+int accessMode(TokenUse use) { return use == TokenUse::writing ? O_RDWR : O_RDONLY; }
+
+// The item's name, for the name of a hidden sibling.
+std::optional<std::string> itemNameOf(const std::string& siblingName) {
+  if (siblingName.size() < 2 || siblingName[0] != '.') return std::nullopt;
+  std::string name = siblingName.substr(1);
+  if (name == "." || name == "..") return std::nullopt;
+  return name;
+}
+
+// Opens the object itself and makes sure that it is still a regular file with one link.
+std::variant<RedeemedFile, QXError> openPlaced(const PlacedFile& placed, int access) {
+  UniqueDescriptor file(::open(descriptorPath(placed.path.get()).c_str(), access | kNeverWaiting));
+  if (!file) return sandboxErrorFor(SystemFailure{errno}, "the file cannot be opened");
+  const auto examined = statusOf(file.get());
+  if (const auto* failure = std::get_if<SystemFailure>(&examined)) return sandboxErrorFor(*failure, "the file cannot be examined");
+  const auto& status = std::get<ObjectStatus>(examined);
+  if (status.identity != placed.identity || !S_ISREG(status.mode)) return sandboxErrorFor(PathRefusal::notRegularFile);
+  if (status.links == 0) return sandboxError(SandboxErrorCode::gone, "the file was removed");
+  if (status.links != 1) return sandboxErrorFor(PathRefusal::severalLinks);
+  const int flags = ::fcntl(file.get(), F_GETFL);
+  if (flags < 0 || ::fcntl(file.get(), F_SETFL, flags & ~O_NONBLOCK) != 0) {
+    return sandboxErrorFor(SystemFailure{errno}, "the file cannot be made blocking");
+  }
+  return RedeemedFile{std::move(file), placed.identity};
+}
+
+// Makes the missing sibling. None: something has its name by now.
+std::variant<std::optional<RedeemedFile>, QXError> createSibling(const PlacedItem& sibling) {
+  UniqueDescriptor file(
+      ::openat(sibling.directory.get(), sibling.name.c_str(), O_RDWR | O_CREAT | O_EXCL | O_NOFOLLOW | O_NOCTTY | O_CLOEXEC, kSiblingMode));
+  if (!file) {
+    if (errno == EEXIST) return std::optional<RedeemedFile>();
+    return sandboxErrorFor(SystemFailure{errno}, "the hidden sibling cannot be created");
+  }
+  const auto examined = statusOf(file.get());
+  if (const auto* failure = std::get_if<SystemFailure>(&examined))
+    return sandboxErrorFor(*failure, "the hidden sibling cannot be examined");
+  return std::optional<RedeemedFile>(RedeemedFile{std::move(file), std::get<ObjectStatus>(examined).identity});
+}
+
+bool itemOfSiblingExists(const PlacedItem& sibling) {
+  const auto itemName = itemNameOf(sibling.name);
+  if (!itemName) return false;
+  const auto entry = placeEntry(sibling.directory.get(), *itemName);
+  const auto* item = std::get_if<std::optional<PlacedFile>>(&entry);
+  return item != nullptr && item->has_value();
+}
+
+std::optional<QXError> flush(int descriptor, const std::string& attempt) {
+  if (::fsync(descriptor) != 0) return sandboxErrorFor(SystemFailure{errno}, attempt);
+  return std::nullopt;
+}
+
+std::optional<QXError> flushDirectory(int directory) {
+  const UniqueDescriptor readable(::openat(directory, ".", O_RDONLY | O_DIRECTORY | O_CLOEXEC));
+  if (!readable) return sandboxErrorFor(SystemFailure{errno}, "the directory cannot be opened");
+  return flush(readable.get(), "the directory cannot be written");
+}
+
+QXError goneError() { return sandboxError(SandboxErrorCode::gone, "the file does not exist"); }
+
+}  // namespace
+
+std::variant<PlacedItem, QXError> TokenRedeemer::placed(std::string_view text) const {
+  const auto opened = SandboxToken::opened(text, key_);
+  if (std::holds_alternative<TokenRefusal>(opened)) return sandboxError(SandboxErrorCode::badToken, "the token is not valid");
+  auto place = containers_.place(std::get<SandboxToken>(opened).path);
+  if (const auto* refusal = std::get_if<PathRefusal>(&place)) return sandboxErrorFor(*refusal);
+  return std::move(std::get<PlacedItem>(place));
+}
+
+std::variant<RedeemedFile, QXError> TokenRedeemer::redeem(std::string_view token, TokenUse use) const {
+  for (int attempt = 0; attempt < kCreationTries; ++attempt) {
+    auto place = placed(token);
+    if (auto* error = std::get_if<QXError>(&place)) return std::move(*error);
+    const auto& item = std::get<PlacedItem>(place);
+    if (item.file) return openPlaced(*item.file, accessMode(use));
+    if (use != TokenUse::writing || !itemOfSiblingExists(item)) return goneError();
+    auto created = createSibling(item);
+    if (auto* error = std::get_if<QXError>(&created)) return std::move(*error);
+    auto& file = std::get<std::optional<RedeemedFile>>(created);
+    if (file) return std::move(*file);
+  }
+  return sandboxErrorFor(PathRefusal::unsteady);
+}
+
+std::variant<ObjectIdentity, QXError> TokenRedeemer::replaceItem(std::string_view itemToken, std::string_view siblingToken) const {
+  auto itemPlace = placed(itemToken);
+  if (auto* error = std::get_if<QXError>(&itemPlace)) return std::move(*error);
+  auto siblingPlace = placed(siblingToken);
+  if (auto* error = std::get_if<QXError>(&siblingPlace)) return std::move(*error);
+  const auto& item = std::get<PlacedItem>(itemPlace);
+  const auto& sibling = std::get<PlacedItem>(siblingPlace);
+
+  const std::string directoryPath = item.path.substr(0, item.path.size() - item.name.size());
+  if (sibling.path != directoryPath + "." + item.name) {
+    return sandboxError(SandboxErrorCode::notSiblings, "the tokens do not name an item and its hidden sibling");
+  }
+  if (!item.file || !sibling.file) return goneError();
+  // The item's directory serves for both names; the sibling must be there too.
+  auto entry = placeEntry(item.directory.get(), sibling.name);
+  if (const auto* refusal = std::get_if<PathRefusal>(&entry)) return sandboxErrorFor(*refusal);
+  const auto& source = std::get<std::optional<PlacedFile>>(entry);
+  if (!source || source->identity != sibling.file->identity) return goneError();
+
+  auto opened = openPlaced(*source, O_RDONLY);
+  if (auto* error = std::get_if<QXError>(&opened)) return std::move(*error);
+  if (auto error = flush(std::get<RedeemedFile>(opened).file.get(), "the hidden sibling cannot be written")) return *error;
+  if (::renameat(item.directory.get(), sibling.name.c_str(), item.directory.get(), item.name.c_str()) != 0) {
+    return sandboxErrorFor(SystemFailure{errno}, "the hidden sibling cannot be renamed");
+  }
+  if (auto error = flushDirectory(item.directory.get())) return *error;
+
+  auto after = placeEntry(item.directory.get(), item.name);
+  if (const auto* refusal = std::get_if<PathRefusal>(&after)) return sandboxErrorFor(*refusal);
+  const auto& now = std::get<std::optional<PlacedFile>>(after);
+  if (!now || now->identity != source->identity) return sandboxError(SandboxErrorCode::gone, "the item was exchanged meanwhile");
+  return source->identity;
+}
+
+}  // namespace docuvend::linux_platform
