@@ -161,10 +161,13 @@ class FakeQueues::Core {
   }
 
   void runFront(State& state) {
-    const Entry entry = std::move(state.entries.front());
+    Entry entry = std::move(state.entries.front());
     state.entries.pop_front();
     std::vector<const State*> callers = std::exchange(context_, {&state});
-    run(state, entry.access, entry.task);
+    run(state, entry.access, [&entry] {
+      entry.task();
+      entry.task = {};  // what the task held is released as part of the task
+    });
     context_ = std::move(callers);
   }
 
