@@ -4,6 +4,7 @@
 #include <sys/stat.h>
 
 #include <array>
+#include <cerrno>
 #include <utility>
 #include <variant>
 
@@ -61,7 +62,7 @@ LinuxPropertyLists::Stamp LinuxPropertyLists::stampOf(const struct stat& status)
 
 bool LinuxPropertyLists::holdsSomethingElse(const std::string& path) {
   struct stat status {};
-  if (::lstat(path.c_str(), &status) != 0) return false;
+  if (::lstat(path.c_str(), &status) != 0) return errno != ENOENT;
   {
     const std::lock_guard lock(mutex_);
     if (const auto found = written_.find(path); found != written_.end() && found->second == stampOf(status)) return false;

@@ -1,0 +1,239 @@
+#include "platform/linux/files/LinuxFileSystem.h"
+
+#include <fcntl.h>
+#include <gtest/gtest.h>
+#include <sched.h>
+#include <sys/mount.h>
+#include <sys/stat.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+#include <filesystem>
+#include <string>
+#include <variant>
+#include <vector>
+
+#include "platform/linux/base/UniqueDescriptor.h"
+#include "tests/files/TemporaryDirectory.h"
+
+namespace docuvend::linux_platform {
+namespace {
+
+using test::TemporaryDirectory;
+using test::writeText;
+namespace fs = std::filesystem;
+
+constexpr int kContains = 0;
+constexpr int kSame = 1;
+constexpr int kOther = 2;
+
+class LinuxFileSystemTest : public ::testing::Test {
+ protected:
+  void SetUp() override {
+    fs::create_directories(path("items/sub"));
+    fs::create_directories(path("outside"));
+    writeText(path("items/file"), "x");
+    writeText(path("outside/file"), "x");
+  }
+
+  [[nodiscard]] std::string path(const std::string& name) const { return directory_.path(name); }
+
+  // The relationship as a number, or minus the error's code.
+  [[nodiscard]] int lies(const std::string& item, const std::string& directory = "items") {
+    return liesAt(QXURL::fileURL(path(directory), QXURLKind::directory), QXURL::fileURL(path(item), QXURLKind::file));
+  }
+  [[nodiscard]] int liesAt(const QXURL& directory, const QXURL& item) {
+    const auto answer = fileSystem_.relationship(directory, item);
+    const auto* error = std::get_if<QXError>(&answer);
+    return error != nullptr ? -static_cast<int>(error->code) : static_cast<int>(std::get<QXRelationship>(answer));
+  }
+
+  TemporaryDirectory directory_;
+  LinuxFileSystem fileSystem_{Paths{}};
+};
+
+TEST_F(LinuxFileSystemTest, ADanglingLinkExists) {
+  fs::create_symlink("nowhere", path("link"));
+  EXPECT_TRUE(fileSystem_.exists(path("link")));
+  fs::create_symlink("link2", path("link2"));
+  EXPECT_TRUE(fileSystem_.exists(path("link2")));
+}
+
+TEST_F(LinuxFileSystemTest, DirectoriesAreCreatedThroughLinks) {
+  fs::create_directory_symlink("outside", path("link"));
+  EXPECT_FALSE(fileSystem_.createDirectory(path("link/a/b")));
+  EXPECT_TRUE(fs::is_directory(path("outside/a/b")));
+  EXPECT_FALSE(fileSystem_.createDirectory(path("link")));
+  EXPECT_FALSE(fileSystem_.createDirectory("/"));
+}
+
+TEST_F(LinuxFileSystemTest, ADirectoryIsNotCreatedAtADanglingLinkNorRelatively) {
+  fs::create_symlink("nowhere", path("link"));
+  const auto error = fileSystem_.createDirectory(path("link"));
+  ASSERT_TRUE(error);
+  EXPECT_EQ(error->code, EEXIST);
+  EXPECT_TRUE(fileSystem_.createDirectory("relative"));
+  EXPECT_TRUE(fileSystem_.createDirectory(""));
+}
+
+TEST_F(LinuxFileSystemTest, NewDirectoriesHaveTheModeThatTheMaskLeaves) {
+  const mode_t before = ::umask(027);
+  EXPECT_FALSE(fileSystem_.createDirectory(path("new")));
+  ::umask(before);
+  struct stat status {};
+  ASSERT_EQ(::stat(path("new").c_str(), &status), 0);
+  EXPECT_EQ(status.st_mode & 07777U, 0750U);
+}
+
+TEST_F(LinuxFileSystemTest, LinksAreFollowedOnBothSides) {
+  fs::create_symlink(path("outside/file"), path("items/out"));
+  fs::create_symlink(path("items/file"), path("outside/in"));
+  fs::create_directory_symlink("items", path("alias"));
+  fs::create_directory_symlink("../../outside", path("items/sub/away"));
+  EXPECT_EQ(lies("items/out"), kOther);
+  EXPECT_EQ(lies("outside/in"), kContains);
+  EXPECT_EQ(lies("alias/file"), kContains);
+  EXPECT_EQ(lies("alias"), kSame);
+  EXPECT_EQ(lies("items/file", "alias"), kContains);
+  EXPECT_EQ(lies("items/sub/away/file"), kOther);
+  EXPECT_EQ(lies("items/sub/away/missing"), kOther);
+  EXPECT_EQ(lies("items/sub/away/../items/missing"), kContains);
+}
+
+TEST_F(LinuxFileSystemTest, ALinkToWhatDoesNotExistYetLiesWhereItPoints) {
+  fs::create_symlink(path("outside/missing"), path("items/out"));
+  fs::create_symlink(path("items/missing"), path("outside/in"));
+  fs::create_symlink("../items/missing", path("outside/relative"));
+  fs::create_symlink("relative", path("outside/chain"));
+  fs::create_symlink("../outside/missing", path("items/directory"));
+  fs::create_symlink("missing/../../items/x", path("outside/up"));
+  EXPECT_EQ(lies("items/out"), kOther);
+  EXPECT_EQ(lies("outside/in"), kContains);
+  EXPECT_EQ(lies("outside/relative"), kContains);
+  EXPECT_EQ(lies("outside/chain"), kContains);
+  EXPECT_EQ(lies("items/directory/below"), kOther);
+  EXPECT_EQ(lies("outside/in/below"), kContains);
+  EXPECT_EQ(lies("outside/up"), -ENOENT);
+}
+
+TEST_F(LinuxFileSystemTest, AMissingComponentCannotBeLeftUpwards) {
+  EXPECT_EQ(lies("items/missing/../file"), -ENOENT);
+  EXPECT_EQ(lies("items/missing/../../outside/file"), -ENOENT);
+  EXPECT_EQ(lies("outside/missing/../../items/file"), -ENOENT);
+  EXPECT_EQ(lies("items/missing/.."), -ENOENT);
+  EXPECT_EQ(lies("items/missing/./x"), kContains);
+}
+
+TEST_F(LinuxFileSystemTest, ALoopOfLinksIsAnError) {
+  fs::create_symlink("b", path("a"));
+  fs::create_symlink("a", path("b"));
+  EXPECT_EQ(lies("a"), -ELOOP);
+  EXPECT_EQ(lies("a/below"), -ELOOP);
+  EXPECT_EQ(lies("items/file", "a"), -ELOOP);
+}
+
+TEST_F(LinuxFileSystemTest, AFileHasNothingBelowIt) {
+  EXPECT_EQ(lies("items/file/below"), -ENOTDIR);
+  EXPECT_EQ(lies("outside/file/below"), -ENOTDIR);
+}
+
+TEST_F(LinuxFileSystemTest, AnErrorNamesTheURLThatItIsAbout) {
+  const QXURL item = QXURL::fileURL(path("items/file/below"), QXURLKind::file);
+  const auto answer = fileSystem_.relationship(QXURL::fileURL(path("items"), QXURLKind::directory), item);
+  ASSERT_TRUE(std::holds_alternative<QXError>(answer));
+  EXPECT_EQ(std::get<QXError>(answer).domain, kQXSystemErrorDomain);
+  EXPECT_EQ(std::get<QXError>(answer).url, item);
+}
+
+TEST_F(LinuxFileSystemTest, AHardLinkLiesWhereItsNameIs) {
+  fs::create_hard_link(path("items/file"), path("outside/hard"));
+  EXPECT_EQ(lies("outside/hard"), kOther);
+}
+
+TEST_F(LinuxFileSystemTest, APipeIsPlacedWithoutWaitingForAWriter) {
+  ASSERT_EQ(::mkfifo(path("items/pipe").c_str(), 0600), 0);
+  EXPECT_EQ(lies("items/pipe"), kContains);
+}
+
+TEST_F(LinuxFileSystemTest, ADirectoryThatOnlyLinksToNothingIsMissing) {
+  fs::create_symlink("nowhere", path("link"));
+  EXPECT_EQ(lies("items/file", "link"), -kQXFileReadNoSuchFileError);
+}
+
+TEST_F(LinuxFileSystemTest, NamesThatLookRemovedAreNames) {
+  writeText(path("items/report (deleted)"), "x");
+  EXPECT_EQ(lies("items/report (deleted)"), kContains);
+  fs::create_directory(path("other (deleted)"));
+  writeText(path("other (deleted)/file"), "x");
+  EXPECT_EQ(lies("other (deleted)/file", "other (deleted)"), kContains);
+  EXPECT_EQ(lies("other (deleted)", "other (deleted)"), kSame);
+}
+
+TEST_F(LinuxFileSystemTest, WhatHasBeenRemovedLiesNowhere) {
+  const UniqueDescriptor file(::open(path("items/file").c_str(), O_RDONLY | O_CLOEXEC));
+  const UniqueDescriptor sub(::open(path("items/sub").c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC));
+  fs::remove(path("items/file"));
+  fs::remove(path("items/sub"));
+  writeText(path("items/file (deleted)"), "a name that looks like the removed file's");
+  const auto opened = [](const UniqueDescriptor& descriptor) {
+    return QXURL::fileURL("/proc/self/fd/" + std::to_string(descriptor.get()), QXURLKind::file);
+  };
+  const QXURL items = QXURL::fileURL(path("items"), QXURLKind::directory);
+  EXPECT_EQ(liesAt(items, opened(file)), -EAGAIN);
+  EXPECT_EQ(liesAt(items, opened(sub)), -EAGAIN);
+  EXPECT_EQ(liesAt(opened(sub), items), -EAGAIN);
+}
+
+TEST_F(LinuxFileSystemTest, AThingWithoutAPlaceIsAnError) {
+  int ends[2] = {-1, -1};
+  ASSERT_EQ(::pipe2(ends, O_CLOEXEC), 0);
+  const UniqueDescriptor reading(ends[0]);
+  const UniqueDescriptor writing(ends[1]);
+  const QXURL pipe = QXURL::fileURL("/proc/self/fd/" + std::to_string(reading.get()), QXURLKind::file);
+  EXPECT_EQ(liesAt(QXURL::fileURL(path("items"), QXURLKind::directory), pipe), -ESTALE);
+}
+
+TEST_F(LinuxFileSystemTest, EscapedURLsNameTheSameFiles) {
+  writeText(path("items/a b"), "x");
+  const auto item = QXURL::fromString("file://localhost" + path("items/a") + "%20b");
+  ASSERT_TRUE(item);
+  EXPECT_EQ(liesAt(QXURL::fileURL(path("items"), QXURLKind::directory), *item), kContains);
+}
+
+// Runs the body in a process of its own that may mount, and gives what the body gives; 255 when the process may not.
+template <class Body>
+int inOwnMountTree(const Body& body) {
+  const uid_t user = ::geteuid();
+  const gid_t group = ::getegid();
+  const pid_t child = ::fork();
+  if (child == 0) {
+    if (::unshare(CLONE_NEWUSER | CLONE_NEWNS) != 0) ::_exit(255);
+    writeText("/proc/self/setgroups", "deny");
+    writeText("/proc/self/uid_map", "0 " + std::to_string(user) + " 1");
+    writeText("/proc/self/gid_map", "0 " + std::to_string(group) + " 1");
+    ::_exit(body());
+  }
+  int status = 0;
+  if (child < 0 || ::waitpid(child, &status, 0) != child || !WIFEXITED(status)) return 255;
+  return WEXITSTATUS(status);
+}
+
+TEST_F(LinuxFileSystemTest, ADirectoryMountedElsewhereIsAnotherPlace) {
+  fs::create_directory(path("mounted"));
+  const int result = inOwnMountTree([this] {
+    if (::mount(path("items").c_str(), path("mounted").c_str(), nullptr, MS_BIND, nullptr) != 0) return 254;
+    return lies("mounted/file") + 4 * lies("mounted") + 16 * lies("mounted/file", "mounted") + 64 * lies("mounted/missing");
+  });
+  EXPECT_EQ(result, kOther + 4 * kOther + 16 * kContains + 64 * kOther);
+}
+
+TEST_F(LinuxFileSystemTest, AMountInsideADirectoryLiesInIt) {
+  const int result = inOwnMountTree([this] {
+    if (::mount(path("outside").c_str(), path("items/sub").c_str(), nullptr, MS_BIND, nullptr) != 0) return 254;
+    return lies("items/sub/file") + 4 * lies("items/sub") + 16 * lies("items/sub/file", "outside");
+  });
+  EXPECT_EQ(result, kContains + 4 * kContains + 16 * kOther);
+}
+
+}  // namespace
+}  // namespace docuvend::linux_platform
