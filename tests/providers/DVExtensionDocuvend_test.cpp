@@ -1,7 +1,5 @@
 #include "providers/DVExtensionDocuvend.h"
 
-#include <algorithm>
-
 #include "tests/providers/ProvidersTest.h"
 
 namespace docuvend {
