@@ -1,7 +1,9 @@
 // One end of an RPC connection over a Unix stream socket: frames in and out, requests to an exported object, replies to those who wait.
 //
-// The thread of the reactor that reads a request runs it; one connection's requests run one after another. The process at the other end is
-// not trusted: everything that it controls is bounded, and a malformed frame ends the connection.
+// The thread of the reactor that reads a request runs it; one connection's requests run one after another. While a request or a reply
+// handler runs, nothing else is read from that connection: a handler must not wait for an answer that comes over its own connection.
+// Writing never waits. The process at the other end is not trusted: everything that it controls is bounded (Limits.h), and a malformed
+// frame ends the connection.
 #pragma once
 
 #include <functional>
@@ -11,31 +13,35 @@
 #include <variant>
 
 #include "platform/linux/base/UniqueDescriptor.h"
+#include "platform/linux/wire/Frame.h"
 #include "platform/linux/wire/Reactor.h"
 #include "platform/rpc.h"
+#include "platform/rpc_errors.h"
 
 namespace docuvend::linux_platform {
-
-// The first frame of each direction.
-struct Hello {
-  std::uint32_t version = 0;
-  std::optional<std::string> declaredBundle;  // an unconfined client: the bundle that it acts for
-};
 
 class Endpoint : public std::enable_shared_from_this<Endpoint> {
  public:
   struct Handlers {
     // The peer's first frame arrived, before any request. An error ends the connection with it. May be empty.
     std::function<std::optional<QXError>(const Hello&)> onHello;
-    // The connection is over, once: why, or an error of ECONNRESET kind when the peer left. May be empty.
+    // This end closes the connection for what the peer did: bytes that are no frame, a version that is not spoken here, not reading. Before
+    // onClose. May be empty.
+    std::function<void(const QXError&)> onMisbehaviour;
+    // The connection is over, once, after the messages that waited have failed: why, or an error of ECONNRESET kind when the peer left.
+    // Also called after `close` and when the endpoint is released; on a thread of the reactor. May be empty.
     std::function<void(const QXError&)> onClose;
   };
 
-  // Takes a connected socket. Nothing is read before `resume`.
+  // Takes a connected socket and sends the hello; its version is put in when it is 0. Nothing is read before `resume`. The endpoint lives
+  // as long as its owner holds it: released, it closes the connection.
   [[nodiscard]] static std::shared_ptr<Endpoint> create(Reactor& reactor, UniqueDescriptor socket, Hello hello, Handlers handlers);
   ~Endpoint();
+  Endpoint(const Endpoint&) = delete;
+  Endpoint& operator=(const Endpoint&) = delete;
 
-  // Before `resume`. Without an exported object every request is answered with "unknown operation".
+  // Before `resume`. Without an exported object every request is answered with "unknown operation". The object is let go when the
+  // connection is over.
   void setExportedInterface(QXRpcInterface interface);
   void setExportedObject(std::shared_ptr<QXRpcExportedObject> object);
   void resume();
@@ -43,16 +49,18 @@ class Endpoint : public std::enable_shared_from_this<Endpoint> {
   // Each failed message calls the handler once. Keeps the endpoint alive.
   [[nodiscard]] std::shared_ptr<QXRpcProxy> remoteObjectProxy(QXErrorHandler errorHandler);
 
-  // Ends the connection; messages that wait for an answer fail.
+  // Ends the connection and tells the peer why; messages that wait for an answer fail. Waits for nothing and calls no handler itself.
   void close(const QXError& reason);
 
  private:
-  struct State;
-  explicit Endpoint(std::unique_ptr<State> state);
-  std::unique_ptr<State> state_;
+  class State;
+  class Proxy;
+  explicit Endpoint(std::shared_ptr<State> state);
+
+  const std::shared_ptr<State> state_;
 };
 
-// Connects to a named service's socket.
+// Connects to a named service's socket. Waits while the service has more clients waiting than it can queue.
 [[nodiscard]] std::variant<UniqueDescriptor, QXError> connectToSocket(const std::string& path);
 
 }  // namespace docuvend::linux_platform

@@ -1,0 +1,67 @@
+#include "platform/linux/wire/FrameWriter.h"
+
+#include <sys/socket.h>
+#include <sys/uio.h>
+
+#include <array>
+#include <cerrno>
+#include <cstring>
+#include <utility>
+
+#include "platform/linux/wire/Limits.h"
+
+namespace docuvend::linux_platform {
+
+void FrameWriter::add(EncodedFrame frame, std::uint64_t tag) {
+  pendingBytes_ += frame.bytes.size();
+  queue_.push_back({std::move(frame), tag});
+}
+
+// A frame's descriptors go with its first byte.
+long FrameWriter::writePart(int socket, const Waiting& waiting) {
+  alignas(cmsghdr) std::array<char, CMSG_SPACE(sizeof(int) * kMaximumDescriptors)> control{};
+  const auto& bytes = waiting.frame.bytes;
+  iovec part{const_cast<std::uint8_t*>(bytes.data()) + waiting.written, bytes.size() - waiting.written};
+  msghdr message{};
+  message.msg_iov = &part;
+  message.msg_iovlen = 1;
+  const auto& descriptors = waiting.frame.descriptors;
+  if (waiting.written == 0 && !descriptors.empty()) {
+    message.msg_control = control.data();
+    message.msg_controllen = CMSG_SPACE(sizeof(int) * descriptors.size());
+    cmsghdr* header = CMSG_FIRSTHDR(&message);
+    header->cmsg_level = SOL_SOCKET;
+    header->cmsg_type = SCM_RIGHTS;
+    header->cmsg_len = CMSG_LEN(sizeof(int) * descriptors.size());
+    for (std::size_t i = 0; i < descriptors.size(); ++i) {
+      std::memcpy(CMSG_DATA(header) + i * sizeof(int), &descriptors[i].number, sizeof(int));
+    }
+  }
+  long count = 0;
+  do {
+    count = ::sendmsg(socket, &message, MSG_DONTWAIT | MSG_NOSIGNAL);
+  } while (count < 0 && errno == EINTR);
+  return count;
+}
+
+FrameWriter::Progress FrameWriter::write(int socket) {
+  while (!queue_.empty()) {
+    Waiting& first = queue_.front();
+    const long count = writePart(socket, first);
+    if (count < 0) return errno == EAGAIN || errno == EWOULDBLOCK ? Progress::blocked : Progress::broken;
+    first.written += static_cast<std::size_t>(count);
+    pendingBytes_ -= static_cast<std::size_t>(count);
+    if (first.written == first.frame.bytes.size()) queue_.pop_front();
+  }
+  return Progress::drained;
+}
+
+std::vector<std::uint64_t> FrameWriter::unwritten() const {
+  std::vector<std::uint64_t> tags;
+  for (const Waiting& waiting : queue_) {
+    if (waiting.tag != 0) tags.push_back(waiting.tag);
+  }
+  return tags;
+}
+
+}  // namespace docuvend::linux_platform

@@ -1,0 +1,43 @@
+// Frames on their way to a socket that may not take them yet.
+#pragma once
+
+#include <cstddef>
+#include <cstdint>
+#include <deque>
+#include <vector>
+
+#include "platform/linux/wire/Frame.h"
+
+namespace docuvend::linux_platform {
+
+class FrameWriter {
+ public:
+  // `tag` is the caller's name for the frame in `unwritten`.
+  void add(EncodedFrame frame, std::uint64_t tag = 0);
+
+  enum class Progress {
+    drained,
+    blocked,  // the socket takes no more for now
+    broken,   // it never will
+  };
+  // Writes without waiting and without a signal.
+  [[nodiscard]] Progress write(int socket);
+
+  // Bytes that the socket has not taken.
+  [[nodiscard]] std::size_t pendingBytes() const { return pendingBytes_; }
+  // The tags, other than 0, of the frames that the socket has not taken whole.
+  [[nodiscard]] std::vector<std::uint64_t> unwritten() const;
+
+ private:
+  struct Waiting {
+    EncodedFrame frame;
+    std::uint64_t tag;
+    std::size_t written = 0;
+  };
+  [[nodiscard]] static long writePart(int socket, const Waiting& waiting);
+
+  std::deque<Waiting> queue_;
+  std::size_t pendingBytes_ = 0;
+};
+
+}  // namespace docuvend::linux_platform
