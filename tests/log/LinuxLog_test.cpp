@@ -1,0 +1,183 @@
+#include "platform/linux/log/LinuxLog.h"
+
+#include <gmock/gmock.h>
+#include <gtest/gtest.h>
+#include <sys/time.h>
+
+#include <csignal>
+#include <cstdlib>
+#include <string>
+
+#include "platform/linux/log/LogText.h"
+#include "tests/log/LogBench.h"
+
+namespace docuvend::linux_platform {
+namespace {
+
+using testing::ElementsAre;
+using testing::IsEmpty;
+
+class LinuxLogTest : public testing::Test {
+ protected:
+  LinuxLogOptions options() const {
+    LinuxLogOptions options;
+    options.identifier = "docuvendd";
+    options.streamDescriptor = stream.writeEnd.get();
+    options.journalSocketPath = journal.path();
+    return options;
+  }
+  static std::string line(const std::string& text) { return "docuvendd[" + std::to_string(::getpid()) + "]: " + text + "\n"; }
+
+  StreamReader stream;
+  JournalReader journal;
+};
+
+TEST_F(LinuxLogTest, OnlyTheTwoSettingsSwitchTypesOn) {
+  struct Row {
+    std::optional<std::string> setting;
+    bool isInfoOn;
+    bool isDebugOn;
+  };
+  const Row rows[] = {{std::nullopt, false, false}, {"", false, false},      {"info", true, false}, {"debug", true, true},
+                      {"INFO", false, false},       {"info ", false, false}, {"1", false, false}};
+  for (const Row& row : rows) {
+    LinuxLogOptions some = options();
+    some.setting = row.setting;
+    LinuxLog log(some);
+    EXPECT_EQ(log.defaultLog().isEnabled(QXLogType::info), row.isInfoOn) << row.setting.value_or("unset");
+    EXPECT_EQ(log.defaultLog().isEnabled(QXLogType::debug), row.isDebugOn) << row.setting.value_or("unset");
+  }
+}
+
+TEST_F(LinuxLogTest, TheSettingsComeFromTheEnvironment) {
+  ::setenv("DOCUVEND_LOG", "info", 1);
+  ::setenv("JOURNAL_STREAM", "8:123", 1);
+  const LinuxLogOptions set = LinuxLogOptions::fromEnvironment("program");
+  ::unsetenv("DOCUVEND_LOG");
+  ::unsetenv("JOURNAL_STREAM");
+  const LinuxLogOptions unset = LinuxLogOptions::fromEnvironment("program");
+  EXPECT_EQ(set.identifier, "program");
+  EXPECT_EQ(set.setting, "info");
+  EXPECT_EQ(set.journalStream, "8:123");
+  EXPECT_EQ(set.journalSocketPath, "/run/systemd/journal/socket");
+  EXPECT_EQ(set.streamDescriptor, 2);
+  EXPECT_EQ(unset.setting, std::nullopt);
+  EXPECT_EQ(unset.journalStream, std::nullopt);
+}
+
+TEST_F(LinuxLogTest, ALineNamesTheProgramAndItsProcess) {
+  LinuxLog log(options());
+  log.defaultLog().write(QXLogType::defaultType, "[NOTICE] starting.");
+  EXPECT_EQ(stream.read(), line("[NOTICE] starting."));
+}
+
+TEST_F(LinuxLogTest, APeersTextCannotStartALine) {
+  LinuxLog log(options());
+  log.defaultLog().write(QXLogType::fault, "[ERROR] bad\ndocuvendd[1]: [NOTICE] forged\x1b[2J\u2028");
+  EXPECT_EQ(stream.read(), line("[ERROR] bad\\ndocuvendd[1]: [NOTICE] forged\\x1b[2J\\u{2028}"));
+}
+
+TEST_F(LinuxLogTest, ALongMessageIsOneBoundedWrite) {
+  LinuxLog log(options());
+  log.defaultLog().write(QXLogType::fault, std::string(100000, 'a'));
+  const std::string text = stream.read();
+  EXPECT_LE(text.size(), 4096u);
+  EXPECT_EQ(text, line(std::string(kLongestLogText, 'a') + "... [" + std::to_string(100000 - kLongestLogText) + " more bytes]"));
+}
+
+TEST_F(LinuxLogTest, AJournalEntryCarriesPriorityAndIdentifier) {
+  LinuxLogOptions some = options();
+  some.setting = "debug";
+  some.journalStream = stream.deviceAndInode();
+  LinuxLog log(some);
+  log.defaultLog().write(QXLogType::defaultType, "[NOTICE] a");
+  log.defaultLog().write(QXLogType::info, "[INFO] b");
+  log.defaultLog().write(QXLogType::debug, "[DEBUG] c");
+  log.defaultLog().write(QXLogType::fault, "[ERROR] d\nPRIORITY=7");
+  EXPECT_THAT(journal.read(), ElementsAre("PRIORITY=5\nSYSLOG_IDENTIFIER=docuvendd\nMESSAGE=[NOTICE] a\n",
+                                          "PRIORITY=6\nSYSLOG_IDENTIFIER=docuvendd\nMESSAGE=[INFO] b\n",
+                                          "PRIORITY=7\nSYSLOG_IDENTIFIER=docuvendd\nMESSAGE=[DEBUG] c\n",
+                                          "PRIORITY=2\nSYSLOG_IDENTIFIER=docuvendd\nMESSAGE=[ERROR] d\\nPRIORITY=7\n"));
+  EXPECT_EQ(stream.read(), "");
+}
+
+TEST_F(LinuxLogTest, AStreamThatIsNotTheJournalsGetsTheLines) {
+  StreamReader other;
+  for (const std::string& journalStream : {other.deviceAndInode(), std::string(), std::string(":"), std::string("1"),
+                                           stream.deviceAndInode() + "0", stream.deviceAndInode() + " ", "x" + stream.deviceAndInode()}) {
+    LinuxLogOptions some = options();
+    some.journalStream = journalStream;
+    LinuxLog log(some);
+    log.defaultLog().write(QXLogType::defaultType, "[NOTICE] a");
+    EXPECT_EQ(stream.read(), line("[NOTICE] a")) << journalStream;
+    EXPECT_THAT(journal.read(), IsEmpty()) << journalStream;
+  }
+}
+
+TEST_F(LinuxLogTest, AnEntryThatTheJournalDoesNotTakeGoesToTheStream) {
+  for (const std::string& path : {journal.path() + "-missing", "/" + std::string(200, 'x')}) {
+    LinuxLogOptions some = options();
+    some.journalStream = stream.deviceAndInode();
+    some.journalSocketPath = path;
+    LinuxLog log(some);
+    log.defaultLog().write(QXLogType::defaultType, "[NOTICE] a");
+    EXPECT_EQ(stream.read(), line("[NOTICE] a")) << path;
+  }
+}
+
+TEST_F(LinuxLogTest, AClosedPipeNeitherEndsTheProgramNorLeavesASignal) {
+  LinuxLog log(options());
+  stream.readEnd.reset();
+  log.defaultLog().write(QXLogType::fault, "[ERROR] lost");
+  sigset_t pending;
+  ASSERT_EQ(::sigpending(&pending), 0);
+  EXPECT_EQ(::sigismember(&pending, SIGPIPE), 0);
+  sigset_t mask;
+  ASSERT_EQ(::pthread_sigmask(SIG_SETMASK, nullptr, &mask), 0);
+  EXPECT_EQ(::sigismember(&mask, SIGPIPE), 0);
+}
+
+TEST_F(LinuxLogTest, AFullPipeThatDoesNotWaitAndAClosedDescriptorLoseTheEntry) {
+  ASSERT_EQ(::fcntl(stream.writeEnd.get(), F_SETFL, O_NONBLOCK), 0);
+  ASSERT_GT(::fcntl(stream.writeEnd.get(), F_SETPIPE_SZ, 4096), 0);
+  LinuxLog log(options());
+  for (int i = 0; i < 20; ++i) log.defaultLog().write(QXLogType::fault, std::string(1000, 'a'));
+  EXPECT_LE(stream.read().size(), 4096u);
+  LinuxLogOptions closed = options();
+  closed.streamDescriptor = -1;
+  LinuxLog other(closed);
+  other.defaultLog().write(QXLogType::fault, "[ERROR] lost");
+  EXPECT_EQ(stream.read(), "");
+}
+
+// A line that waits for room in the pipe is interrupted again and again and still arrives whole.
+TEST_F(LinuxLogTest, AnInterruptedWriteGoesOn) {
+  ASSERT_GT(::fcntl(stream.writeEnd.get(), F_SETPIPE_SZ, 4096), 0);
+  static volatile std::sig_atomic_t interruptions;
+  static int readDescriptor;
+  interruptions = 0;
+  readDescriptor = stream.readEnd.get();
+  struct sigaction action {};
+  action.sa_handler = [](int) {
+    interruptions = interruptions + 1;
+    char buffer[4096];
+    // Room is made only after several interruptions.
+    if (interruptions == 5) (void)!::read(readDescriptor, buffer, sizeof buffer);
+  };
+  struct sigaction before {};
+  ASSERT_EQ(::sigaction(SIGALRM, &action, &before), 0);  // without SA_RESTART
+  const std::string filler(4096, 'x');
+  ASSERT_EQ(::write(stream.writeEnd.get(), filler.data(), filler.size()), 4096);
+  LinuxLog log(options());
+  const itimerval often{{0, 2000}, {0, 2000}};
+  ASSERT_EQ(::setitimer(ITIMER_REAL, &often, nullptr), 0);
+  log.defaultLog().write(QXLogType::defaultType, "[NOTICE] whole");
+  const itimerval never{};
+  ASSERT_EQ(::setitimer(ITIMER_REAL, &never, nullptr), 0);
+  ASSERT_EQ(::sigaction(SIGALRM, &before, nullptr), 0);
+  EXPECT_GE(interruptions, 5);
+  EXPECT_EQ(stream.read(), line("[NOTICE] whole"));
+}
+
+}  // namespace
+}  // namespace docuvend::linux_platform
