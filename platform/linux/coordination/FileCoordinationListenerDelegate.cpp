@@ -1,0 +1,17 @@
+#include "platform/linux/coordination/FileCoordinationListenerDelegate.h"
+
+#include "platform/linux/coordination/FileCoordinationServicer.h"
+#include "platform/linux/wire/FileCoordinationProtocol.h"
+
+namespace docuvend::linux_platform {
+
+bool FileCoordinationListenerDelegate::listener(QXRpcListener& /*listener*/,
+                                                const std::shared_ptr<QXRpcConnection>& shouldAcceptNewConnection) {
+  auto servicer = std::make_shared<FileCoordinationServicer>(coordinator_, sandbox_, shouldAcceptNewConnection);
+  shouldAcceptNewConnection->setExportedInterface(qxInterfaceOf<QXFileCoordination>());
+  shouldAcceptNewConnection->setExportedObject(std::make_shared<QXRpcExport<QXFileCoordination>>(std::move(servicer)));
+  shouldAcceptNewConnection->resume();
+  return true;
+}
+
+}  // namespace docuvend::linux_platform

@@ -1,0 +1,75 @@
+// What every sandbox answers, the one in memory and the real one.
+#include "platform/sandbox.h"
+
+#include <gtest/gtest.h>
+
+#include <algorithm>
+#include <string>
+
+#include "platform/fake/FakeSandbox.h"
+#include "tests/sandbox/SandboxHouse.h"
+
+namespace docuvend {
+namespace {
+
+using linux_platform::Standing;
+
+class Fake : public linux_platform::testing::SandboxHouse {
+ protected:
+  QXSandbox& sandbox() { return sandbox_; }
+  QXAuditToken writer() {
+    sandbox_.setAnswer(document, fake_platform::FakeSandbox::kAllowed);
+    return peers.add(thisProcess(Standing::unconfined));
+  }
+  std::string refusedPath() {
+    sandbox_.refuseIssuing(storage);
+    return storage;
+  }
+
+ private:
+  fake_platform::FakeSandbox sandbox_;
+};
+
+class Linux : public linux_platform::testing::SandboxHouse {
+ protected:
+  QXSandbox& sandbox() { return sandbox_; }
+  QXAuditToken writer() { return peers.add(thisProcess(Standing::unconfined)); }
+  std::string refusedPath() { return storage; }
+
+ private:
+  linux_platform::LinuxSandbox sandbox_{linux_platform::TokenKey::random(), bundles, peers};
+};
+
+template <class Platform>
+class QXSandboxTest : public Platform {};
+
+using Platforms = ::testing::Types<Fake, Linux>;
+TYPED_TEST_SUITE(QXSandboxTest, Platforms);
+
+TYPED_TEST(QXSandboxTest, IssuesPrintableTextForAFileAndForOneThatIsNotThereYet) {
+  for (const std::string& path : {this->document, this->sibling}) {
+    const auto token = this->sandbox().issueReadWriteExtension(path);
+    ASSERT_TRUE(token) << path;
+    EXPECT_FALSE(token->empty());
+    EXPECT_TRUE(std::all_of(token->begin(), token->end(), [](char c) { return c >= ' ' && c < '\x7f'; })) << *token;
+  }
+}
+
+TYPED_TEST(QXSandboxTest, IssuesNothingWhereItRefuses) {
+  EXPECT_EQ(this->sandbox().issueReadWriteExtension(this->refusedPath()), std::nullopt);
+}
+
+TYPED_TEST(QXSandboxTest, AllowsTheWriterToWriteAndNothingElse) {
+  const QXAuditToken writer = this->writer();
+  EXPECT_EQ(this->sandbox().checkWithoutReport(writer, kQXSandboxFileWriteData, this->document), 0);
+  EXPECT_NE(this->sandbox().checkWithoutReport(writer, "file-read-data", this->document), 0);
+  EXPECT_NE(this->sandbox().checkWithoutReport(writer, kQXSandboxFileWriteData, "/etc/passwd"), 0);
+}
+
+TYPED_TEST(QXSandboxTest, RefusesTheZeroToken) {
+  static_cast<void>(this->writer());
+  EXPECT_NE(this->sandbox().checkWithoutReport(QXAuditToken{}, kQXSandboxFileWriteData, this->document), 0);
+}
+
+}  // namespace
+}  // namespace docuvend
