@@ -1,0 +1,94 @@
+#include "examples/cellar/Files.h"
+
+#include <dirent.h>
+#include <fcntl.h>
+#include <stdio.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include <algorithm>
+#include <cerrno>
+#include <memory>
+#include <utility>
+
+namespace docuvend::cellar {
+namespace {
+
+constexpr mode_t kDirectoryMode = 0700;
+constexpr mode_t kFileMode = 0600;
+constexpr std::int64_t kNanoseconds = 1'000'000'000;
+
+std::int64_t nanoseconds(const statx_timestamp& time) { return time.tv_sec * kNanoseconds + time.tv_nsec; }
+
+std::optional<Fingerprint> examine(int directory, const char* name, int flags) {
+  struct statx status {};
+  if (statx(directory, name, flags | AT_SYMLINK_NOFOLLOW, STATX_BASIC_STATS | STATX_BTIME, &status) != 0) return std::nullopt;
+  if (!S_ISREG(status.stx_mode)) return std::nullopt;
+  return Fingerprint{{status.stx_ino, nanoseconds(status.stx_btime)}, status.stx_size, nanoseconds(status.stx_mtime)};
+}
+
+}  // namespace
+
+QXError systemError(const std::string& what) { return QXError::system(errno, what); }
+
+std::vector<Entry> listFiles(const std::string& directory) {
+  std::vector<Entry> result;
+  const std::unique_ptr<DIR, int (*)(DIR*)> stream(opendir(directory.c_str()), &closedir);
+  if (!stream) return result;
+  while (const dirent* entry = readdir(stream.get())) {
+    if (entry->d_name[0] == '.') continue;
+    if (const auto fingerprint = examine(dirfd(stream.get()), entry->d_name, 0)) result.push_back({entry->d_name, *fingerprint});
+  }
+  std::sort(result.begin(), result.end(), [](const Entry& a, const Entry& b) { return a.name < b.name; });
+  return result;
+}
+
+std::optional<Fingerprint> fingerprintOf(const UniqueDescriptor& file) { return examine(file.get(), "", AT_EMPTY_PATH); }
+
+std::optional<QXError> ensureDirectory(const std::string& path) {
+  if (mkdir(path.c_str(), kDirectoryMode) == 0 || errno == EEXIST) return std::nullopt;
+  return systemError("cannot make " + path);
+}
+
+Replacement::Replacement(std::string temporary)
+    : temporary_(std::move(temporary)), file_(open(temporary_.c_str(), O_RDWR | O_CREAT | O_TRUNC | O_NOFOLLOW | O_CLOEXEC, kFileMode)) {}
+
+Replacement::~Replacement() {
+  if (file_ && !temporary_.empty()) unlink(temporary_.c_str());
+}
+
+std::optional<QXError> Replacement::commit(const std::string& path, Over over) {
+  if (fsync(file_.get()) != 0) return systemError("cannot write " + path);
+  const bool isInPlace = over == Over::anything ? rename(temporary_.c_str(), path.c_str()) == 0 : renameOverNothing(temporary_, path);
+  if (!isInPlace) return systemError("cannot put a file at " + path);
+  temporary_.clear();
+  const UniqueDescriptor directory(open(path.substr(0, path.rfind('/')).c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC));
+  if (!directory || fsync(directory.get()) != 0) return systemError("cannot write the directory of " + path);
+  return std::nullopt;
+}
+
+bool renameOverNothing(const std::string& from, const std::string& to) {
+  return renameat2(AT_FDCWD, from.c_str(), AT_FDCWD, to.c_str(), RENAME_NOREPLACE) == 0;
+}
+
+void removeHiddenFiles(const std::string& directory, std::string_view suffix) {
+  const std::unique_ptr<DIR, int (*)(DIR*)> stream(opendir(directory.c_str()), &closedir);
+  if (!stream) return;
+  while (const dirent* entry = readdir(stream.get())) {
+    const std::string_view name = entry->d_name;
+    if (name.starts_with('.') && name.ends_with(suffix)) unlinkat(dirfd(stream.get()), entry->d_name, 0);
+  }
+}
+
+bool writeAll(const UniqueDescriptor& file, const char* bytes, std::size_t count) {
+  while (count > 0) {
+    const ssize_t written = write(file.get(), bytes, count);
+    if (written < 0 && errno == EINTR) continue;
+    if (written <= 0) return false;
+    bytes += written;
+    count -= static_cast<std::size_t>(written);
+  }
+  return true;
+}
+
+}  // namespace docuvend::cellar

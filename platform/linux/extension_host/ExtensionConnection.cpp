@@ -1,0 +1,17 @@
+#include "platform/linux/extension_host/ExtensionConnection.h"
+
+#include <utility>
+
+namespace docuvend::linux_platform {
+
+std::optional<QXValue> ExtensionConnection::valueForEntitlement(const std::string& name) const {
+  const auto found = entitlements_.find(name);
+  if (found == entitlements_.end()) return std::nullopt;
+  return found->second;
+}
+
+std::shared_ptr<QXRpcProxy> ExtensionConnection::remoteObjectProxy(QXErrorHandler errorHandler) {
+  return process_->remoteObjectProxy(std::move(errorHandler));
+}
+
+}  // namespace docuvend::linux_platform

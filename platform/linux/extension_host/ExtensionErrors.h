@@ -1,0 +1,26 @@
+// The errors that the extension host itself makes.
+#pragma once
+
+#include <cstdint>
+#include <string>
+#include <utility>
+
+#include "platform/QXError.h"
+
+namespace docuvend::linux_platform {
+
+inline constexpr const char* kExtensionHostErrorDomain = "QXExtensionHostErrorDomain";
+
+enum class ExtensionHostErrorCode : std::int64_t {
+  backingOff = 1,    // its process ended too soon too often; try again later
+  notStarted = 2,    // no process could be made; the underlying error says why
+  notAnswering = 3,  // its process was ended because an answer took too long
+  ended = 4,         // its process ended
+  stopped = 5,       // the extension host is going away
+};
+
+[[nodiscard]] inline QXError extensionHostError(ExtensionHostErrorCode code, std::string description) {
+  return QXError::make(kExtensionHostErrorDomain, static_cast<std::int64_t>(code), std::move(description));
+}
+
+}  // namespace docuvend::linux_platform

@@ -1,0 +1,227 @@
+// How a process ends
+//
+//   alive ──(end)──────────────▶ closed ──(grace)──▶ terminated ──(grace)──▶ killed ──▶ reaped
+//     └──(connection over, death, overdue answer)──────────────────────────▶ killed ──▶ reaped
+//
+// A process whose connection is over without our doing can do nothing more for us, so it is killed at once; one that we let go may finish
+// what it is about. Every signal goes through the pidfd, so it can reach no other process. From any stage the process may die by itself;
+// whatever comes, it is reaped exactly once, by the watch on the pidfd or by the destructor.
+//
+// Two threads may see the end at the same time, one on the socket and one on the pidfd. The event lock puts them in a row: the stage leaves
+// `alive` once, and onLost is through before onGone begins.
+#include "platform/linux/extension_host/ExtensionProcess.h"
+
+#include <signal.h>
+#include <sys/epoll.h>
+#include <sys/pidfd.h>
+#include <sys/wait.h>
+
+#include <chrono>
+#include <utility>
+
+#include "platform/linux/extension_host/ExtensionErrors.h"
+
+namespace docuvend::linux_platform {
+namespace {
+
+using Clock = std::chrono::steady_clock;
+
+std::string describeEnd(const siginfo_t& info) {
+  if (info.si_code == CLD_EXITED) return "exited with status " + std::to_string(info.si_status);
+  return "was ended by signal " + std::to_string(info.si_status);
+}
+
+}  // namespace
+
+// Messages without a limit go straight to the endpoint; each limited one gets an error handler of its own, because the failure of a message
+// must be told apart from that of another.
+class ExtensionProcess::Proxy : public QXRpcProxy {
+ public:
+  Proxy(std::weak_ptr<ExtensionProcess> process, std::shared_ptr<Endpoint> endpoint, QXErrorHandler errorHandler)
+      : process_(std::move(process)),
+        endpoint_(std::move(endpoint)),
+        errorHandler_(std::move(errorHandler)),
+        plain_(endpoint_->remoteObjectProxy(errorHandler_)) {}
+
+  void send(const QXRpcOperation& operation, QXArray arguments, QXRpcReply reply) override {
+    const auto process = hasLimitedAnswer(operation.name) && reply ? process_.lock() : nullptr;
+    if (!process) {
+      plain_->send(operation, std::move(arguments), std::move(reply));
+      return;
+    }
+    const AnswerDeadlines::Message message = process->expectAnswer(operation.name);
+    const auto limited = endpoint_->remoteObjectProxy([weak = process_, message, errorHandler = errorHandler_](const QXError& error) {
+      if (const auto strongProcess = weak.lock()) strongProcess->gotAnswer(message);
+      if (errorHandler) errorHandler(error);
+    });
+    limited->send(operation, std::move(arguments), [weak = process_, message, reply = std::move(reply)](QXArray values) {
+      if (const auto strongProcess = weak.lock()) strongProcess->gotAnswer(message);
+      reply(std::move(values));
+    });
+  }
+
+ private:
+  std::weak_ptr<ExtensionProcess> process_;
+  std::shared_ptr<Endpoint> endpoint_;
+  QXErrorHandler errorHandler_;
+  std::shared_ptr<QXRpcProxy> plain_;
+};
+
+ExtensionProcess::ExtensionProcess(Ends ends, std::string identifier, const ExtensionTimes& times, Reactor& reactor, QXLogHandle& log,
+                                   Handlers handlers)
+    : identifier_(std::move(identifier)),
+      times_(times),
+      log_(log),
+      handlers_(std::move(handlers)),
+      process_(std::move(ends.process)),
+      reactor_(reactor),
+      deadlines_(times.answerLimit) {}
+
+std::shared_ptr<ExtensionProcess> ExtensionProcess::create(Ends ends, const std::string& identifier, const QXRpcInterface& exported,
+                                                           const ExtensionTimes& times, Reactor& reactor, QXLogHandle& log,
+                                                           Handlers handlers) {
+  UniqueDescriptor socket = std::move(ends.socket);
+  UniqueDescriptor output = std::move(ends.output);
+  const std::shared_ptr<ExtensionProcess> process(
+      new ExtensionProcess(std::move(ends), identifier, times, reactor, log, std::move(handlers)));
+  const std::weak_ptr<ExtensionProcess> weak = process;
+
+  Endpoint::Handlers endpointHandlers;
+  endpointHandlers.onClose = [weak](const QXError&) {
+    if (const auto strongSelf = weak.lock()) strongSelf->connectionIsOver();
+  };
+  process->endpoint_ = Endpoint::create(reactor, std::move(socket), Hello{}, std::move(endpointHandlers));
+  process->endpoint_->setExportedInterface(exported);
+  process->output_ = std::make_unique<OutputLog>(reactor, log, identifier, std::move(output));
+  process->graceTimer_ = std::make_unique<Timer>(reactor, [weak] {
+    if (const auto strongSelf = weak.lock()) strongSelf->graceIsOver();
+  });
+  process->answerTimer_ = std::make_unique<Timer>(reactor, [weak] {
+    if (const auto strongSelf = weak.lock()) strongSelf->lookForOverdueAnswers();
+  });
+  return process;
+}
+
+ExtensionProcess::~ExtensionProcess() {
+  endpoint_->close(extensionHostError(ExtensionHostErrorCode::stopped, "The process of " + identifier_ + " was let go."));
+  death_.reset();
+  if (isReaped_) return;
+  signalProcess(SIGKILL);
+  siginfo_t info{};
+  waitid(P_PIDFD, static_cast<id_t>(process_.descriptor.get()), &info, WEXITED);
+}
+
+void ExtensionProcess::resume() {
+  endpoint_->resume();
+  const std::lock_guard lock(eventMutex_);
+  death_ = reactor_.watch(process_.descriptor.get(), EPOLLIN, [weak = weak_from_this()](std::uint32_t) -> std::uint32_t {
+    const auto strongSelf = weak.lock();
+    if (strongSelf && !strongSelf->reap()) return EPOLLIN;
+    return 0;
+  });
+}
+
+void ExtensionProcess::end() {
+  {
+    const std::lock_guard lock(eventMutex_);
+    if (stage_ != Stage::alive) return;
+    stage_ = Stage::closed;
+    isLetGo_ = true;
+  }
+  endpoint_->close(extensionHostError(ExtensionHostErrorCode::ended, "The process of " + identifier_ + " was let go."));
+  graceTimer_->setFor(Clock::now() + times_.endGrace);
+}
+
+std::shared_ptr<QXRpcProxy> ExtensionProcess::remoteObjectProxy(QXErrorHandler errorHandler) {
+  return std::make_shared<Proxy>(weak_from_this(), endpoint_, std::move(errorHandler));
+}
+
+void ExtensionProcess::connectionIsOver() {
+  const std::lock_guard lock(eventMutex_);
+  if (stage_ != Stage::alive) return;
+  stage_ = Stage::killed;
+  signalProcess(SIGKILL);
+  handlers_.onLost(ProcessLifetime::Cause::died);
+}
+
+bool ExtensionProcess::reap() {
+  siginfo_t info{};
+  if (waitid(P_PIDFD, static_cast<id_t>(process_.descriptor.get()), &info, WEXITED | WNOHANG) != 0 || info.si_pid == 0) return false;
+  const std::string how = describeEnd(info);
+  Stage before = Stage::alive;
+  QXLogType importance = QXLogType::defaultType;
+  {
+    const std::lock_guard lock(eventMutex_);
+    isReaped_ = true;
+    if (isLetGo_) importance = QXLogType::info;
+    before = std::exchange(stage_, Stage::killed);
+  }
+  if (before == Stage::alive) {
+    endpoint_->close(extensionHostError(ExtensionHostErrorCode::ended, "The process of " + identifier_ + " " + how + "."));
+  }
+  note(importance, how);
+  const std::lock_guard lock(eventMutex_);
+  if (before == Stage::alive) handlers_.onLost(ProcessLifetime::Cause::died);
+  handlers_.onGone();
+  return true;
+}
+
+void ExtensionProcess::graceIsOver() {
+  const std::lock_guard lock(eventMutex_);
+  if (stage_ == Stage::closed) {
+    stage_ = Stage::terminated;
+    signalProcess(SIGTERM);
+    graceTimer_->setFor(Clock::now() + times_.endGrace);
+  } else if (stage_ == Stage::terminated) {
+    stage_ = Stage::killed;
+    signalProcess(SIGKILL);
+  }
+}
+
+void ExtensionProcess::lookForOverdueAnswers() {
+  AnswerDeadlines::Verdict verdict;
+  {
+    const std::lock_guard lock(deadlinesMutex_);
+    verdict = deadlines_.timerFired(Clock::now());
+  }
+  if (verdict.setTimer) answerTimer_->setFor(*verdict.setTimer);
+  if (!verdict.overdue) return;
+  {
+    const std::lock_guard lock(eventMutex_);
+    if (stage_ != Stage::alive) return;
+    stage_ = Stage::killed;
+    signalProcess(SIGKILL);
+    handlers_.onLost(ProcessLifetime::Cause::notAnswering);
+  }
+  const std::string what = "did not answer " + *verdict.overdue + " in time";
+  note(QXLogType::defaultType, what);
+  endpoint_->close(extensionHostError(ExtensionHostErrorCode::notAnswering, "The process of " + identifier_ + " " + what + "."));
+}
+
+AnswerDeadlines::Message ExtensionProcess::expectAnswer(const std::string& operationName) {
+  AnswerDeadlines::Sent sent;
+  {
+    const std::lock_guard lock(deadlinesMutex_);
+    sent = deadlines_.sent(operationName, Clock::now());
+  }
+  if (sent.setTimer) answerTimer_->setFor(*sent.setTimer);
+  return sent.message;
+}
+
+void ExtensionProcess::gotAnswer(AnswerDeadlines::Message message) {
+  const std::lock_guard lock(deadlinesMutex_);
+  deadlines_.answered(message);
+}
+
+void ExtensionProcess::signalProcess(int signal) const {
+  // A process that is gone cannot be signalled, which is just as well.
+  pidfd_send_signal(process_.descriptor.get(), signal, nullptr, 0);
+}
+
+void ExtensionProcess::note(QXLogType type, const std::string& what) const {
+  if (!log_.isEnabled(type)) return;
+  const std::string level = type == QXLogType::info ? "[INFO]" : "[NOTICE]";
+  log_.write(type, level + " The process of " + identifier_ + " " + what + ".");
+}
+
+}  // namespace docuvend::linux_platform

@@ -1,0 +1,97 @@
+// A running process of an extension, from its spawning to its reaping.
+//
+// Its connection is that of all its requests. When the connection is over for any reason, messages that wait for an answer fail and the
+// process is ended; when an answer that must be quick is overdue, the same. The handlers run on threads of the reactor, one at a time.
+#pragma once
+
+#include <functional>
+#include <memory>
+#include <mutex>
+#include <optional>
+#include <string>
+
+#include "platform/linux/base/UniqueDescriptor.h"
+#include "platform/linux/bundles/Bundle.h"
+#include "platform/linux/extension_host/AnswerDeadlines.h"
+#include "platform/linux/extension_host/ExtensionTimes.h"
+#include "platform/linux/extension_host/OutputLog.h"
+#include "platform/linux/extension_host/ProcessLifetime.h"
+#include "platform/linux/extension_host/ProcessSpawner.h"
+#include "platform/linux/extension_host/Timer.h"
+#include "platform/linux/wire/Endpoint.h"
+#include "platform/linux/wire/Reactor.h"
+#include "platform/log.h"
+#include "platform/rpc.h"
+
+namespace docuvend::linux_platform {
+
+class ExtensionProcess : public std::enable_shared_from_this<ExtensionProcess> {
+ public:
+  struct Handlers {
+    // The process is of no more use, though nobody asked for its end. At most once.
+    std::function<void(ProcessLifetime::Cause)> onLost;
+    // The process is gone. Once, after onLost.
+    std::function<void()> onGone;
+  };
+  struct Ends {
+    SpawnedProcess process;
+    UniqueDescriptor socket;  // ours
+    UniqueDescriptor output;  // the reading end
+  };
+
+  // Nothing is read and no handler called before `resume`.
+  [[nodiscard]] static std::shared_ptr<ExtensionProcess> create(Ends ends, const std::string& identifier, const QXRpcInterface& exported,
+                                                                const ExtensionTimes& times, Reactor& reactor, QXLogHandle& log,
+                                                                Handlers handlers);
+  // Ends the process at once if it is still there.
+  ~ExtensionProcess();
+  ExtensionProcess(const ExtensionProcess&) = delete;
+  ExtensionProcess& operator=(const ExtensionProcess&) = delete;
+
+  void resume();
+  // Closes the connection; then, if that does not make the process end by itself, by signal.
+  void end();
+
+  [[nodiscard]] int number() const { return process_.number; }
+  // A proxy of the connection that watches over the answers which must be quick.
+  [[nodiscard]] std::shared_ptr<QXRpcProxy> remoteObjectProxy(QXErrorHandler errorHandler);
+
+ private:
+  class Proxy;
+  enum class Stage { alive, closed, terminated, killed };
+
+  ExtensionProcess(Ends ends, std::string identifier, const ExtensionTimes& times, Reactor& reactor, QXLogHandle& log, Handlers handlers);
+
+  void connectionIsOver();
+  // False: not dead yet.
+  [[nodiscard]] bool reap();
+  void graceIsOver();
+  void lookForOverdueAnswers();
+  [[nodiscard]] AnswerDeadlines::Message expectAnswer(const std::string& operationName);
+  void gotAnswer(AnswerDeadlines::Message message);
+  void signalProcess(int signal) const;
+  void note(QXLogType type, const std::string& what) const;
+
+  // Constant after `create`.
+  const std::string identifier_;
+  const ExtensionTimes times_;
+  QXLogHandle& log_;
+  const Handlers handlers_;
+  const SpawnedProcess process_;
+  Reactor& reactor_;
+  std::shared_ptr<Endpoint> endpoint_;
+  std::unique_ptr<OutputLog> output_;
+  std::unique_ptr<Timer> graceTimer_;
+  std::unique_ptr<Timer> answerTimer_;
+
+  std::mutex deadlinesMutex_;  // guards the deadlines and nothing else; nothing is called with it
+  AnswerDeadlines deadlines_;
+
+  std::mutex eventMutex_;  // guards the four below, and is held while a handler runs
+  Stage stage_ = Stage::alive;
+  bool isLetGo_ = false;
+  bool isReaped_ = false;
+  std::shared_ptr<Reactor::Registration> death_;
+};
+
+}  // namespace docuvend::linux_platform

@@ -1,0 +1,231 @@
+#include "platform/linux/extension_host/LinuxExtension.h"
+
+#include <fcntl.h>
+#include <sys/random.h>
+#include <sys/socket.h>
+#include <unistd.h>
+
+#include <array>
+#include <cerrno>
+#include <chrono>
+#include <utility>
+
+#include "platform/linux/extension_host/ExtensionConnection.h"
+#include "platform/linux/extension_host/ExtensionErrors.h"
+#include "platform/linux/extension_host/Matching.h"
+#include "platform/linux/launch/ConfinedLaunch.h"
+
+namespace docuvend::linux_platform {
+namespace {
+
+using Clock = std::chrono::steady_clock;
+
+// Random, in the form that RFC 4122 gives to random ones.
+QXUUID freshUUID() {
+  QXUUID result;
+  // Up to 256 bytes are never given in part.
+  while (getrandom(result.bytes.data(), result.bytes.size(), 0) < 0 && errno == EINTR) {
+  }
+  result.bytes[6] = static_cast<std::uint8_t>((result.bytes[6] & 0x0FU) | 0x40U);
+  result.bytes[8] = static_cast<std::uint8_t>((result.bytes[8] & 0x3FU) | 0x80U);
+  return result;
+}
+
+QXError notStarted(const std::string& identifier, QXError underlying) {
+  QXError error = extensionHostError(ExtensionHostErrorCode::notStarted, "The process of " + identifier + " could not be started.");
+  error.underlying = std::make_shared<const QXError>(std::move(underlying));
+  return error;
+}
+
+}  // namespace
+
+LinuxExtension::LinuxExtension(Bundle bundle, QXExtensionContextClass contextClass, std::shared_ptr<ExtensionServices> services)
+    : bundle_(std::move(bundle)), contextClass_(contextClass), services_(std::move(services)), lifetime_(services_->times) {}
+
+std::shared_ptr<LinuxExtension> LinuxExtension::create(Bundle bundle, QXExtensionContextClass contextClass,
+                                                       std::shared_ptr<ExtensionServices> services) {
+  const std::shared_ptr<LinuxExtension> extension(new LinuxExtension(std::move(bundle), contextClass, std::move(services)));
+  extension->idleTimer_ = std::make_unique<Timer>(extension->services_->reactor, [weak = std::weak_ptr(extension)] {
+    if (const auto strongSelf = weak.lock()) strongSelf->endWhenIdleForLong();
+  });
+  return extension;
+}
+
+LinuxExtension::~LinuxExtension() = default;
+
+bool LinuxExtension::isEqual(const QXExtension& other) const {
+  const auto* extension = dynamic_cast<const LinuxExtension*>(&other);
+  return extension != nullptr && isSameInstallation(bundle_, extension->bundle_);
+}
+
+void LinuxExtension::beginExtensionRequest(BeginCompletion completion) {
+  const QXUUID request = freshUUID();
+  ProcessLifetime::Begin begin{};
+  std::optional<QXError> refusal;
+  {
+    const std::lock_guard lock(mutex_);
+    begin = lifetime_.begin(request, Clock::now());
+    if (begin == ProcessLifetime::Begin::refuse) refusal = backingOffError();
+    if (begin == ProcessLifetime::Begin::start || begin == ProcessLifetime::Begin::wait) {
+      waiting_.push_back({request, std::move(completion)});
+    }
+  }
+  switch (begin) {
+    case ProcessLifetime::Begin::start:
+      startOnSpawner();
+      break;
+    case ProcessLifetime::Begin::wait:
+      break;
+    case ProcessLifetime::Begin::join:
+      completion(request, /*error=*/std::nullopt);
+      break;
+    case ProcessLifetime::Begin::refuse:
+      completion(/*request=*/std::nullopt, std::move(refusal));
+      break;
+  }
+}
+
+void LinuxExtension::cancelExtensionRequest(const QXUUID& request) {
+  std::optional<ProcessLifetime::Time> deadline;
+  {
+    const std::lock_guard lock(mutex_);
+    lifetime_.finish(request, Clock::now());
+    // A timer that is set looks at the deadline of its time and is set again if that lies ahead.
+    if (!idleTimerIsSet_) deadline = lifetime_.idleDeadline();
+    idleTimerIsSet_ = idleTimerIsSet_ || deadline.has_value();
+  }
+  if (deadline) idleTimer_->setFor(*deadline);
+}
+
+std::shared_ptr<QXExtensionContext> LinuxExtension::extensionContextForRequest(const QXUUID& request) {
+  const std::lock_guard lock(mutex_);
+  if (!process_ || !lifetime_.isOpen(request)) return nullptr;
+  return std::make_shared<ExtensionContext>(std::make_shared<ExtensionConnection>(process_, bundle_.entitlements));
+}
+
+void LinuxExtension::retire() {
+  std::optional<ProcessLifetime::Time> deadline;
+  {
+    const std::lock_guard lock(mutex_);
+    lifetime_.retire();
+    deadline = lifetime_.idleDeadline();
+    idleTimerIsSet_ = deadline.has_value();
+  }
+  if (deadline) idleTimer_->setFor(*deadline);
+}
+
+void LinuxExtension::startOnSpawner() {
+  const bool isTaken = services_->spawner.perform([weak = weak_from_this()] {
+    if (const auto strongSelf = weak.lock()) strongSelf->start();
+  });
+  if (!isTaken) didNotStart(extensionHostError(ExtensionHostErrorCode::stopped, "The extension host is stopping."));
+}
+
+void LinuxExtension::start() {
+  auto made = makeProcess();
+  if (auto* error = std::get_if<QXError>(&made)) {
+    didNotStart(notStarted(bundle_.identifier, std::move(*error)));
+  } else {
+    didStart(std::move(std::get<std::shared_ptr<ExtensionProcess>>(made)));
+  }
+}
+
+std::variant<std::shared_ptr<ExtensionProcess>, QXError> LinuxExtension::makeProcess() {
+  // A confinement that root makes keeps far too little out.
+  if (geteuid() == 0) return QXError::system(EPERM, "extensions are not started by root");
+
+  std::array<int, 2> sockets{};
+  if (socketpair(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC | SOCK_NONBLOCK, 0, sockets.data()) != 0) {
+    return QXError::system(errno, "a socket for an extension could not be made");
+  }
+  UniqueDescriptor ourSocket(sockets[0]);
+  UniqueDescriptor theirSocket(sockets[1]);
+  std::array<int, 2> pipes{};
+  if (pipe2(pipes.data(), O_CLOEXEC) != 0) return QXError::system(errno, "a pipe for an extension could not be made");
+  UniqueDescriptor ourPipe(pipes[0]);
+  const UniqueDescriptor theirPipe(pipes[1]);
+  if (fcntl(ourPipe.get(), F_SETFL, O_NONBLOCK) != 0) return QXError::system(errno, "a pipe for an extension could not be made");
+
+  auto plan = planLaunch(bundle_, /*arguments=*/{}, LaunchKind::extension, std::move(theirSocket), services_->paths);
+  if (auto* error = std::get_if<QXError>(&plan)) return std::move(*error);
+  auto spawned = services_->spawner.spawn(std::move(std::get<LaunchPlan>(plan)), theirPipe);
+  if (auto* error = std::get_if<QXError>(&spawned)) return std::move(*error);
+
+  ExtensionProcess::Handlers handlers;
+  handlers.onLost = [weak = weak_from_this()](ProcessLifetime::Cause cause) {
+    if (const auto strongSelf = weak.lock()) strongSelf->processIsLost(cause);
+  };
+  handlers.onGone = [weak = weak_from_this()] {
+    if (const auto strongSelf = weak.lock()) strongSelf->processIsGone();
+  };
+  return ExtensionProcess::create({std::move(std::get<SpawnedProcess>(spawned)), std::move(ourSocket), std::move(ourPipe)},
+                                  bundle_.identifier, contextClass_.hostInterface, services_->times, services_->reactor, services_->log,
+                                  std::move(handlers));
+}
+
+void LinuxExtension::didStart(std::shared_ptr<ExtensionProcess> process) {
+  std::vector<Waiting> ready;
+  {
+    const std::lock_guard lock(mutex_);
+    lifetime_.started(Clock::now());
+    process_ = process;
+    ready.swap(waiting_);
+  }
+  process->resume();
+  for (const Waiting& waiting : ready) waiting.completion(waiting.request, /*error=*/std::nullopt);
+}
+
+void LinuxExtension::didNotStart(const QXError& why) {
+  std::vector<Waiting> failed;
+  {
+    const std::lock_guard lock(mutex_);
+    lifetime_.startFailed(Clock::now());
+    failed.swap(waiting_);
+  }
+  for (const Waiting& waiting : failed) waiting.completion(/*request=*/std::nullopt, why);
+}
+
+void LinuxExtension::processIsLost(ProcessLifetime::Cause cause) {
+  const std::lock_guard lock(mutex_);
+  lifetime_.lost(cause, Clock::now());
+}
+
+void LinuxExtension::processIsGone() {
+  ProcessLifetime::Next next{};
+  std::shared_ptr<ExtensionProcess> gone;
+  {
+    const std::lock_guard lock(mutex_);
+    next = lifetime_.gone();
+    gone.swap(process_);
+  }
+  if (next == ProcessLifetime::Next::start) startOnSpawner();
+}
+
+void LinuxExtension::endWhenIdleForLong() {
+  std::shared_ptr<ExtensionProcess> idle;
+  std::optional<ProcessLifetime::Time> later;
+  {
+    const std::lock_guard lock(mutex_);
+    const std::optional<ProcessLifetime::Time> deadline = lifetime_.idleDeadline();
+    if (deadline && *deadline <= Clock::now()) {
+      lifetime_.endedIdle();
+      idle = process_;
+    } else {
+      later = deadline;
+    }
+    idleTimerIsSet_ = later.has_value();
+  }
+  if (later) idleTimer_->setFor(*later);
+  if (idle) idle->end();
+}
+
+QXError LinuxExtension::backingOffError() const {
+  const auto now = Clock::now();
+  const auto left = lifetime_.refusedUntil(now).value_or(now) - now;
+  const auto milliseconds = std::chrono::duration_cast<std::chrono::milliseconds>(left).count();
+  return extensionHostError(ExtensionHostErrorCode::backingOff,
+                            "The process of " + bundle_.identifier + " ended too soon " + std::to_string(lifetime_.badLivesInARow()) +
+                                " times in a row; it can be started again in " + std::to_string(milliseconds) + " ms.");
+}
+
+}  // namespace docuvend::linux_platform

@@ -1,0 +1,137 @@
+// One thread looks at the installed bundles when the registry says that something changed, or when a match begins. It looks at all matches
+// then: each compares what is installed with the set that it reported last, takes over the objects of what is still the same, and reports
+// only if an object came or went. Changes that arrive meanwhile make it look again; two that arrive together make it look once.
+#include "platform/linux/extension_host/LinuxExtensionHost.h"
+
+#include <algorithm>
+#include <condition_variable>
+#include <mutex>
+#include <optional>
+#include <thread>
+#include <utility>
+#include <vector>
+
+#include "platform/linux/extension_host/LinuxExtension.h"
+#include "platform/linux/extension_host/Matching.h"
+
+namespace docuvend::linux_platform {
+namespace {
+
+using Extensions = std::vector<std::shared_ptr<LinuxExtension>>;
+
+struct MatchState {
+  QXExtensionHost::Attributes attributes;
+  QXExtensionContextClass contextClass;
+  QXExtensionHost::MatchHandler handler;
+  std::optional<Extensions> reported;  // only on the matching thread; absent before the first report
+};
+
+}  // namespace
+
+struct LinuxExtensionHost::State {
+  State(BundleRegistry& registry, const Paths& paths, Reactor& reactor, QXLogHandle& log, const ExtensionTimes& times)
+      : bundles(registry), services(std::make_shared<ExtensionServices>(paths, reactor, log, times)) {}
+
+  void look() {
+    {
+      const std::lock_guard lock(mutex);
+      mustLook = true;
+    }
+    changed.notify_one();
+  }
+
+  // The matching thread.
+  void run();
+  void update(MatchState& match);
+
+  BundleRegistry& bundles;
+  const std::shared_ptr<ExtensionServices> services;
+
+  std::mutex mutex;  // guards the three below
+  bool mustLook = false;
+  bool isStopped = false;
+  std::vector<std::weak_ptr<MatchState>> matches;
+  std::condition_variable changed;
+  std::thread thread;
+};
+
+class LinuxExtensionHost::Match : public QXExtensionMatch {
+ public:
+  explicit Match(std::shared_ptr<MatchState> state) : state_(std::move(state)) {}
+
+ private:
+  std::shared_ptr<MatchState> state_;
+};
+
+void LinuxExtensionHost::State::run() {
+  for (;;) {
+    std::vector<std::weak_ptr<MatchState>> present;
+    {
+      std::unique_lock lock(mutex);
+      changed.wait(lock, [this] { return isStopped || mustLook; });
+      if (isStopped) return;
+      mustLook = false;
+      std::erase_if(matches, [](const std::weak_ptr<MatchState>& match) { return match.expired(); });
+      present = matches;
+    }
+    for (const auto& weak : present) {
+      if (const auto match = weak.lock()) update(*match);
+    }
+  }
+}
+
+void LinuxExtensionHost::State::update(MatchState& match) {
+  Extensions leftovers = match.reported.value_or(Extensions{});
+  Extensions present;
+  bool isChanged = !match.reported;
+  for (Bundle& bundle : bundles.all()) {
+    if (!hasAttributes(bundle, match.attributes)) continue;
+    const auto same = std::find_if(leftovers.begin(), leftovers.end(), [&bundle](const std::shared_ptr<LinuxExtension>& extension) {
+      return isSameInstallation(extension->bundle(), bundle);
+    });
+    if (same == leftovers.end()) {
+      present.push_back(LinuxExtension::create(std::move(bundle), match.contextClass, services));
+      isChanged = true;
+    } else {
+      present.push_back(std::move(*same));
+      leftovers.erase(same);
+    }
+  }
+  for (const auto& extension : leftovers) extension->retire();
+  if (!isChanged && leftovers.empty()) return;
+  match.reported = present;
+  match.handler(std::vector<std::shared_ptr<QXExtension>>(present.begin(), present.end()), /*error=*/std::nullopt);
+}
+
+LinuxExtensionHost::LinuxExtensionHost(BundleRegistry& bundles, const Paths& paths, Reactor& reactor, QXLogHandle& log,
+                                       const ExtensionTimes& times)
+    : state_(std::make_shared<State>(bundles, paths, reactor, log, times)) {
+  // The host ends the thread before it lets go of the state.
+  state_->thread = std::thread([state = state_.get()] { state->run(); });
+  bundles.onChange([weak = std::weak_ptr(state_)] {
+    if (const auto strongState = weak.lock()) strongState->look();
+  });
+}
+
+LinuxExtensionHost::~LinuxExtensionHost() {
+  {
+    const std::lock_guard lock(state_->mutex);
+    state_->isStopped = true;
+  }
+  state_->changed.notify_one();
+  state_->thread.join();
+  state_->services->spawner.stop();
+}
+
+std::unique_ptr<QXExtensionMatch> LinuxExtensionHost::beginMatching(Attributes attributes, QXExtensionContextClass contextClass,
+                                                                    MatchHandler handler) {
+  auto match = std::make_shared<MatchState>(MatchState{std::move(attributes), contextClass, std::move(handler), std::nullopt});
+  {
+    const std::lock_guard lock(state_->mutex);
+    state_->matches.push_back(match);
+  }
+  state_->look();
+  return std::make_unique<Match>(std::move(match));
+}
+
+}  // namespace docuvend::linux_platform

@@ -1,0 +1,36 @@
+// Extensions from the installed bundles, each in a confined process of its own.
+//
+// A bundle is an extension of a match when its Info.plist's dictionary "QXExtension" has every attribute with that string. Match handlers
+// run on a thread that the host keeps for them, so a slow one delays nothing but the next call.
+#pragma once
+
+#include <memory>
+
+#include "platform/extension_host.h"
+#include "platform/linux/base/Paths.h"
+#include "platform/linux/bundles/Bundle.h"
+#include "platform/linux/extension_host/ExtensionTimes.h"
+#include "platform/linux/wire/Reactor.h"
+#include "platform/log.h"
+
+namespace docuvend::linux_platform {
+
+class LinuxExtensionHost : public QXExtensionHost {
+ public:
+  // The references outlive the host and every extension that it handed out.
+  LinuxExtensionHost(BundleRegistry& bundles, const Paths& paths, Reactor& reactor, QXLogHandle& log, const ExtensionTimes& times = {});
+  // Waits for a handler that runs, and ends all processes. Not from a handler.
+  ~LinuxExtensionHost() override;
+
+  // The interfaces of the context class outlive the host. Two matches of the same bundle have a process each.
+  [[nodiscard]] std::unique_ptr<QXExtensionMatch> beginMatching(Attributes attributes, QXExtensionContextClass contextClass,
+                                                                MatchHandler handler) override;
+
+ private:
+  struct State;
+  class Match;
+
+  std::shared_ptr<State> state_;
+};
+
+}  // namespace docuvend::linux_platform
