@@ -1,0 +1,88 @@
+#include "platform/linux/rpc/LinuxRpcConnection.h"
+
+#include <utility>
+
+namespace docuvend::linux_platform {
+namespace {
+
+Endpoint::Handlers handlersFor(QXLogHandle& log, int loggedProcess, LinuxRpcConnection::EndHandler onEnd) {
+  Endpoint::Handlers handlers;
+  handlers.onMisbehaviour = [&log, loggedProcess](const QXError& reason) {
+    const auto text = reason.texts.find("description");
+    log.write(QXLogType::defaultType, "[NOTICE] Closing the connection of PID " + std::to_string(loggedProcess) + ": " +
+                                          (text == reason.texts.end() ? reason.description() : text->second));
+  };
+  handlers.onClose = std::move(onEnd);
+  return handlers;
+}
+
+}  // namespace
+
+std::shared_ptr<LinuxRpcConnection> LinuxRpcConnection::create(Reactor& reactor, PeerDirectory& peers, QXLogHandle& log,
+                                                               std::shared_ptr<const PeerIdentity> peer, UniqueDescriptor socket,
+                                                               EndHandler onEnd) {
+  auto handlers = handlersFor(log, peer->pid, std::move(onEnd));
+  std::shared_ptr<LinuxRpcConnection> connection(new LinuxRpcConnection(std::move(peer)));
+  handlers.onHello = [&peers, weak = std::weak_ptr(connection)](const Hello& hello) -> std::optional<QXError> {
+    const auto strongSelf = weak.lock();
+    return strongSelf ? strongSelf->peerSaidHello(peers, hello) : std::nullopt;
+  };
+  connection->endpoint_ = Endpoint::create(reactor, std::move(socket), Hello{}, std::move(handlers));
+  return connection;
+}
+
+std::shared_ptr<LinuxRpcConnection> connectionOverSocket(Reactor& reactor, QXLogHandle& log, UniqueDescriptor socket, int loggedProcess,
+                                                         LinuxRpcConnection::EndHandler onEnd) {
+  std::shared_ptr<LinuxRpcConnection> connection(new LinuxRpcConnection(nullptr));
+  connection->endpoint_ = Endpoint::create(reactor, std::move(socket), Hello{}, handlersFor(log, loggedProcess, std::move(onEnd)));
+  return connection;
+}
+
+std::optional<QXError> LinuxRpcConnection::peerSaidHello(PeerDirectory& peers, const Hello& hello) {
+  if (!hello.declaredBundle) return std::nullopt;
+  auto declared = peers.declare(*peer(), *hello.declaredBundle);
+  if (!declared) {
+    return QXError::make(kQXRpcErrorDomain, static_cast<std::int64_t>(QXRpcErrorCode::refused),
+                         "this process cannot act for the bundle " + *hello.declaredBundle);
+  }
+  const std::lock_guard lock(mutex_);
+  peer_.swap(declared);
+  return std::nullopt;
+}
+
+std::shared_ptr<const PeerIdentity> LinuxRpcConnection::peer() const {
+  const std::lock_guard lock(mutex_);
+  return peer_;
+}
+
+void LinuxRpcConnection::setExportedInterface(QXRpcInterface interface) { endpoint_->setExportedInterface(std::move(interface)); }
+
+void LinuxRpcConnection::setExportedObject(std::shared_ptr<QXRpcExportedObject> object) { endpoint_->setExportedObject(std::move(object)); }
+
+void LinuxRpcConnection::resume() { endpoint_->resume(); }
+
+int LinuxRpcConnection::processIdentifier() const {
+  const auto known = peer();
+  return known ? known->pid : 0;
+}
+
+QXAuditToken LinuxRpcConnection::auditToken() const {
+  const auto known = peer();
+  return known ? known->token : QXAuditToken{};
+}
+
+std::optional<QXValue> LinuxRpcConnection::valueForEntitlement(const std::string& name) const {
+  const auto known = peer();
+  if (!known || known->standing == Standing::nobody) return std::nullopt;
+  const auto found = known->entitlements.find(name);
+  if (found == known->entitlements.end()) return std::nullopt;
+  return found->second;
+}
+
+std::shared_ptr<QXRpcProxy> LinuxRpcConnection::remoteObjectProxy(QXErrorHandler errorHandler) {
+  return endpoint_->remoteObjectProxy(std::move(errorHandler));
+}
+
+void LinuxRpcConnection::close(const QXError& reason) { endpoint_->close(reason); }
+
+}  // namespace docuvend::linux_platform

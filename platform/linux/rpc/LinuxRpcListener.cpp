@@ -1,0 +1,139 @@
+#include "platform/linux/rpc/LinuxRpcListener.h"
+
+#include <fcntl.h>
+#include <sys/epoll.h>
+#include <sys/socket.h>
+
+#include <cerrno>
+#include <utility>
+#include <vector>
+
+namespace docuvend::linux_platform {
+namespace {
+
+constexpr int kAcceptsAtATime = 16;
+
+UniqueDescriptor spareDescriptor() { return UniqueDescriptor(::open("/dev/null", O_RDONLY | O_CLOEXEC)); }
+
+QXError refusal(std::string description) {
+  return QXError::make(kQXRpcErrorDomain, static_cast<std::int64_t>(QXRpcErrorCode::refused), std::move(description));
+}
+
+// What a peer's connections are counted by.
+std::string countedAs(const PeerIdentity& peer) {
+  if (peer.standing == Standing::nobody) return "a process without an identity";
+  if (peer.standing == Standing::confined && peer.bundleIdentifier) return *peer.bundleIdentifier;
+  return "unconfined processes";
+}
+
+}  // namespace
+
+LinuxRpcListener::LinuxRpcListener(Surroundings surroundings, std::unique_ptr<BoundSocket> socket)
+    : surroundings_(std::move(surroundings)), ownSocket_(std::move(socket)), socket_(ownSocket_->descriptor()), spare_(spareDescriptor()) {}
+
+LinuxRpcListener::LinuxRpcListener(Surroundings surroundings, UniqueDescriptor passedSocket)
+    : surroundings_(std::move(surroundings)),
+      passedSocket_(std::move(passedSocket)),
+      socket_(passedSocket_.get()),
+      spare_(spareDescriptor()) {}
+
+LinuxRpcListener::~LinuxRpcListener() { registration_.reset(); }
+
+void LinuxRpcListener::setDelegate(std::weak_ptr<QXRpcListenerDelegate> delegate) {
+  const std::lock_guard lock(mutex_);
+  delegate_ = std::move(delegate);
+}
+
+void LinuxRpcListener::resume() {
+  const std::lock_guard lock(mutex_);
+  if (registration_) return;
+  registration_ = surroundings_.reactor.watch(socket_, EPOLLIN, [weak = weak_from_this()](std::uint32_t) -> std::uint32_t {
+    const auto strongSelf = weak.lock();
+    if (!strongSelf) return 0;
+    strongSelf->acceptWaiting();
+    return EPOLLIN;
+  });
+  if (!registration_) surroundings_.log.write(QXLogType::fault, "[ERROR] A listener's socket cannot be watched.");
+}
+
+void LinuxRpcListener::acceptWaiting() {
+  for (int i = 0; i < kAcceptsAtATime; ++i) {
+    if (!acceptOne()) return;
+  }
+}
+
+// False when nobody waits.
+bool LinuxRpcListener::acceptOne() {
+  UniqueDescriptor socket(::accept4(socket_, nullptr, nullptr, SOCK_CLOEXEC));
+  if (socket) {
+    admit(std::move(socket));
+    return true;
+  }
+  switch (errno) {
+    case EINTR:
+    case ECONNABORTED:
+      return true;
+    case EMFILE:
+    case ENFILE:
+    case ENOBUFS:
+    case ENOMEM:
+      acceptAndDrop(errno);
+      return false;
+    default:
+      return false;
+  }
+}
+
+// Without a descriptor for it the client would stay first in line for ever and keep a thread busy: it gets the spare one, and is dropped.
+void LinuxRpcListener::acceptAndDrop(int errnoValue) {
+  surroundings_.log.write(QXLogType::defaultType,
+                          "[NOTICE] Refusing a connection: " + QXError::system(errnoValue, "cannot accept it").texts.at("description"));
+  spare_.reset();
+  UniqueDescriptor(::accept4(socket_, nullptr, nullptr, SOCK_CLOEXEC)).reset();
+  spare_ = spareDescriptor();
+}
+
+void LinuxRpcListener::admit(UniqueDescriptor socket) {
+  auto peer = surroundings_.peers.identify(socket.get());
+  const std::string counted = countedAs(*peer);
+  const int process = peer->pid;
+  auto [verdict, place] = surroundings_.limiter->admit(counted);
+  if (verdict != ConnectionLimiter::Verdict::admitted) {
+    if (verdict == ConnectionLimiter::Verdict::refused) {
+      surroundings_.log.write(QXLogType::defaultType, "[NOTICE] Refusing a connection of PID " + std::to_string(process) + ": " + counted +
+                                                          " may not open more than " + std::to_string(kMaximumConnectionsPerPeer) + ".");
+    }
+    Endpoint::create(surroundings_.reactor, std::move(socket), Hello{}, {})->close(refusal("too many connections"));
+    return;
+  }
+  const std::uint64_t number = nextNumber_++;
+  auto connection = LinuxRpcConnection::create(surroundings_.reactor, surroundings_.peers, surroundings_.log, std::move(peer),
+                                               std::move(socket), [weak = weak_from_this(), number](const QXError&) {
+                                                 if (const auto strongSelf = weak.lock()) strongSelf->forget(number);
+                                               });
+  {
+    const std::lock_guard lock(mutex_);
+    accepted_.emplace(number, Accepted{connection, std::move(place)});
+  }
+  offer(connection);
+}
+
+void LinuxRpcListener::offer(const std::shared_ptr<LinuxRpcConnection>& connection) {
+  std::shared_ptr<QXRpcListenerDelegate> delegate;
+  {
+    const std::lock_guard lock(mutex_);
+    delegate = delegate_.lock();
+  }
+  if (!delegate || !delegate->listener(*this, connection)) connection->close(refusal("the service does not accept this connection"));
+}
+
+void LinuxRpcListener::forget(std::uint64_t number) {
+  Accepted ended;  // goes after the lock
+  const std::lock_guard lock(mutex_);
+  const auto found = accepted_.find(number);
+  if (found == accepted_.end()) return;
+  ended = std::move(found->second);
+  accepted_.erase(found);
+}
+
+}  // namespace docuvend::linux_platform

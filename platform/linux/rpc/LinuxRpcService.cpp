@@ -1,0 +1,50 @@
+#include "platform/linux/rpc/LinuxRpcService.h"
+
+#include <fcntl.h>
+
+#include <algorithm>
+#include <cerrno>
+#include <cstdlib>
+#include <utility>
+#include <variant>
+
+#include "platform/linux/rpc/BoundSocket.h"
+#include "platform/linux/rpc/LinuxRpcListener.h"
+
+namespace docuvend::linux_platform {
+
+LinuxRpcService::LinuxRpcService(Reactor& reactor, PeerDirectory& peers, QXLogHandle& log, std::map<std::string, std::string> socketPaths,
+                                 std::vector<ActivatedSocket> passedSockets)
+    : reactor_(reactor), peers_(peers), log_(log), socketPaths_(std::move(socketPaths)), passedSockets_(std::move(passedSockets)) {}
+
+UniqueDescriptor LinuxRpcService::takePassedSocket(const std::string& name) {
+  const std::lock_guard lock(mutex_);
+  const auto found = std::find_if(passedSockets_.begin(), passedSockets_.end(), [&name](const ActivatedSocket& socket) {
+    return socket.name == name || socket.path.substr(socket.path.rfind('/') + 1) == name;
+  });
+  if (found == passedSockets_.end()) return {};
+  UniqueDescriptor descriptor = std::move(found->descriptor);
+  passedSockets_.erase(found);
+  return descriptor;
+}
+
+void LinuxRpcService::giveUp(const std::string& name, const QXError& error) const {
+  log_.write(QXLogType::fault, "[ERROR] Cannot publish the service " + name + ": " + error.description());
+  std::_Exit(EXIT_FAILURE);  // other threads are at work: nothing is taken down under them
+}
+
+std::shared_ptr<QXRpcListener> LinuxRpcService::listenerForService(const std::string& name) {
+  LinuxRpcListener::Surroundings surroundings{reactor_, peers_, log_, limiter_};
+  if (auto passed = takePassedSocket(name)) {
+    const int flags = ::fcntl(passed.get(), F_GETFL);
+    if (flags < 0 || ::fcntl(passed.get(), F_SETFL, flags | O_NONBLOCK) != 0) giveUp(name, QXError::system(errno, "the passed socket"));
+    return std::make_shared<LinuxRpcListener>(std::move(surroundings), std::move(passed));
+  }
+  const auto path = socketPaths_.find(name);
+  if (path == socketPaths_.end()) giveUp(name, QXError::system(ENOENT, "no socket is known for it"));
+  auto bound = BoundSocket::create(path->second);
+  if (const auto* error = std::get_if<QXError>(&bound)) giveUp(name, *error);
+  return std::make_shared<LinuxRpcListener>(std::move(surroundings), std::get<std::unique_ptr<BoundSocket>>(std::move(bound)));
+}
+
+}  // namespace docuvend::linux_platform

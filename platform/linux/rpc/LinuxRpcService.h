@@ -1,0 +1,44 @@
+// Named services at Unix sockets.
+#pragma once
+
+#include <map>
+#include <memory>
+#include <mutex>
+#include <string>
+#include <vector>
+
+#include "platform/linux/identity/PeerIdentity.h"
+#include "platform/linux/rpc/ActivatedSockets.h"
+#include "platform/linux/rpc/ConnectionLimiter.h"
+#include "platform/linux/wire/Reactor.h"
+#include "platform/log.h"
+#include "platform/rpc.h"
+
+namespace docuvend::linux_platform {
+
+class LinuxRpcService final : public QXRpcService {
+ public:
+  // `socketPaths` gives each name its socket's absolute path, in a directory that is there. A passed socket serves the name that the
+  // service manager calls it by or that ends its path; nothing is bound then. The reactor, the directory and the log outlive the service
+  // and its listeners.
+  LinuxRpcService(Reactor& reactor, PeerDirectory& peers, QXLogHandle& log, std::map<std::string, std::string> socketPaths,
+                  std::vector<ActivatedSocket> passedSockets = {});
+
+  // The caller owns the listener. A name without a path or whose socket cannot be bound ends the process, with one log line.
+  [[nodiscard]] std::shared_ptr<QXRpcListener> listenerForService(const std::string& name) override;
+
+ private:
+  [[nodiscard]] UniqueDescriptor takePassedSocket(const std::string& name);
+  [[noreturn]] void giveUp(const std::string& name, const QXError& error) const;
+
+  Reactor& reactor_;
+  PeerDirectory& peers_;
+  QXLogHandle& log_;
+  const std::map<std::string, std::string> socketPaths_;
+  const std::shared_ptr<ConnectionLimiter> limiter_ = std::make_shared<ConnectionLimiter>();
+
+  std::mutex mutex_;
+  std::vector<ActivatedSocket> passedSockets_;  // not given to a listener yet
+};
+
+}  // namespace docuvend::linux_platform
