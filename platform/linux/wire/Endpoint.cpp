@@ -356,6 +356,7 @@ void Endpoint::State::close(const QXError& reason, Farewell farewell, Cause caus
     socket.swap(socket_);
     ::shutdown(socket->get(), SHUT_RDWR);
   }
+  registration.reset();  // while the socket is still held: its number must not be another's
   incoming.release();
   post_([failed = std::move(failed), blame = cause == Cause::misbehaviour ? handlers_.onMisbehaviour : nullptr, onClose = handlers_.onClose,
          reason] {
