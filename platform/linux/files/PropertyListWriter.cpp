@@ -1,5 +1,6 @@
 #include "platform/linux/files/PropertyListWriter.h"
 
+#include <algorithm>
 #include <cstdint>
 #include <string_view>
 
@@ -7,6 +8,14 @@
 
 namespace docuvend::linux_platform {
 namespace {
+
+// One of the characters that cannot stand for themselves.
+std::string_view escaped(char c) {
+  if (c == '&') return "&amp;";
+  if (c == '<') return "&lt;";
+  if (c == '>') return "&gt;";
+  return "&#13;";  // as itself it would read back as a line feed
+}
 
 // Every operation is false when the list cannot be written; the text is of no use then.
 class Writer {
@@ -71,18 +80,13 @@ class Writer {
   [[nodiscard]] bool leaf(std::string_view name, std::string_view content) {
     if (!isXMLText(content)) return false;
     std::string element = "<" + std::string(name) + ">";
-    for (const char c : content) {
-      if (c == '&') {
-        element += "&amp;";
-      } else if (c == '<') {
-        element += "&lt;";
-      } else if (c == '>') {
-        element += "&gt;";
-      } else if (c == '\r') {
-        element += "&#13;";  // as itself it would read back as a line feed
-      } else {
-        element += c;
-      }
+    while (!content.empty()) {
+      const std::size_t plain = std::min(content.find_first_of("&<>\r"), content.size());
+      element += content.substr(0, plain);
+      content.remove_prefix(plain);
+      if (content.empty()) break;
+      element += escaped(content.front());
+      content.remove_prefix(1);
     }
     return line(element + "</" + std::string(name) + ">");
   }

@@ -12,8 +12,8 @@
 
 namespace docuvend::linux_platform {
 
-inline constexpr std::size_t kPropertyListMaximumBytes = 32UL << 20U;    // of the whole text
-inline constexpr std::size_t kPropertyListMaximumElements = 1UL << 19U;  // tags, <plist> and keys among them
+inline constexpr std::size_t kPropertyListMaximumBytes = 16UL << 20U;    // of the whole text
+inline constexpr std::size_t kPropertyListMaximumElements = 1UL << 18U;  // tags, <plist> and keys among them
 inline constexpr std::size_t kPropertyListMaximumDepth = 64;             // elements inside each other
 
 // True for valid UTF-8 made of the characters that XML 1.0 can carry.
