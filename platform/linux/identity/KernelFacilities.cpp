@@ -1,7 +1,6 @@
 #include "platform/linux/identity/KernelFacilities.h"
 
 #include <sys/ioctl.h>
-#include <sys/pidfd.h>
 #include <sys/socket.h>
 #include <sys/vfs.h>
 #include <unistd.h>
@@ -10,6 +9,7 @@
 
 #include "platform/linux/base/UniqueDescriptor.h"
 #include "platform/linux/base/kernel.h"
+#include "platform/linux/identity/ProcessReading.h"
 #include "platform/linux/launch/policy/Landlock.h"
 
 namespace docuvend::linux_platform {
@@ -45,7 +45,7 @@ KernelFacilities KernelFacilities::probe() {
   KernelFacilities facilities;
   facilities.peerPidfd = probePeerPidfd();
   facilities.landlockLevel = docuvend::linux_platform::landlockLevel();
-  const UniqueDescriptor self(::pidfd_open(::getpid(), 0));
+  const UniqueDescriptor self = openProcess(::getpid());
   if (!self) return facilities;
   const UniqueDescriptor mountNamespace(::ioctl(self.get(), kernel::kPidfdGetMountNamespace, 0));
   facilities.pidfdNamespaces = static_cast<bool>(mountNamespace);

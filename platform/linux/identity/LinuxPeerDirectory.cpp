@@ -1,7 +1,6 @@
 #include "platform/linux/identity/LinuxPeerDirectory.h"
 
 #include <fcntl.h>
-#include <sys/pidfd.h>
 #include <sys/socket.h>
 #include <unistd.h>
 
@@ -31,7 +30,7 @@ std::array<std::uint8_t, 16> readBoot() {
 }
 
 UniqueDescriptor openPeer(int socket, pid_t pid, const KernelFacilities& facilities) {
-  if (!facilities.peerPidfd) return UniqueDescriptor(::pidfd_open(pid, 0));
+  if (!facilities.peerPidfd) return openProcess(pid);
   int number = -1;
   socklen_t size = sizeof(number);
   if (::getsockopt(socket, SOL_SOCKET, SO_PEERPIDFD, &number, &size) != 0) return {};

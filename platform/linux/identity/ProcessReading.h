@@ -15,6 +15,9 @@
 
 namespace docuvend::linux_platform {
 
+// Holds the process that has that number now; empty when there is none.
+[[nodiscard]] UniqueDescriptor openProcess(pid_t pid);
+
 // True while the process has not ended.
 [[nodiscard]] bool isAlive(const UniqueDescriptor& pidfd);
 

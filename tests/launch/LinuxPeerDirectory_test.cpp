@@ -1,0 +1,345 @@
+#include "platform/linux/identity/LinuxPeerDirectory.h"
+
+#include <fcntl.h>
+#include <gmock/gmock.h>
+#include <gtest/gtest.h>
+#include <signal.h>
+#include <sys/mount.h>
+#include <sys/socket.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include <array>
+#include <cerrno>
+#include <cstring>
+
+#include "platform/linux/launch/LaunchDescription.h"
+#include "tests/launch/PeerTest.h"
+
+namespace docuvend::linux_platform {
+namespace {
+
+using ::testing::Contains;
+using ::testing::ElementsAre;
+using ::testing::HasSubstr;
+using ::testing::IsEmpty;
+using ::testing::Not;
+using Identity = std::shared_ptr<const PeerIdentity>;
+
+class LinuxPeerDirectoryTest : public PeerTest {
+ protected:
+  [[nodiscard]] Identity identify(const Peer& peer) { return directory_.identify(peer.connection.get()); }
+  [[nodiscard]] std::string lastReason() const {
+    const auto texts = house_.log.texts(QXLogType::debug);
+    return texts.empty() ? "" : texts.back();
+  }
+  static void expectNobody(const Identity& identity) {
+    ASSERT_TRUE(identity);
+    EXPECT_EQ(identity->standing, Standing::nobody);
+    EXPECT_EQ(identity->token, QXAuditToken{});
+    EXPECT_FALSE(identity->bundleIdentifier);
+    EXPECT_TRUE(identity->entitlements.empty());
+  }
+  static std::string description(const std::string& identifier) {
+    return descriptionText({identifier, "0123456789abcdef0123456789abcdef", LaunchKind::application});
+  }
+
+  LinuxPeerDirectory directory_{bundles_, house_.log.defaultLog()};
+};
+
+TEST_F(LinuxPeerDirectoryTest, AConfinedProcessIsItsBundle) {
+  const auto peer = confined(install("org.a"));
+  const auto identity = identify(peer);
+  EXPECT_EQ(identity->standing, Standing::confined);
+  EXPECT_EQ(identity->bundleIdentifier, "org.a");
+  EXPECT_EQ(identity->instance.size(), 32U);
+  EXPECT_EQ(identity->uid, ::geteuid());
+  EXPECT_NE(qxFind<bool>(identity->entitlements, "right-of-org.a"), nullptr);
+  EXPECT_NE(identity->token, QXAuditToken{});
+  EXPECT_EQ(directory_.find(identity->token), identity);
+}
+
+TEST_F(LinuxPeerDirectoryTest, AnOrphanOfAConfinedProcessIsTheSameBundle) {
+  const auto peer = confined(install("org.a"), "stay-connected-as-orphan");
+  const auto identity = identify(peer);
+  EXPECT_EQ(identity->standing, Standing::confined);
+  EXPECT_EQ(identity->bundleIdentifier, "org.a");
+}
+
+TEST_F(LinuxPeerDirectoryTest, TwoLaunchesOfOneBundleAreTwoInstances) {
+  const auto bundle = install("org.a");
+  const auto one = confined(bundle);
+  const auto other = confined(bundle);
+  const auto oneIdentity = identify(one);
+  const auto otherIdentity = identify(other);
+  EXPECT_EQ(oneIdentity->bundleIdentifier, otherIdentity->bundleIdentifier);
+  EXPECT_NE(oneIdentity->instance, otherIdentity->instance);
+  EXPECT_NE(oneIdentity->token, otherIdentity->token);
+}
+
+TEST_F(LinuxPeerDirectoryTest, EntitlementsAreThoseThatTheBundleHadWhenThePeerConnected) {
+  const auto peer = confined(install("org.a"));
+  const auto identity = identify(peer);
+  bundles_.bundles.at("org.a").entitlements.clear();
+  EXPECT_EQ(directory_.find(identity->token)->entitlements.size(), 1U);
+  EXPECT_TRUE(identify(peer)->entitlements.empty());
+}
+
+TEST_F(LinuxPeerDirectoryTest, AnOrdinaryProcessIsUnconfinedAndBelongsToNoBundle) {
+  const auto peer = unconfined();
+  const auto identity = identify(peer);
+  EXPECT_EQ(identity->standing, Standing::unconfined);
+  EXPECT_EQ(identity->pid, peer.process.pid());
+  EXPECT_FALSE(identity->bundleIdentifier);
+  EXPECT_TRUE(identity->entitlements.empty());
+  EXPECT_TRUE(identity->instance.empty());
+  EXPECT_NE(identity->token, QXAuditToken{});
+}
+
+TEST_F(LinuxPeerDirectoryTest, TheTokenIsProcessUserSerialAndBoot) {
+  const auto peer = unconfined();
+  const auto identity = identify(peer);
+  struct stat status {};
+  ASSERT_EQ(::fstat(identity->pidfd.get(), &status), 0);
+  pid_t pid = 0;
+  uid_t uid = 0;
+  std::uint64_t serial = 0;
+  std::memcpy(&pid, identity->token.bytes.data(), 4);
+  std::memcpy(&uid, identity->token.bytes.data() + 4, 4);
+  std::memcpy(&serial, identity->token.bytes.data() + 8, 8);
+  EXPECT_EQ(pid, identity->pid);
+  EXPECT_EQ(uid, identity->uid);
+  EXPECT_EQ(serial, status.st_ino);
+  EXPECT_NE((std::string{identity->token.bytes.begin() + 16, identity->token.bytes.end()}), std::string(16, '\0'));
+}
+
+TEST_F(LinuxPeerDirectoryTest, OneProcessHasOneTokenOnAllItsConnections) {
+  const auto peer = unconfined();
+  EXPECT_EQ(identify(peer)->token, identify(peer)->token);
+  const auto other = unconfined();
+  EXPECT_NE(identify(other)->token, identify(peer)->token);
+}
+
+TEST_F(LinuxPeerDirectoryTest, ADeadPeerIsNobody) {
+  auto peer = unconfined();
+  ASSERT_EQ(::kill(peer.process.pid(), SIGKILL), 0);
+  EXPECT_EQ(peer.process.status(), 128 + SIGKILL);
+  expectNobody(identify(peer));
+}
+
+TEST_F(LinuxPeerDirectoryTest, AConfinedProcessWhoseBundleIsGoneIsNobody) {
+  const auto peer = confined(install("org.a"));
+  bundles_.bundles.clear();
+  expectNobody(identify(peer));
+  EXPECT_THAT(lastReason(), HasSubstr("is nobody: its bundle org.a is not installed."));
+}
+
+TEST_F(LinuxPeerDirectoryTest, NamespacesWithoutADescriptionAreNobodys) {
+  const auto peer = unconfined(enterNamespaces);
+  expectNobody(identify(peer));
+  EXPECT_THAT(lastReason(), HasSubstr("cannot open its description"));
+}
+
+TEST_F(LinuxPeerDirectoryTest, NamespacesThatWereMadeInsideNamespacesAreNobodys) {
+  const auto peer = unconfined([] {
+    const int error = enterNamespaces();
+    return error != 0 ? error : enterNamespaces();
+  });
+  expectNobody(identify(peer));
+  EXPECT_THAT(lastReason(), HasSubstr("its mount namespace was made inside a confinement"));
+}
+
+// As somebody would who can make namespaces where a confined process cannot.
+TEST_F(LinuxPeerDirectoryTest, ADescriptionThatWasMountedInsideAConfinementIsNotBelieved) {
+  (void)install("org.a");
+  const std::string place = house_.root() + "/forged";
+  BundleHouse::write(place + "/.docuvend-info", description("org.a"));
+  const auto peer = unconfined([&place] {
+    if (const int error = enterNamespaces()) return error;
+    if (const int error = enterNamespaces()) return error;
+    if (::mount(place.c_str(), place.c_str(), nullptr, MS_BIND | MS_REC, nullptr) != 0) return errno;
+    return ::chroot(place.c_str()) == 0 ? 0 : errno;
+  });
+  expectNobody(identify(peer));
+  EXPECT_THAT(lastReason(), HasSubstr("its mount namespace was made inside a confinement"));
+}
+
+TEST_F(LinuxPeerDirectoryTest, ARootThatIsAPlainDirectoryIsNotBelieved) {
+  (void)install("org.a");
+  const std::string place = house_.root() + "/forged";
+  BundleHouse::write(place + "/.docuvend-info", description("org.a"));
+  const auto peer = unconfined([&place] {
+    if (const int error = enterNamespaces()) return error;
+    return ::chroot(place.c_str()) == 0 ? 0 : errno;
+  });
+  expectNobody(identify(peer));
+  EXPECT_THAT(lastReason(), HasSubstr("its root is not that of a mount"));
+}
+
+TEST_F(LinuxPeerDirectoryTest, AMalformedDescriptionIsNobodys) {
+  (void)install("org.a");
+  const std::string file = house_.root() + "/description";
+  struct Case {
+    std::string text;
+    std::string reason;
+  };
+  for (const auto& [text, reason] : std::vector<Case>{{description("org.a") + "name=org.b\n", "malformed"},
+                                                      {description("../org.a"), "malformed"},
+                                                      {"", "malformed"},
+                                                      {std::string(kLongestDescription + 1, 'x'), "too long"},
+                                                      {description("org.missing"), "org.missing is not installed"}}) {
+    BundleHouse::write(file, text);
+    const auto peer = handMade({"--ro-bind", file, "/.docuvend-info"});
+    expectNobody(identify(peer));
+    EXPECT_THAT(lastReason(), HasSubstr(reason));
+  }
+}
+
+// What makes the tests above mean something: the same by hand, but well-formed.
+TEST_F(LinuxPeerDirectoryTest, TheLauncherIsWhoeverMakesTheConfinementOutside) {
+  (void)install("org.a");
+  const std::string file = house_.root() + "/description";
+  BundleHouse::write(file, description("org.a"));
+  const auto peer = handMade({"--ro-bind", file, "/.docuvend-info"});
+  EXPECT_EQ(identify(peer)->bundleIdentifier, "org.a");
+}
+
+TEST_F(LinuxPeerDirectoryTest, ADescriptionThatIsALinkOrAPipeOrADirectoryIsNobodys) {
+  (void)install("org.a");
+  const std::string file = house_.root() + "/description";
+  BundleHouse::write(file, description("org.a"));
+  {
+    const auto peer = handMade({"--symlink", file, "/.docuvend-info"});
+    expectNobody(identify(peer));
+    EXPECT_THAT(lastReason(), HasSubstr("cannot open its description"));
+  }
+  const std::string pipe = house_.root() + "/pipe";
+  ASSERT_EQ(::mkfifo(pipe.c_str(), 0600), 0);
+  {
+    const auto peer = handMade({"--ro-bind", pipe, "/.docuvend-info"});
+    expectNobody(identify(peer));
+    EXPECT_THAT(lastReason(), HasSubstr("its description is not a regular file"));
+  }
+  const auto peer = handMade({"--dir", "/.docuvend-info"});
+  expectNobody(identify(peer));
+  EXPECT_THAT(lastReason(), HasSubstr("its description is not a regular file"));
+}
+
+TEST_F(LinuxPeerDirectoryTest, WhatIsNoSocketIsNobody) {
+  const UniqueDescriptor file(::open("/dev/null", O_RDONLY | O_CLOEXEC));
+  expectNobody(directory_.identify(file.get()));
+}
+
+TEST_F(LinuxPeerDirectoryTest, AnUnconfinedProcessMayDeclareAnInstalledBundle) {
+  (void)install("org.a");
+  const auto peer = unconfined();
+  const auto plain = identify(peer);
+  house_.log.clear();
+  const auto declared = directory_.declare(*plain, "org.a");
+  ASSERT_TRUE(declared);
+  EXPECT_EQ(declared->standing, Standing::unconfined);
+  EXPECT_EQ(declared->bundleIdentifier, "org.a");
+  EXPECT_EQ(declared->token, plain->token);
+  EXPECT_EQ(declared->pid, plain->pid);
+  EXPECT_NE(qxFind<bool>(declared->entitlements, "right-of-org.a"), nullptr);
+  EXPECT_EQ(directory_.find(plain->token), declared);
+  EXPECT_THAT(house_.log.entries(),
+              ElementsAre(fake_platform::FakeLogEntry{
+                  QXLogType::defaultType, "[NOTICE] PID " + std::to_string(peer.process.pid()) + " declares itself to be org.a."}));
+}
+
+TEST_F(LinuxPeerDirectoryTest, ABundleThatIsNotInstalledCannotBeDeclared) {
+  const auto peer = unconfined();
+  EXPECT_FALSE(directory_.declare(*identify(peer), "org.a"));
+  EXPECT_THAT(house_.log.texts(QXLogType::defaultType), IsEmpty());
+}
+
+TEST_F(LinuxPeerDirectoryTest, AConfinedProcessCannotDeclareAnything) {
+  (void)install("org.b");
+  const auto peer = confined(install("org.a"));
+  const auto identity = identify(peer);
+  EXPECT_FALSE(directory_.declare(*identity, "org.b"));
+  EXPECT_FALSE(directory_.declare(*identity, "org.a"));
+  EXPECT_EQ(directory_.find(identity->token)->bundleIdentifier, "org.a");
+}
+
+TEST_F(LinuxPeerDirectoryTest, NobodyCannotDeclareAnything) {
+  (void)install("org.a");
+  const auto peer = unconfined(enterNamespaces);
+  EXPECT_FALSE(directory_.declare(*identify(peer), "org.a"));
+}
+
+TEST_F(LinuxPeerDirectoryTest, AProcessDeclaresOneBundleAtATime) {
+  (void)install("org.a");
+  (void)install("org.b");
+  const auto peer = unconfined();
+  const auto plain = identify(peer);
+  auto first = directory_.declare(*plain, "org.a");
+  ASSERT_TRUE(first);
+  EXPECT_FALSE(directory_.declare(*plain, "org.b"));
+  EXPECT_FALSE(directory_.declare(*first, "org.b"));
+  EXPECT_TRUE(directory_.declare(*identify(peer), "org.a"));
+  first.reset();
+  EXPECT_TRUE(directory_.declare(*plain, "org.b"));
+}
+
+TEST_F(LinuxPeerDirectoryTest, WhoseConnectionHasEndedIsNotFound) {
+  const auto peer = unconfined();
+  auto identity = identify(peer);
+  const auto token = identity->token;
+  identity.reset();
+  EXPECT_FALSE(directory_.find(token));
+  EXPECT_FALSE(directory_.find(QXAuditToken{}));
+}
+
+TEST_F(LinuxPeerDirectoryTest, NobodyIsNotFoundByTheZeroToken) {
+  const auto peer = unconfined(enterNamespaces);
+  const auto nobody = identify(peer);
+  EXPECT_FALSE(directory_.find(QXAuditToken{}));
+}
+
+// The same on kernels that lack one thing or another.
+class OlderKernel : public PeerTest, public ::testing::WithParamInterface<KernelFacilities> {};
+
+TEST_P(OlderKernel, StillTellsTheConfinedFromTheUnconfinedFromNobody) {
+  LinuxPeerDirectory directory(bundles_, house_.log.defaultLog(), GetParam());
+  const auto inside = confined(install("org.a"));
+  const auto outside = unconfined();
+  const auto between = unconfined(enterNamespaces);
+  auto gone = unconfined();
+  ASSERT_EQ(::kill(gone.process.pid(), SIGKILL), 0);
+  EXPECT_EQ(gone.process.status(), 128 + SIGKILL);
+
+  const auto insideIdentity = directory.identify(inside.connection.get());
+  const auto outsideIdentity = directory.identify(outside.connection.get());
+  EXPECT_EQ(insideIdentity->bundleIdentifier, "org.a");
+  EXPECT_EQ(insideIdentity->standing, Standing::confined);
+  EXPECT_EQ(outsideIdentity->standing, Standing::unconfined);
+  EXPECT_NE(insideIdentity->token, outsideIdentity->token);
+  EXPECT_EQ(directory.identify(outside.connection.get())->token, outsideIdentity->token);
+  EXPECT_EQ(directory.identify(between.connection.get())->standing, Standing::nobody);
+  EXPECT_EQ(directory.identify(gone.connection.get())->standing, Standing::nobody);
+}
+
+std::vector<KernelFacilities> olderKernels() {
+  std::vector<KernelFacilities> kernels;
+  const auto present = KernelFacilities::probe();
+  for (int missing = 1; missing < 8; ++missing) {
+    KernelFacilities kernel = present;
+    if ((missing & 1) != 0) kernel.peerPidfd = false;
+    if ((missing & 2) != 0) kernel.pidfdNamespaces = false;
+    if ((missing & 4) != 0) kernel.uniquePidfdInodes = false;
+    kernels.push_back(kernel);
+  }
+  return kernels;
+}
+
+std::string kernelName(const ::testing::TestParamInfo<KernelFacilities>& info) {
+  return std::string("Without") + (info.param.peerPidfd ? "" : "PeerPidfds") + (info.param.pidfdNamespaces ? "" : "PidfdNamespaces") +
+         (info.param.uniquePidfdInodes ? "" : "UniqueInodes");
+}
+
+INSTANTIATE_TEST_SUITE_P(Kernels, OlderKernel, ::testing::ValuesIn(olderKernels()), kernelName);
+
+}  // namespace
+}  // namespace docuvend::linux_platform

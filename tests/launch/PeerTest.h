@@ -1,0 +1,57 @@
+// Peers that connect to a public socket, each a process of its own.
+#pragma once
+
+#include <functional>
+#include <optional>
+#include <string>
+#include <vector>
+
+#include "platform/linux/bundles/Bundle.h"
+#include "platform/linux/identity/LinuxPeerDirectory.h"
+#include "tests/launch/ConfinedHouse.h"
+
+namespace docuvend::linux_platform {
+
+// The bundles that a test lists.
+class ListedBundles final : public BundleRegistry {
+ public:
+  std::optional<Bundle> find(const std::string& identifier) override {
+    const auto found = bundles.find(identifier);
+    if (found == bundles.end()) return std::nullopt;
+    return found->second;
+  }
+  std::vector<Bundle> all() override { return {}; }
+  void onChange(std::function<void()> callback) override { static_cast<void>(callback); }
+
+  BundleMap bundles;
+};
+
+// A process and its connection. The connection closes first: a probe that stays connected then ends.
+struct Peer {
+  RunningProcess process;
+  UniqueDescriptor connection;
+};
+
+class PeerTest : public ConfinedTest {
+ protected:
+  void SetUp() override;
+
+  // Installs the probe with one entitlement and lists it.
+  Bundle install(const std::string& identifier);
+  [[nodiscard]] Peer confined(const Bundle& bundle, const std::string& attempt = "stay-connected");
+  // A child of this process, not confined. It does `work` when it is connected, and is taken for connected when that is done; then it
+  // stays until its connection closes. Its status is what `work` gave.
+  [[nodiscard]] Peer unconfined(std::function<int()> work = [] { return 0; });
+  // Whom an outsider has bubblewrap confine with arguments of its own; they follow namespaces and a read-only view of everything.
+  [[nodiscard]] Peer handMade(const std::vector<std::string>& arguments);
+  [[nodiscard]] UniqueDescriptor accept();
+
+  std::string socketPath_;
+  UniqueDescriptor listener_;
+  ListedBundles bundles_;
+};
+
+// Goes into new user and mount namespaces below those of the calling process; 0, or an errno.
+[[nodiscard]] int enterNamespaces();
+
+}  // namespace docuvend::linux_platform
