@@ -56,15 +56,14 @@ class RegistrationTurn {
   void registered(const std::optional<QXError>& error) {
     if (error) dvLog("[ERROR] Could not register docuvend %@. Error: %@", provider_->identifier(), error);
     if (hasGoneOn_.test_and_set()) return;
-    DVExtensionDocuvend::refreshOperationsQueueRegisterProviders(std::move(rest_), std::move(completion_));
+    DVExtensionDocuvend::refreshOperationsQueueRegisterProviders(rest_, completion_);
   }
 
  private:
   const std::shared_ptr<DVExtensionDocuvend> provider_;
+  const DVExtensionDocuvend::Providers rest_;
+  const DVExtensionDocuvend::Completion completion_;
   std::atomic_flag hasGoneOn_;
-  // Until the chain has gone on
-  DVExtensionDocuvend::Providers rest_;
-  DVExtensionDocuvend::Completion completion_;
 };
 
 }  // namespace

@@ -55,7 +55,8 @@ const std::vector<Row> kRows = {
 
 TEST_P(DVRefreshPlanTest, FollowsFromWhatIsRegisteredAndWhatIsInstalled) {
   std::map<ProviderID, std::shared_ptr<QXExtension>> registered;
-  for (const auto& [identifier, version] : GetParam().registered) registered.emplace(identifier, extension(identifier, version));
+  for (const auto& [identifier, version] : GetParam().registered)
+    registered.emplace(ProviderID{identifier}, extension(identifier, version));
   std::vector<std::shared_ptr<QXExtension>> installed;
   for (const auto& [identifier, version] : GetParam().installed) installed.push_back(extension(identifier, version));
   const DVRefreshPlan plan = dvPlanRefresh(std::move(registered), installed);
