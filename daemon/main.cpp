@@ -1,0 +1,29 @@
+// docuvendd: takes no options and reads no configuration.
+#include <cstdlib>
+#include <iostream>
+#include <memory>
+#include <variant>
+
+#include "acl/DVAccessControlStore.h"
+#include "common/DVLog.h"
+#include "daemon/DVServer.h"
+#include "platform/QXPlatform.h"
+#include "platform/linux/LinuxPlatform.h"
+
+int main(int, char** arguments) {
+  using namespace docuvend;
+  auto created = linux_platform::LinuxPlatform::create();
+  if (const auto* error = std::get_if<QXError>(&created)) {
+    std::cerr << "docuvendd: " << error->description() << "\n";
+    return EXIT_FAILURE;
+  }
+  QXPlatform::install(std::get<std::unique_ptr<linux_platform::LinuxPlatform>>(created)->seam());
+
+  dvLog("[NOTICE] %s starting.", arguments[0]);
+  dvLog("[DEBUG] Debug logging enabled.");
+  const auto server = std::make_shared<DVServer>();
+  server->setAccessControlStore(DVAccessControlStore::sharedStore());
+  server->startCompletion(/*completion=*/{});
+  QXPlatform::current().queues.mainRunLoop().run();
+  return EXIT_SUCCESS;
+}

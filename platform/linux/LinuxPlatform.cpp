@@ -1,0 +1,154 @@
+#include "platform/linux/LinuxPlatform.h"
+
+#include <fcntl.h>
+#include <sys/file.h>
+#include <sys/prctl.h>
+#include <unistd.h>
+
+#include <algorithm>
+#include <cerrno>
+#include <map>
+#include <string>
+#include <thread>
+#include <utility>
+
+#include "platform/linux/base/Paths.h"
+#include "platform/linux/bundles/InstalledBundles.h"
+#include "platform/linux/coordination/FileCoordinationListenerDelegate.h"
+#include "platform/linux/coordination/LinuxFileCoordinator.h"
+#include "platform/linux/extension_host/LinuxExtensionHost.h"
+#include "platform/linux/files/LinuxDeviceLock.h"
+#include "platform/linux/files/LinuxFileSystem.h"
+#include "platform/linux/files/LinuxNotificationCenter.h"
+#include "platform/linux/files/LinuxPropertyLists.h"
+#include "platform/linux/identity/KernelFacilities.h"
+#include "platform/linux/identity/LinuxApplicationRegistry.h"
+#include "platform/linux/identity/LinuxPeerDirectory.h"
+#include "platform/linux/log/LinuxLog.h"
+#include "platform/linux/queue/LinuxQueues.h"
+#include "platform/linux/rpc/LinuxRpcService.h"
+#include "platform/linux/sandbox/LinuxSandbox.h"
+#include "platform/linux/sandbox/SandboxListenerDelegate.h"
+#include "platform/linux/wire/FileCoordinationProtocol.h"
+#include "platform/linux/wire/Reactor.h"
+#include "platform/linux/wire/SandboxProtocol.h"
+
+namespace docuvend::linux_platform {
+namespace {
+
+constexpr const char* kProgramName = "docuvendd";
+constexpr const char* kClientServiceName = "com.orvane.Docuvend";
+// A thread that serves a request may wait for a disk; one more at least is left for the others.
+constexpr unsigned kFewestReactorThreads = 4;
+
+std::map<std::string, std::string> publicSocketPaths(const Paths& paths) {
+  std::map<std::string, std::string> sockets;
+  for (const char* name : {kClientServiceName, kSandboxServiceName, kFileCoordinationServiceName}) {
+    sockets.emplace(name, paths.publicSockets + "/" + name);
+  }
+  return sockets;
+}
+
+// Held for the life of the process: the sockets, the list and the token key have one owner.
+std::variant<UniqueDescriptor, QXError> takePlatformLock(const Paths& paths) {
+  const std::string path = paths.runtime + "/lock";
+  UniqueDescriptor file(::open(path.c_str(), O_RDWR | O_CREAT | O_NOFOLLOW | O_CLOEXEC, 0600));
+  if (!file) return QXError::system(errno, "cannot open " + path);
+  if (::flock(file.get(), LOCK_EX | LOCK_NB) != 0) {
+    return QXError::system(errno, errno == EWOULDBLOCK ? "another docuvendd of this user is running" : "cannot lock " + path);
+  }
+  return file;
+}
+
+}  // namespace
+
+struct LinuxPlatform::Services {
+  Services(Paths found, UniqueDescriptor lock)
+      : paths(std::move(found)), platformLock(std::move(lock)), rpc(reactor, peers, log.defaultLog(), publicSocketPaths(paths)) {}
+
+  // In the order in which they lean on each other.
+  const Paths paths;
+  const UniqueDescriptor platformLock;
+  LinuxLog log{LinuxLogOptions::fromEnvironment(kProgramName)};
+  LinuxQueues& queues = LinuxQueues::processWide();
+  LinuxFileSystem fileSystem{paths};
+  LinuxPropertyLists propertyLists;
+  LinuxDeviceLock deviceLock{paths};
+  LinuxNotificationCenter notificationCenter{queues.mainRunLoop()};
+  Reactor reactor{std::max(kFewestReactorThreads, std::thread::hardware_concurrency())};
+  InstalledBundles bundles{paths, propertyLists, log.defaultLog()};
+  LinuxPeerDirectory peers{bundles, log.defaultLog()};
+  LinuxApplicationRegistry applicationRegistry{bundles, peers};
+  LinuxRpcService rpc;
+  LinuxExtensionHost extensionHost{bundles, paths, reactor, log.defaultLog()};
+  LinuxFileCoordinator fileCoordinator{fileSystem};
+
+  // Made in `publish`.
+  std::unique_ptr<LinuxSandbox> sandbox;
+  std::shared_ptr<SandboxListenerDelegate> sandboxDelegate;
+  std::shared_ptr<FileCoordinationListenerDelegate> coordinationDelegate;
+  std::shared_ptr<QXRpcListener> sandboxListener;
+  std::shared_ptr<QXRpcListener> coordinationListener;
+
+  [[nodiscard]] std::optional<QXError> publish() {
+    auto made = LinuxSandbox::create(paths, bundles, peers);
+    if (auto* error = std::get_if<QXError>(&made)) return *error;
+    sandbox = std::get<std::unique_ptr<LinuxSandbox>>(std::move(made));
+    sandboxDelegate = std::make_shared<SandboxListenerDelegate>(*sandbox, log.defaultLog());
+    coordinationDelegate = std::make_shared<FileCoordinationListenerDelegate>(fileCoordinator, *sandbox);
+    sandboxListener = listen(kSandboxServiceName, sandboxDelegate);
+    coordinationListener = listen(kFileCoordinationServiceName, coordinationDelegate);
+    return std::nullopt;
+  }
+
+  void logProtections() {
+    const ProtectionLevels levels = protectionLevels(KernelFacilities::probe());
+    for (const std::string* sentence : {&levels.peers, &levels.namespaces, &levels.tokens, &levels.confinement}) {
+      log.defaultLog().write(QXLogType::defaultType, "[NOTICE] " + *sentence);
+    }
+  }
+
+ private:
+  std::shared_ptr<QXRpcListener> listen(const char* name, const std::shared_ptr<QXRpcListenerDelegate>& delegate) {
+    auto listener = rpc.listenerForService(name);
+    listener->setDelegate(delegate);
+    listener->resume();
+    return listener;
+  }
+};
+
+std::variant<std::unique_ptr<LinuxPlatform>, QXError> LinuxPlatform::create() {
+  if (::geteuid() == 0) return QXError::system(EPERM, "a sandbox made by root keeps too much; run as an ordinary user");
+  if (::prctl(PR_SET_NO_NEW_PRIVS, 1, 0, 0, 0) != 0) return QXError::system(errno, "cannot give up new privileges");
+  auto found = Paths::fromEnvironment();
+  if (auto* error = std::get_if<QXError>(&found)) return *error;
+  auto& paths = std::get<Paths>(found);
+  if (auto error = prepareRuntimeDirectories(paths)) return *error;
+  auto lock = takePlatformLock(paths);
+  if (auto* error = std::get_if<QXError>(&lock)) return *error;
+
+  auto services = std::make_unique<Services>(std::move(paths), std::get<UniqueDescriptor>(std::move(lock)));
+  services->logProtections();
+  if (auto error = services->publish()) return *error;
+  return std::unique_ptr<LinuxPlatform>(new LinuxPlatform(std::move(services)));
+}
+
+LinuxPlatform::LinuxPlatform(std::unique_ptr<Services> services) : services_(std::move(services)) {}
+LinuxPlatform::~LinuxPlatform() = default;
+
+QXPlatform LinuxPlatform::seam() {
+  Services& all = *services_;
+  return {all.queues,
+          all.log,
+          all.rpc,
+          all.applicationRegistry,
+          *all.sandbox,
+          all.extensionHost,
+          all.fileCoordinator,
+          all.deviceLock,
+          all.notificationCenter,
+          all.fileSystem,
+          all.propertyLists};
+}
+
+}  // namespace docuvend::linux_platform
