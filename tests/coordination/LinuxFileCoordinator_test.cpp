@@ -43,7 +43,7 @@ TEST_F(LinuxFileCoordinatorTest, TakesTheDirectoryItselfForItsObjects) {
 }
 
 TEST_F(LinuxFileCoordinatorTest, PassesOverObjectsWithoutADirectoryAndDirectoriesThatAreNotThere) {
-  coordinator._addDocuvend(std::make_shared<RecordingProvider>(std::nullopt));
+  coordinator._addDocuvend(std::make_shared<RecordingProvider>());
   coordinator._addDocuvend(std::make_shared<RecordingProvider>(directoryURL("/missing")));
   coordinator._addDocuvend(nullptr);
   const auto provider = added("/a/storage");

@@ -28,7 +28,7 @@ struct QXFileCoordinatorTest : ::testing::Test {
   QXFileCoordinator& service() { return platform.service; }
 
   Platform platform;
-  std::shared_ptr<RecordingProvider> provider = std::make_shared<RecordingProvider>(std::nullopt);
+  std::shared_ptr<RecordingProvider> provider = std::make_shared<RecordingProvider>();
   // The fake remembers its calls, and with them the objects: what it still has registered counts.
   bool isKept() {
     if constexpr (std::is_same_v<Platform, Fake>) {
@@ -56,7 +56,7 @@ TYPED_TEST(QXFileCoordinatorTest, KeepsAnObjectUntilItWasRemovedAsOftenAsAdded) 
 TYPED_TEST(QXFileCoordinatorTest, IsNotDisturbedByTheRemovalOfAnObjectThatIsNotThere) {
   this->service()._removeDocuvend(this->provider);
   this->service()._addDocuvend(this->provider);
-  this->service()._removeDocuvend(std::make_shared<RecordingProvider>(std::nullopt));
+  this->service()._removeDocuvend(std::make_shared<RecordingProvider>());
   EXPECT_TRUE(this->isKept());
   this->service()._removeDocuvend(this->provider);
   this->service()._removeDocuvend(this->provider);

@@ -1,6 +1,7 @@
 // A provider object that remembers what it was told.
 #pragma once
 
+#include <functional>
 #include <memory>
 #include <optional>
 #include <string>
@@ -13,7 +14,8 @@ namespace docuvend::linux_platform::testing {
 
 class RecordingProvider final : public QXDocuvend {
  public:
-  explicit RecordingProvider(std::optional<QXURL> directory, std::shared_ptr<QXOperationQueue> queue = {})
+  RecordingProvider() = default;
+  explicit RecordingProvider(QXURL directory, std::shared_ptr<QXOperationQueue> queue = {})
       : directory_(std::move(directory)), queue_(std::move(queue)) {}
 
   std::optional<QXURL> _providedItemsURL() const override { return directory_; }

@@ -52,18 +52,20 @@ std::variant<RedeemedFile, QXError> openPlaced(const PlacedFile& placed, int acc
   return RedeemedFile{std::move(file), placed.identity};
 }
 
-// Makes the missing sibling. None: something has its name by now.
-std::variant<std::optional<RedeemedFile>, QXError> createSibling(const PlacedItem& sibling) {
+struct NameTaken {};
+
+// Makes the missing sibling, unless something has its name by now.
+std::variant<RedeemedFile, NameTaken, QXError> createSibling(const PlacedItem& sibling) {
   UniqueDescriptor file(
       ::openat(sibling.directory.get(), sibling.name.c_str(), O_RDWR | O_CREAT | O_EXCL | O_NOFOLLOW | O_NOCTTY | O_CLOEXEC, kSiblingMode));
   if (!file) {
-    if (errno == EEXIST) return std::optional<RedeemedFile>();
+    if (errno == EEXIST) return NameTaken{};
     return sandboxErrorFor(SystemFailure{errno}, "the hidden sibling cannot be created");
   }
   const auto examined = statusOf(file.get());
   if (const auto* failure = std::get_if<SystemFailure>(&examined))
     return sandboxErrorFor(*failure, "the hidden sibling cannot be examined");
-  return std::optional<RedeemedFile>(RedeemedFile{std::move(file), std::get<ObjectStatus>(examined).identity});
+  return RedeemedFile{std::move(file), std::get<ObjectStatus>(examined).identity};
 }
 
 bool itemOfSiblingExists(const PlacedItem& sibling) {
@@ -106,8 +108,7 @@ std::variant<RedeemedFile, QXError> TokenRedeemer::redeem(std::string_view token
     if (use != TokenUse::writing || !itemOfSiblingExists(item)) return goneError();
     auto created = createSibling(item);
     if (auto* error = std::get_if<QXError>(&created)) return std::move(*error);
-    auto& file = std::get<std::optional<RedeemedFile>>(created);
-    if (file) return std::move(*file);
+    if (auto* file = std::get_if<RedeemedFile>(&created)) return std::move(*file);
   }
   return sandboxErrorFor(PathRefusal::unsteady);
 }
