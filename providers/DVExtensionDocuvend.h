@@ -96,7 +96,7 @@ class DVExtensionDocuvend final : public QXDocuvend, public std::enable_shared_f
 
   // --- Requests
 
-  // Starts or reaches the extension's process. The request handler runs on a thread of the extension host.
+  // Starts or reaches the extension's process. The request handler runs on a thread of the extension host, or inside the call.
   void performExtensionRequest(RequestHandler handler);
   // None, without a call of the error handler, when the request has no context. The error handler hears of every message that could not
   // be delivered.

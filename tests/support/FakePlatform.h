@@ -1,7 +1,8 @@
 // A whole platform of fakes, installed for the test's process.
 //
 // A process can install one platform only, so every test that makes one of these needs a process of its own, as each test here has.
-// Everything of the fakes is reached through its members. Queues are turned by hand on the thread that made it.
+// Everything of the fakes is reached through its members. Queues are turned by hand on the thread that made it; a test that wants threads
+// takes another queue service, and does not destroy its platform while they run.
 #pragma once
 
 #include <memory>
@@ -23,13 +24,14 @@
 
 namespace docuvend::fake_platform {
 
-struct FakePlatform {
-  FakePlatform() {
+template <class Queues>
+struct FakePlatformOver {
+  FakePlatformOver() {
     QXPlatform::install({queues, log, rpc, applicationRegistry, sandbox, extensionHost, fileCoordinator, deviceLock, notificationCenter,
                          fileSystem, propertyLists});
   }
-  FakePlatform(const FakePlatform&) = delete;
-  FakePlatform& operator=(const FakePlatform&) = delete;
+  FakePlatformOver(const FakePlatformOver&) = delete;
+  FakePlatformOver& operator=(const FakePlatformOver&) = delete;
 
   // A well-formed provider bundle: its record, and its group's container with the storage directory in it.
   void installProviderBundle(const std::string& identifier) {
@@ -60,7 +62,7 @@ struct FakePlatform {
     return storageURL(identifier).appendingPathComponent(name, QXURLKind::file);
   }
 
-  FakeQueues queues;
+  Queues queues;
   FakeLog log;
   FakeRpcService rpc;
   FakeApplicationRegistry applicationRegistry;
@@ -72,5 +74,7 @@ struct FakePlatform {
   FakeFileSystem fileSystem;
   FakePropertyLists propertyLists{fileSystem};
 };
+
+using FakePlatform = FakePlatformOver<FakeQueues>;
 
 }  // namespace docuvend::fake_platform
