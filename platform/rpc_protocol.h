@@ -84,7 +84,11 @@ template <class T>
 std::optional<T> fromWire(QXValue value) {
   auto* held = value.as<typename WireType<T>::type>();
   if (held == nullptr) return std::nullopt;
-  return T{std::move(*held)};
+  if constexpr (Identifier<T>) {
+    return T{std::move(*held)};
+  } else {
+    return std::move(*held);  // not in braces: an array would become an array of one array
+  }
 }
 
 template <class... Ts>

@@ -3,14 +3,14 @@
 #include <algorithm>
 #include <utility>
 
+#include "platform/rpc_errors.h"
+
 namespace docuvend::fake_platform {
 namespace {
 
-// The domain and codes of the real one's failures.
-constexpr const char* kErrorDomain = "QXRpcErrorDomain";
-constexpr std::int64_t kUnknownOperation = 1;
-constexpr std::int64_t kInvalidArguments = 2;
-constexpr std::int64_t kInvalidReply = 3;
+QXError failure(QXRpcErrorCode code, std::string description) {
+  return QXError::make(kQXRpcErrorDomain, static_cast<std::int64_t>(code), std::move(description));
+}
 
 class Peer final : public QXRpcProxy {
  public:
@@ -59,14 +59,11 @@ std::optional<FakeRpcProxy::Entry> FakeRpcProxy::settle(std::size_t index) {
 }
 
 bool FakeRpcProxy::answer(std::size_t index, QXArray values) {
+  if (index < count() && !sent(index).wantsReply) return false;
   const auto entry = settle(index);
   if (!entry) return false;
-  if (!entry->reply) {
-    if (errorHandler_) errorHandler_(QXError::make(kErrorDomain, kInvalidReply, "a reply to a message that wants none"));
-    return true;
-  }
   if (const auto mismatch = qxMismatch(entry->send.operation.replies, values)) {
-    if (errorHandler_) errorHandler_(QXError::make(kErrorDomain, kInvalidReply, *mismatch));
+    if (errorHandler_) errorHandler_(failure(QXRpcErrorCode::invalidReply, *mismatch));
     return true;
   }
   entry->reply(std::move(values));
@@ -228,11 +225,11 @@ void FakeRpcConnection::run(const std::shared_ptr<Invocation>& invocation) {
   const auto object = exportedObject();
   const auto operation = interface && object ? interface->indexOf(invocation->operationName) : std::nullopt;
   if (!operation) {
-    fail(invocation, QXError::make(kErrorDomain, kUnknownOperation, "unknown operation " + invocation->operationName));
+    fail(invocation, failure(QXRpcErrorCode::unknownOperation, "unknown operation " + invocation->operationName));
     return;
   }
   if (const auto mismatch = qxMismatch(interface->operations()[*operation].arguments, invocation->arguments)) {
-    fail(invocation, QXError::make(kErrorDomain, kInvalidArguments, *mismatch));
+    fail(invocation, failure(QXRpcErrorCode::invalidArguments, *mismatch));
     return;
   }
   QXRpcReply reply;
@@ -249,7 +246,7 @@ void FakeRpcConnection::run(const std::shared_ptr<Invocation>& invocation) {
 void FakeRpcConnection::complete(const std::shared_ptr<Invocation>& invocation, const QXRpcInterface& interface, std::size_t operation,
                                  QXArray values) {
   if (const auto mismatch = qxReplyMismatch(interface, operation, values)) {
-    fail(invocation, QXError::make(kErrorDomain, kInvalidReply, *mismatch));
+    fail(invocation, failure(QXRpcErrorCode::invalidReply, *mismatch));
     return;
   }
   if (settle(invocation)) invocation->reply(std::move(values));

@@ -45,8 +45,8 @@ class FakeRpcProxy final : public QXRpcProxy {
   [[nodiscard]] Send sent(std::size_t index) const;
   [[nodiscard]] std::vector<std::string> sentNames() const;
 
-  // Settles one message, counted from 0 in the order of sending. False when it does not exist or is settled already, and nothing
-  // happens then. An answer that does not fit the operation reaches the error handler, as does one to a message that wants no reply.
+  // Settles one message, counted from 0 in the order of sending. False when it does not exist, is settled already, or (an answer) wants
+  // no reply, and nothing happens then. An answer that does not fit the operation reaches the error handler.
   bool answer(std::size_t index, QXArray values);
   bool fail(std::size_t index, const QXError& error);
   // The connection ended: every message that waits for its answer fails once.

@@ -1,0 +1,337 @@
+#include "platform/linux/rpc/LinuxRpcService.h"
+
+#include <gmock/gmock.h>
+#include <gtest/gtest.h>
+#include <sys/resource.h>
+#include <sys/stat.h>
+#include <sys/un.h>
+
+#include <fstream>
+#include <iostream>
+#include <vector>
+
+#include "platform/linux/rpc/ConnectionLimiter.h"
+#include "platform/linux/rpc/LinuxRpcConnection.h"
+#include "platform/linux/wire/Limits.h"
+#include "platform/linux/wire/SocketAddress.h"
+#include "tests/rpc/RpcDrivers.h"
+#include "tests/rpc/TestProtocol.h"
+#include "tests/wire/RawPeer.h"
+
+namespace docuvend::linux_platform {
+namespace {
+
+using tests::kServiceName;
+using tests::LinuxDriver;
+using tests::Mailbox;
+using tests::RawPeer;
+using tests::TestObject;
+using tests::TestProtocol;
+
+MATCHER_P(IsRpcError, value, "") {
+  return arg.has_value() && arg->domain == kQXRpcErrorDomain && arg->code == static_cast<std::int64_t>(value);
+}
+
+class StandardErrorLog final : public QXLogHandle {
+ public:
+  [[nodiscard]] bool isEnabled(QXLogType) const override { return true; }
+  void write(QXLogType, const std::string& message) override { std::cerr << message << std::endl; }
+};
+
+// Serves the test protocol to everybody, and hands over the connections.
+class Delegate final : public QXRpcListenerDelegate {
+ public:
+  bool listener(QXRpcListener&, const std::shared_ptr<QXRpcConnection>& shouldAcceptNewConnection) override {
+    shouldAcceptNewConnection->setExportedInterface(qxInterfaceOf<TestProtocol>());
+    shouldAcceptNewConnection->setExportedObject(std::make_shared<QXRpcExport<TestProtocol>>(std::make_shared<TestObject>()));
+    shouldAcceptNewConnection->resume();
+    connections.put(shouldAcceptNewConnection);
+    return true;
+  }
+
+  Mailbox<std::shared_ptr<QXRpcConnection>> connections;
+};
+
+class LinuxRpcServiceTest : public testing::Test {
+ protected:
+  void serve() {
+    listener = driver.listener();
+    listener->setDelegate(delegate);
+    listener->resume();
+  }
+  // True when a request was answered.
+  bool roundTrip(const LinuxDriver::Client& client) {
+    Mailbox<bool> answered;
+    QXRemote<TestProtocol>(client.proxy([&answered](const QXError&) { answered.put(false); })).call<&TestProtocol::ping>([&answered] {
+      answered.put(true);
+    });
+    return answered.take() == true;
+  }
+  RawPeer connectRaw() const { return RawPeer(std::get<UniqueDescriptor>(connectToSocket(driver.socketPath))); }
+
+  std::shared_ptr<Delegate> delegate = std::make_shared<Delegate>();
+  Mailbox<QXError> closed;
+  LinuxDriver driver;
+  std::shared_ptr<QXRpcListener> listener;
+};
+
+TEST_F(LinuxRpcServiceTest, TheSocketIsTheOwnersAloneAndGoesWithTheListener) {
+  serve();
+  struct stat status {};
+  ASSERT_EQ(::lstat(driver.socketPath.c_str(), &status), 0);
+  EXPECT_TRUE(S_ISSOCK(status.st_mode));
+  EXPECT_EQ(status.st_mode & 07777U, 0600U);
+  EXPECT_EQ(std::distance(std::filesystem::directory_iterator(driver.directory.path()), {}), 1) << "no temporary name is left";
+  listener.reset();
+  EXPECT_NE(::lstat(driver.socketPath.c_str(), &status), 0);
+}
+
+// A socket file that nobody listens to, as a killed process leaves it.
+void leaveSocket(const std::string& path) {
+  const auto address = SocketAddress::forPath(path);
+  const UniqueDescriptor socket(::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0));
+  const auto& to = std::get<SocketAddress>(address);
+  ASSERT_EQ(::bind(socket.get(), to.address(), to.length()), 0);
+}
+
+TEST_F(LinuxRpcServiceTest, AStaleSocketIsReplaced) {
+  leaveSocket(driver.socketPath);
+  leaveSocket(driver.directory.path() + "/." + kServiceName + ".new");
+  serve();
+  EXPECT_TRUE(roundTrip(driver.connect()));
+}
+
+TEST_F(LinuxRpcServiceTest, AnotherListenersSocketIsLeftToItWhenThisOneGoes) {
+  serve();
+  std::filesystem::remove(driver.socketPath);
+  const auto second = driver.listener();
+  listener.reset();
+  EXPECT_TRUE(std::filesystem::exists(driver.socketPath));
+}
+
+using LinuxRpcServiceDeathTest = LinuxRpcServiceTest;
+
+TEST_F(LinuxRpcServiceDeathTest, ANameThatCannotBePublishedEndsTheProcess) {
+  GTEST_FLAG_SET(death_test_style, "threadsafe");
+  const auto publish = [](const std::string& path, const char* name) {
+    StandardErrorLog log;
+    tests::TestPeerDirectory peers;
+    Reactor reactor(1);
+    LinuxRpcService service(reactor, peers, log, {{kServiceName, path}});
+    static_cast<void>(service.listenerForService(name));
+  };
+  std::ofstream(driver.socketPath) << "a file";
+  EXPECT_EXIT(publish(driver.socketPath, kServiceName), testing::ExitedWithCode(EXIT_FAILURE),
+              "\\[ERROR\\] Cannot publish the service com.example.Service: .* is not a socket");
+  std::filesystem::remove(driver.socketPath);
+  std::filesystem::create_symlink("/dev/null", driver.socketPath);
+  EXPECT_EXIT(publish(driver.socketPath, kServiceName), testing::ExitedWithCode(EXIT_FAILURE), "is not a socket");
+  std::filesystem::remove(driver.socketPath);
+  EXPECT_EXIT(publish(driver.directory.path() + "/missing/socket", kServiceName), testing::ExitedWithCode(EXIT_FAILURE), "cannot open");
+  EXPECT_EXIT(publish(driver.socketPath, "com.example.Other"), testing::ExitedWithCode(EXIT_FAILURE), "no socket is known for it");
+  serve();
+  EXPECT_EXIT(publish(driver.socketPath, kServiceName), testing::ExitedWithCode(EXIT_FAILURE), "another process listens at");
+}
+
+TEST_F(LinuxRpcServiceTest, APathMayBeLongerThanASocketAddress) {
+  std::string deep = driver.directory.path();
+  while (deep.size() <= 2 * sizeof(sockaddr_un::sun_path)) deep += "/" + std::string(50, 'd');
+  std::filesystem::create_directories(deep);
+  const std::string path = deep + "/" + kServiceName;
+  LinuxRpcService service(driver.reactor, driver.peers, driver.log.defaultLog(), {{kServiceName, path}});
+  listener = service.listenerForService(kServiceName);
+  listener->setDelegate(delegate);
+  listener->resume();
+  auto socket = connectToSocket(path);
+  ASSERT_TRUE(std::holds_alternative<UniqueDescriptor>(socket)) << std::get<QXError>(socket).description();
+  const auto endpoint = Endpoint::create(driver.reactor, std::get<UniqueDescriptor>(std::move(socket)), {}, {});
+  endpoint->resume();
+  EXPECT_TRUE(roundTrip(LinuxDriver::Client(endpoint)));
+  listener.reset();
+  EXPECT_FALSE(std::filesystem::exists(path));
+}
+
+TEST_F(LinuxRpcServiceTest, AMalformedFrameClosesThatConnectionWithOneLogLineAndTheServiceGoesOn) {
+  serve();
+  const auto raw = connectRaw();
+  raw.sayHello();
+  const std::vector<std::uint8_t> nonsense = {2, 0, 0, 0, 99, 0};
+  raw.write(nonsense);
+  ASSERT_TRUE(raw.read<Hello>());
+  ASSERT_TRUE(raw.read<EndFrame>());
+  EXPECT_TRUE(raw.atEnd());
+  EXPECT_TRUE(roundTrip(driver.connect()));
+  const std::string line = "[NOTICE] Closing the connection of PID " + std::to_string(::getpid()) + ": a frame of unknown type 99";
+  // The line is written by another thread than the one that closes the socket.
+  for (int i = 0; i < 1000 && driver.log.texts().empty(); ++i) EXPECT_TRUE(roundTrip(driver.connect()));
+  EXPECT_THAT(driver.log.texts(QXLogType::defaultType), testing::ElementsAre(line));
+}
+
+TEST_F(LinuxRpcServiceTest, TheEndThatAPeerAnnouncesIsNotLogged) {
+  serve();
+  auto client = driver.connect();
+  EXPECT_TRUE(roundTrip(client));
+  client.leave();
+  const auto raw = connectRaw();
+  raw.write(Frame(EndFrame{QXError::make(kQXRpcErrorDomain, static_cast<std::int64_t>(QXRpcErrorCode::malformedFrame), "forged")}));
+  ASSERT_TRUE(raw.read<Hello>());
+  EXPECT_TRUE(raw.atEnd());
+  EXPECT_TRUE(roundTrip(driver.connect()));
+  EXPECT_THAT(driver.log.texts(), testing::IsEmpty());
+}
+
+TEST_F(LinuxRpcServiceTest, NobodyHasNeitherTokenNorEntitlementsAndMayConnect) {
+  driver.peers.setNextPeer(Standing::nobody, std::nullopt, {{"right", QXValue(true)}});
+  serve();
+  EXPECT_TRUE(roundTrip(driver.connect()));
+  const auto connection = delegate->connections.take();
+  ASSERT_TRUE(connection);
+  EXPECT_EQ((*connection)->auditToken(), QXAuditToken{});
+  EXPECT_EQ((*connection)->valueForEntitlement("right"), std::nullopt);
+}
+
+TEST_F(LinuxRpcServiceTest, AnUnconfinedPeerActsForTheBundleThatItDeclares) {
+  driver.peers.setNextPeer(Standing::unconfined, std::nullopt, {});
+  driver.peers.install("com.example.App", {{"right", QXValue(true)}});
+  serve();
+  Hello hello;
+  hello.declaredBundle = "com.example.App";
+  EXPECT_TRUE(roundTrip(driver.connect(hello)));
+  const auto connection = delegate->connections.take();
+  ASSERT_TRUE(connection);
+  EXPECT_EQ((*connection)->valueForEntitlement("right"), QXValue(true));
+  EXPECT_EQ((*connection)->auditToken(), tests::TestPeerDirectory::tokenOf(1));
+  EXPECT_EQ((*connection)->processIdentifier(), ::getpid());
+}
+
+TEST_F(LinuxRpcServiceTest, ADeclarationThatTheDirectoryRefusesEndsTheConnectionWithAReason) {
+  driver.peers.setNextPeer(Standing::confined, "com.example.Other", {});
+  driver.peers.install("com.example.App", {{"right", QXValue(true)}});
+  serve();
+  Hello hello;
+  hello.declaredBundle = "com.example.App";
+  const auto client = driver.connect(hello, [this](const QXError& reason) { closed.put(reason); });
+  Mailbox<QXError> errors;
+  QXRemote<TestProtocol>(client.proxy([&errors](const QXError& error) { errors.put(error); })).call<&TestProtocol::ping>([] {
+    ADD_FAILURE() << "answered";
+  });
+  EXPECT_THAT(errors.take(), IsRpcError(QXRpcErrorCode::refused));
+  EXPECT_THAT(closed.take(), IsRpcError(QXRpcErrorCode::refused));
+}
+
+TEST_F(LinuxRpcServiceTest, OnePeersConnectionsAreLimitedAndOthersAreServed) {
+  serve();
+  std::vector<LinuxDriver::Client> clients;
+  for (std::size_t i = 0; i < kMaximumConnectionsPerPeer; ++i) {
+    clients.push_back(driver.connect());
+    ASSERT_TRUE(roundTrip(clients.back()));
+  }
+  for (int i = 0; i < 3; ++i) {
+    const auto refused = driver.connect({}, [this](const QXError& reason) { closed.put(reason); });
+    EXPECT_THAT(closed.take(), IsRpcError(QXRpcErrorCode::refused));
+  }
+  EXPECT_THAT(driver.log.texts(),
+              testing::ElementsAre("[NOTICE] Refusing a connection of PID " + std::to_string(::getpid()) +
+                                   ": com.example.App may not open more than " + std::to_string(kMaximumConnectionsPerPeer) + "."));
+  driver.peers.setNextPeer(Standing::confined, "com.example.Other", {});
+  EXPECT_TRUE(roundTrip(driver.connect()));
+  driver.peers.setNextPeer(Standing::confined, "com.example.App", {});
+  clients.pop_back();
+  // The place is free when the service has noticed.
+  bool admitted = false;
+  for (int i = 0; i < 1000 && !admitted; ++i) admitted = roundTrip(driver.connect());
+  EXPECT_TRUE(admitted);
+}
+
+TEST_F(LinuxRpcServiceTest, WithoutFreeDescriptorsAClientIsDroppedAndTheServiceGoesOn) {
+  listener = driver.listener();
+  listener->setDelegate(delegate);
+  rlimit old{};
+  ASSERT_EQ(::getrlimit(RLIMIT_NOFILE, &old), 0);
+  const auto raw = connectRaw();
+  // Nothing above the highest descriptor in use can be opened.
+  rlimit tight = old;
+  tight.rlim_cur = static_cast<rlim_t>(raw.socket()) + 1;
+  std::vector<UniqueDescriptor> fillers;
+  ASSERT_EQ(::setrlimit(RLIMIT_NOFILE, &tight), 0);
+  while (true) {
+    UniqueDescriptor filler(::dup(raw.socket()));
+    if (!filler) break;
+    fillers.push_back(std::move(filler));
+  }
+  listener->resume();
+  const bool dropped = raw.atEnd();
+  ASSERT_EQ(::setrlimit(RLIMIT_NOFILE, &old), 0);
+  EXPECT_TRUE(dropped);
+  EXPECT_THAT(driver.log.texts(), testing::ElementsAre(testing::StartsWith("[NOTICE] Refusing a connection: cannot accept it")));
+  EXPECT_TRUE(roundTrip(driver.connect()));
+}
+
+TEST_F(LinuxRpcServiceTest, APassedSocketServesItsName) {
+  const std::string path = driver.directory.path() + "/" + kServiceName;
+  auto found = SocketAddress::forPath(path);
+  const auto& address = std::get<SocketAddress>(found);
+  for (const bool byName : {true, false}) {
+    UniqueDescriptor passed(::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0));
+    ASSERT_EQ(::bind(passed.get(), address.address(), address.length()), 0);
+    ASSERT_EQ(::listen(passed.get(), 5), 0);
+    std::vector<ActivatedSocket> sockets;
+    sockets.push_back({byName ? kServiceName : "docuvend.socket", byName ? "" : path, std::move(passed)});
+    LinuxRpcService service(driver.reactor, driver.peers, driver.log.defaultLog(), {}, std::move(sockets));
+    listener = service.listenerForService(kServiceName);
+    listener->setDelegate(delegate);
+    auto client = driver.connect();
+    listener->resume();
+    EXPECT_TRUE(roundTrip(client));
+    listener.reset();
+    EXPECT_TRUE(std::filesystem::exists(path)) << "its file belongs to the service manager";
+    std::filesystem::remove(path);
+  }
+}
+
+TEST_F(LinuxRpcServiceTest, TheListenersEndClosesItsConnections) {
+  serve();
+  auto client = driver.connect({}, [this](const QXError& reason) { closed.put(reason); });
+  ASSERT_TRUE(roundTrip(client));
+  ASSERT_TRUE(delegate->connections.take());
+  listener.reset();
+  EXPECT_TRUE(closed.take());
+}
+
+TEST_F(LinuxRpcServiceTest, TheServiceMayCallItsClients) {
+  serve();
+  auto socket = connectToSocket(driver.socketPath);
+  const auto endpoint = Endpoint::create(driver.reactor, std::get<UniqueDescriptor>(std::move(socket)), {}, {});
+  const auto object = std::make_shared<TestObject>();
+  endpoint->setExportedInterface(qxInterfaceOf<TestProtocol>());
+  endpoint->setExportedObject(std::make_shared<QXRpcExport<TestProtocol>>(object));
+  endpoint->resume();
+  const auto connection = delegate->connections.take();
+  ASSERT_TRUE(connection);
+  Mailbox<std::optional<std::string>> texts;
+  QXRemote<TestProtocol>((*connection)->remoteObjectProxy([](const QXError& error) {
+    ADD_FAILURE() << error.description();
+  })).call<&TestProtocol::echo>("a", [&texts](std::optional<std::string> text) { texts.put(std::move(text)); });
+  auto echo = object->echoes.take();
+  ASSERT_TRUE(echo);
+  echo->completion("b");
+  EXPECT_EQ(texts.take(), std::optional<std::string>("b"));
+}
+
+TEST_F(LinuxRpcServiceTest, AConnectionOverASocketPairHasNoIdentity) {
+  auto [ours, theirs] = tests::socketPair();
+  const auto connection = connectionOverSocket(driver.reactor, driver.log.defaultLog(), std::move(ours), 4711,
+                                               [this](const QXError& reason) { closed.put(reason); });
+  EXPECT_EQ(connection->processIdentifier(), 0);
+  EXPECT_EQ(connection->auditToken(), QXAuditToken{});
+  EXPECT_EQ(connection->valueForEntitlement("right"), std::nullopt);
+  connection->resume();
+  const RawPeer raw(std::move(theirs));
+  ASSERT_TRUE(raw.read<Hello>());
+  raw.write(std::vector<std::uint8_t>{0, 0, 0, 0});
+  EXPECT_THAT(closed.take(), IsRpcError(QXRpcErrorCode::malformedFrame));
+  EXPECT_THAT(driver.log.texts(), testing::ElementsAre("[NOTICE] Closing the connection of PID 4711: a frame without a head"));
+}
+
+}  // namespace
+}  // namespace docuvend::linux_platform
