@@ -3,9 +3,11 @@
 #include <fcntl.h>
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
+#include <linux/keyctl.h>
 #include <sys/resource.h>
 #include <sys/socket.h>
 #include <sys/stat.h>
+#include <sys/syscall.h>
 #include <sys/un.h>
 #include <unistd.h>
 
@@ -108,6 +110,16 @@ TEST_F(ConfinedApplication, OwnsItsContainerAndTemporaryFiles) {
   struct stat status {};
   ASSERT_EQ(::stat(bundle.container.c_str(), &status), 0);
   EXPECT_EQ(status.st_mode & 07777U, 0700U);
+}
+
+TEST_F(ConfinedApplication, ExecutesWhatIsInstalledAndNotWhatItWrote) {
+  const auto bundle = house_.installProbe("org.a");
+  const std::string written = bundle.container + "/true";
+  std::filesystem::create_directories(bundle.container);
+  std::filesystem::copy_file("/usr/bin/true", written);
+  const auto outcomes = house_.run(bundle, {"execute", "/usr/bin/true", "execute", written});
+  EXPECT_EQ(outcomes.at("execute /usr/bin/true"), "ok");
+  EXPECT_EQ(outcomes.at("execute " + written), "EACCES");
 }
 
 TEST_F(ConfinedApplication, SeesNothingElseOfTheHome) {
@@ -225,6 +237,13 @@ TEST_F(ConfinedApplication, GetsTheStandardDescriptorsAlone) {
   ASSERT_GE(::dup2(leaked.get(), 50), 0);
   EXPECT_EQ(attempt(bundle, "numbers", "/proc/self/fd"), "0 1 2");
   ::close(50);
+}
+
+TEST_F(ConfinedApplication, HasNoneOfTheLaunchersKeys) {
+  ASSERT_GE(::syscall(SYS_keyctl, KEYCTL_JOIN_SESSION_KEYRING, nullptr), 0);
+  ASSERT_GE(::syscall(SYS_add_key, "user", "docuvend-test", "x", 1, KEY_SPEC_SESSION_KEYRING), 0);
+  ASSERT_GE(::syscall(SYS_keyctl, KEYCTL_SEARCH, KEY_SPEC_SESSION_KEYRING, "user", "docuvend-test", 0), 0);
+  EXPECT_EQ(attempt(house_.installProbe("org.a"), "key", "docuvend-test"), "ENOKEY");
 }
 
 TEST_F(ConfinedApplication, ReopensNoPassedDescriptorForWriting) {

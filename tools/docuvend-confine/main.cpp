@@ -1,6 +1,8 @@
 // Runs inside a confinement, between bubblewrap and the bundle's executable: takes away what the mounts leave open, then becomes the
 // executable. Its arguments are described in platform/linux/launch/policy/ConfinePolicy.h; it reads nothing else.
+#include <linux/keyctl.h>
 #include <sys/resource.h>
+#include <sys/syscall.h>
 #include <unistd.h>
 
 #include <cerrno>
@@ -30,11 +32,18 @@ std::optional<QXError> limit(__rlimit_resource resource, std::optional<std::uint
   return std::nullopt;
 }
 
+// The launcher's session keyring is inherited by everything it starts, with the keys in it. A kernel without keyrings has none to hide.
+std::optional<QXError> leaveKeyring() {
+  if (::syscall(SYS_keyctl, KEYCTL_JOIN_SESSION_KEYRING, nullptr) >= 0 || errno == ENOSYS) return std::nullopt;
+  return QXError::system(errno, "cannot leave the session keyring");
+}
+
 int run(const std::vector<std::string>& arguments) {
   auto parsed = parseConfineArguments(arguments);
   if (const auto* problem = std::get_if<std::string>(&parsed)) return fail(*problem);
   auto& [policy, command] = std::get<ConfineCommand>(parsed);
 
+  if (const auto error = leaveKeyring()) return fail(error->description());
   if (const auto error = limit(RLIMIT_NPROC, policy.processes)) return fail(error->description());
   if (const auto error = limit(RLIMIT_DATA, policy.memory)) return fail(error->description());
   if (const auto error = restrictToRules(policy.rules, landlockLevel())) return fail(error->description());

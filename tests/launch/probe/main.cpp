@@ -2,12 +2,14 @@
 // of an error, or what was asked for. Only words on standard output; the last word may end the process.
 #include <dirent.h>
 #include <fcntl.h>
+#include <linux/keyctl.h>
 #include <sched.h>
 #include <signal.h>
 #include <sys/mount.h>
 #include <sys/resource.h>
 #include <sys/socket.h>
 #include <sys/stat.h>
+#include <sys/syscall.h>
 #include <sys/un.h>
 #include <sys/wait.h>
 #include <unistd.h>
@@ -143,6 +145,18 @@ std::string forkUntilRefused() {
   return std::to_string(count);
 }
 
+std::string execute(const std::string& path) {
+  const pid_t child = ::fork();
+  if (child == 0) {
+    ::execl(path.c_str(), path.c_str(), nullptr);
+    ::_exit(errno);
+  }
+  int status = 0;
+  ::waitpid(child, &status, 0);
+  errno = WEXITSTATUS(status);
+  return outcome(errno == 0 ? 0 : -1);
+}
+
 std::string attempt(const std::string& what, const std::string& subject) {
   int socket = -1;
   if (what == "read") return openAndClose(subject, O_RDONLY);
@@ -168,6 +182,8 @@ std::string attempt(const std::string& what, const std::string& subject) {
   if (what == "unshare") return outcome(::unshare(subject == "user" ? CLONE_NEWUSER : CLONE_NEWNS));
   if (what == "mount") return outcome(::mount(subject.c_str(), "/.docuvend-info", nullptr, MS_BIND, nullptr));
   if (what == "chroot") return outcome(::chroot(subject.c_str()));
+  if (what == "execute") return execute(subject);
+  if (what == "key") return outcome(::syscall(SYS_keyctl, KEYCTL_SEARCH, KEY_SPEC_SESSION_KEYRING, "user", subject.c_str(), 0));
   if (what == "limit") return limitOf(subject == "processes" ? RLIMIT_NPROC : RLIMIT_DATA);
   if (what == "fork") return forkUntilRefused();
   if (what == "echo") return echoOnce();
