@@ -213,6 +213,19 @@ TYPED_TEST(QueueBehaviour, ASyncOnASuspendedQueueWaitsForTheResume) {
   EXPECT_THAT(this->arrivals.names(), ElementsAre("resume", "before", "sync"));
 }
 
+TYPED_TEST(QueueBehaviour, ASyncThatIsAloneOnASuspendedQueueWaitsForTheResumeToo) {
+  for (const auto& queue : {this->queues().serialQueue("serial"), this->queues().concurrentQueue("concurrent")}) {
+    queue->suspend();
+    this->queues().globalQueue().after(5ms, [this, queue] {
+      this->arrivals.arrive("resume");
+      queue->resume();
+    });
+    this->bench.pass(5ms);
+    queue->sync(this->arrival("sync"));
+  }
+  EXPECT_THAT(this->arrivals.names(), ElementsAre("resume", "sync", "resume", "sync"));
+}
+
 TYPED_TEST(QueueBehaviour, DelayedTasksAreSubmittedInTheOrderOfTheirTimes) {
   const auto queue = this->queues().serialQueue("serial");
   // Where time passes by itself the first call may be so late that its task is rightly the last: then the order proves nothing.
