@@ -1,15 +1,20 @@
 #include "platform/linux/rpc/LinuxRpcService.h"
 
+#include <fcntl.h>
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
 #include <sys/resource.h>
 #include <sys/stat.h>
 #include <sys/un.h>
+#include <sys/wait.h>
+#include <unistd.h>
 
+#include <array>
 #include <fstream>
 #include <iostream>
 #include <vector>
 
+#include "platform/linux/rpc/BoundSocket.h"
 #include "platform/linux/rpc/ConnectionLimiter.h"
 #include "platform/linux/rpc/LinuxRpcConnection.h"
 #include "platform/linux/wire/Limits.h"
@@ -109,28 +114,62 @@ TEST_F(LinuxRpcServiceTest, AnotherListenersSocketIsLeftToItWhenThisOneGoes) {
   EXPECT_TRUE(std::filesystem::exists(driver.socketPath));
 }
 
-using LinuxRpcServiceDeathTest = LinuxRpcServiceTest;
+struct Publishing {
+  int status = -1;     // as from waitpid
+  std::string output;  // what the process wrote to standard error
+};
 
-TEST_F(LinuxRpcServiceDeathTest, ANameThatCannotBePublishedEndsTheProcess) {
-  GTEST_FLAG_SET(death_test_style, "threadsafe");
-  const auto publish = [](const std::string& path, const char* name) {
+// What becomes of a process that publishes `name` while `path` is the service's. Forked: no other thread may be running.
+Publishing publish(const std::string& path, const std::string& name) {
+  std::array<int, 2> ends{-1, -1};
+  if (::pipe2(ends.data(), O_CLOEXEC) != 0) return {};
+  const UniqueDescriptor out(ends[0]);
+  UniqueDescriptor in(ends[1]);
+  const pid_t child = ::fork();
+  if (child < 0) return {};
+  if (child == 0) {
+    ::dup2(in.get(), STDERR_FILENO);
     StandardErrorLog log;
     tests::TestPeerDirectory peers;
     Reactor reactor(1);
     LinuxRpcService service(reactor, peers, log, {{kServiceName, path}});
-    static_cast<void>(service.listenerForService(name));
-  };
-  std::ofstream(driver.socketPath) << "a file";
-  EXPECT_EXIT(publish(driver.socketPath, kServiceName), testing::ExitedWithCode(EXIT_FAILURE),
-              "\\[ERROR\\] Cannot publish the service com.example.Service: .* is not a socket");
-  std::filesystem::remove(driver.socketPath);
-  std::filesystem::create_symlink("/dev/null", driver.socketPath);
-  EXPECT_EXIT(publish(driver.socketPath, kServiceName), testing::ExitedWithCode(EXIT_FAILURE), "is not a socket");
-  std::filesystem::remove(driver.socketPath);
-  EXPECT_EXIT(publish(driver.directory.path() + "/missing/socket", kServiceName), testing::ExitedWithCode(EXIT_FAILURE), "cannot open");
-  EXPECT_EXIT(publish(driver.socketPath, "com.example.Other"), testing::ExitedWithCode(EXIT_FAILURE), "no socket is known for it");
-  serve();
-  EXPECT_EXIT(publish(driver.socketPath, kServiceName), testing::ExitedWithCode(EXIT_FAILURE), "another process listens at");
+    const auto listener = service.listenerForService(name);
+    ::_exit(0);
+  }
+  in.reset();
+  Publishing result;
+  std::array<char, 256> bytes{};
+  for (ssize_t count = 0; (count = ::read(out.get(), bytes.data(), bytes.size())) > 0;) {
+    result.output.append(bytes.data(), static_cast<std::size_t>(count));
+  }
+  ::waitpid(child, &result.status, 0);
+  return result;
+}
+
+MATCHER_P(EndedWith, line, "") {
+  return WIFEXITED(arg.status) && WEXITSTATUS(arg.status) == EXIT_FAILURE &&
+         arg.output.find("[ERROR] Cannot publish the service ") != std::string::npos && arg.output.find(line) != std::string::npos;
+}
+void PrintTo(const Publishing& publishing, std::ostream* out) { *out << "status " << publishing.status << ": " << publishing.output; }
+
+TEST(LinuxRpcServicePublishingTest, ANameThatCannotBePublishedEndsTheProcess) {
+  const tests::TemporaryDirectory directory;
+  const std::string path = directory.path() + "/" + kServiceName;
+  EXPECT_EQ(publish(path, kServiceName).status, 0);
+  std::filesystem::remove(path);
+
+  EXPECT_THAT(publish(path, "com.example.Other"), EndedWith("no socket is known for it"));
+  EXPECT_THAT(publish(directory.path() + "/missing/socket", kServiceName), EndedWith("cannot open"));
+  std::ofstream(path) << "a file";
+  EXPECT_THAT(publish(path, kServiceName), EndedWith("is not a socket"));
+  EXPECT_TRUE(std::filesystem::is_regular_file(path));
+  std::filesystem::remove(path);
+  std::filesystem::create_symlink("/dev/null", path);
+  EXPECT_THAT(publish(path, kServiceName), EndedWith("is not a socket"));
+  std::filesystem::remove(path);
+  const auto live = BoundSocket::create(path);
+  ASSERT_TRUE(std::holds_alternative<std::unique_ptr<BoundSocket>>(live));
+  EXPECT_THAT(publish(path, kServiceName), EndedWith("another process listens at"));
 }
 
 TEST_F(LinuxRpcServiceTest, APathMayBeLongerThanASocketAddress) {
