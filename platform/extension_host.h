@@ -33,7 +33,8 @@ class QXExtensionContext {
 // One installed extension. An update of its bundle makes a new object that is not equal to the old one.
 class QXExtension {
  public:
-  // The request's identifier, or why there is none: one of the two is present. Runs on a thread of the extension host.
+  // The request's identifier, or why there is none: one of the two is present. Runs on a thread of the extension host, or inside the call
+  // when there is nothing to wait for.
   using BeginCompletion = std::function<void(std::optional<QXUUID> request, std::optional<QXError> error)>;
 
   QXExtension() = default;

@@ -7,19 +7,25 @@
 // what it is about. Every signal goes through the pidfd, so it can reach no other process. From any stage the process may die by itself;
 // whatever comes, it is reaped exactly once, by the watch on the pidfd or by the destructor.
 //
+// Killing and reaping happen under the event lock, so what is killed has not been reaped.
+//
 // Two threads may see the end at the same time, one on the socket and one on the pidfd. The event lock puts them in a row: the stage leaves
 // `alive` once, and onLost is through before onGone begins.
 #include "platform/linux/extension_host/ExtensionProcess.h"
 
+#include <fcntl.h>
+#include <poll.h>
 #include <signal.h>
 #include <sys/epoll.h>
-#include <sys/pidfd.h>
 #include <sys/wait.h>
+#include "platform/linux/base/pidfd.h"
 
 #include <chrono>
 #include <utility>
 
 #include "platform/linux/extension_host/ExtensionErrors.h"
+#include "platform/linux/extension_host/ProcessTree.h"
+#include "platform/linux/extension_host/pidfd.h"
 
 namespace docuvend::linux_platform {
 namespace {
@@ -67,14 +73,12 @@ class ExtensionProcess::Proxy : public QXRpcProxy {
   std::shared_ptr<QXRpcProxy> plain_;
 };
 
-ExtensionProcess::ExtensionProcess(Ends ends, std::string identifier, const ExtensionTimes& times, Reactor& reactor, QXLogHandle& log,
-                                   Handlers handlers)
+ExtensionProcess::ExtensionProcess(Ends ends, std::string identifier, const ExtensionTimes& times, QXLogHandle& log, Handlers handlers)
     : identifier_(std::move(identifier)),
       times_(times),
       log_(log),
       handlers_(std::move(handlers)),
       process_(std::move(ends.process)),
-      reactor_(reactor),
       deadlines_(times.answerLimit) {}
 
 std::shared_ptr<ExtensionProcess> ExtensionProcess::create(Ends ends, const std::string& identifier, const QXRpcInterface& exported,
@@ -82,9 +86,9 @@ std::shared_ptr<ExtensionProcess> ExtensionProcess::create(Ends ends, const std:
                                                            Handlers handlers) {
   UniqueDescriptor socket = std::move(ends.socket);
   UniqueDescriptor output = std::move(ends.output);
-  const std::shared_ptr<ExtensionProcess> process(
-      new ExtensionProcess(std::move(ends), identifier, times, reactor, log, std::move(handlers)));
+  const std::shared_ptr<ExtensionProcess> process(new ExtensionProcess(std::move(ends), identifier, times, log, std::move(handlers)));
   const std::weak_ptr<ExtensionProcess> weak = process;
+  process->socketProbe_.reset(fcntl(socket.get(), F_DUPFD_CLOEXEC, 0));
 
   Endpoint::Handlers endpointHandlers;
   endpointHandlers.onClose = [weak](const QXError&) {
@@ -99,6 +103,15 @@ std::shared_ptr<ExtensionProcess> ExtensionProcess::create(Ends ends, const std:
   process->answerTimer_ = std::make_unique<Timer>(reactor, [weak] {
     if (const auto strongSelf = weak.lock()) strongSelf->lookForOverdueAnswers();
   });
+  {
+    const std::lock_guard lock(process->eventMutex_);
+    process->death_ = reactor.watch(process->process_.descriptor.get(), /*events=*/0, [weak](std::uint32_t) -> std::uint32_t {
+      const auto strongSelf = weak.lock();
+      if (strongSelf && !strongSelf->reap()) return EPOLLIN;
+      return 0;
+    });
+    if (!process->death_) return nullptr;
+  }
   return process;
 }
 
@@ -106,7 +119,7 @@ ExtensionProcess::~ExtensionProcess() {
   endpoint_->close(extensionHostError(ExtensionHostErrorCode::stopped, "The process of " + identifier_ + " was let go."));
   death_.reset();
   if (isReaped_) return;
-  signalProcess(SIGKILL);
+  endProcessTree(process_);
   siginfo_t info{};
   waitid(P_PIDFD, static_cast<id_t>(process_.descriptor.get()), &info, WEXITED);
 }
@@ -114,11 +127,7 @@ ExtensionProcess::~ExtensionProcess() {
 void ExtensionProcess::resume() {
   endpoint_->resume();
   const std::lock_guard lock(eventMutex_);
-  death_ = reactor_.watch(process_.descriptor.get(), EPOLLIN, [weak = weak_from_this()](std::uint32_t) -> std::uint32_t {
-    const auto strongSelf = weak.lock();
-    if (strongSelf && !strongSelf->reap()) return EPOLLIN;
-    return 0;
-  });
+  death_->rearm(EPOLLIN);
 }
 
 void ExtensionProcess::end() {
@@ -132,26 +141,43 @@ void ExtensionProcess::end() {
   graceTimer_->setFor(Clock::now() + times_.endGrace);
 }
 
+void ExtensionProcess::endAtOnce() {
+  {
+    const std::lock_guard lock(eventMutex_);
+    if (stage_ == Stage::killed) return;
+    if (std::exchange(stage_, Stage::killed) == Stage::alive) handlers_.onLost(ProcessLifetime::Cause::died);
+    isLetGo_ = true;
+    endProcessTree(process_);
+  }
+  endpoint_->close(extensionHostError(ExtensionHostErrorCode::stopped, "The extension host is stopping."));
+}
+
 std::shared_ptr<QXRpcProxy> ExtensionProcess::remoteObjectProxy(QXErrorHandler errorHandler) {
   return std::make_shared<Proxy>(weak_from_this(), endpoint_, std::move(errorHandler));
+}
+
+void ExtensionProcess::noticeEnd() {
+  pollfd probe{socketProbe_.get(), POLLRDHUP, 0};
+  if (poll(&probe, 1, 0) > 0) connectionIsOver();
 }
 
 void ExtensionProcess::connectionIsOver() {
   const std::lock_guard lock(eventMutex_);
   if (stage_ != Stage::alive) return;
   stage_ = Stage::killed;
-  signalProcess(SIGKILL);
+  endProcessTree(process_);
   handlers_.onLost(ProcessLifetime::Cause::died);
 }
 
 bool ExtensionProcess::reap() {
-  siginfo_t info{};
-  if (waitid(P_PIDFD, static_cast<id_t>(process_.descriptor.get()), &info, WEXITED | WNOHANG) != 0 || info.si_pid == 0) return false;
-  const std::string how = describeEnd(info);
+  std::string how;
   Stage before = Stage::alive;
   QXLogType importance = QXLogType::defaultType;
   {
     const std::lock_guard lock(eventMutex_);
+    siginfo_t info{};
+    if (waitid(P_PIDFD, static_cast<id_t>(process_.descriptor.get()), &info, WEXITED | WNOHANG) != 0 || info.si_pid == 0) return false;
+    how = describeEnd(info);
     isReaped_ = true;
     if (isLetGo_) importance = QXLogType::info;
     before = std::exchange(stage_, Stage::killed);
@@ -170,11 +196,11 @@ void ExtensionProcess::graceIsOver() {
   const std::lock_guard lock(eventMutex_);
   if (stage_ == Stage::closed) {
     stage_ = Stage::terminated;
-    signalProcess(SIGTERM);
+    signalPidfd(process_.descriptor, SIGTERM);
     graceTimer_->setFor(Clock::now() + times_.endGrace);
   } else if (stage_ == Stage::terminated) {
     stage_ = Stage::killed;
-    signalProcess(SIGKILL);
+    endProcessTree(process_);
   }
 }
 
@@ -190,7 +216,7 @@ void ExtensionProcess::lookForOverdueAnswers() {
     const std::lock_guard lock(eventMutex_);
     if (stage_ != Stage::alive) return;
     stage_ = Stage::killed;
-    signalProcess(SIGKILL);
+    endProcessTree(process_);
     handlers_.onLost(ProcessLifetime::Cause::notAnswering);
   }
   const std::string what = "did not answer " + *verdict.overdue + " in time";
@@ -211,11 +237,6 @@ AnswerDeadlines::Message ExtensionProcess::expectAnswer(const std::string& opera
 void ExtensionProcess::gotAnswer(AnswerDeadlines::Message message) {
   const std::lock_guard lock(deadlinesMutex_);
   deadlines_.answered(message);
-}
-
-void ExtensionProcess::signalProcess(int signal) const {
-  // A process that is gone cannot be signalled, which is just as well.
-  pidfd_send_signal(process_.descriptor.get(), signal, nullptr, 0);
 }
 
 void ExtensionProcess::note(QXLogType type, const std::string& what) const {

@@ -39,7 +39,7 @@ class ExtensionProcess : public std::enable_shared_from_this<ExtensionProcess> {
     UniqueDescriptor output;  // the reading end
   };
 
-  // Nothing is read and no handler called before `resume`.
+  // Nothing is read and no handler called before `resume`. Null: the process could not be watched, and is ended.
   [[nodiscard]] static std::shared_ptr<ExtensionProcess> create(Ends ends, const std::string& identifier, const QXRpcInterface& exported,
                                                                 const ExtensionTimes& times, Reactor& reactor, QXLogHandle& log,
                                                                 Handlers handlers);
@@ -51,6 +51,10 @@ class ExtensionProcess : public std::enable_shared_from_this<ExtensionProcess> {
   void resume();
   // Closes the connection; then, if that does not make the process end by itself, by signal.
   void end();
+  // Without any such patience.
+  void endAtOnce();
+  // Looks whether the connection is over. Messages are told of that before anybody else is, so whoever tries again at once must look.
+  void noticeEnd();
 
   [[nodiscard]] int number() const { return process_.number; }
   // A proxy of the connection that watches over the answers which must be quick.
@@ -60,7 +64,7 @@ class ExtensionProcess : public std::enable_shared_from_this<ExtensionProcess> {
   class Proxy;
   enum class Stage { alive, closed, terminated, killed };
 
-  ExtensionProcess(Ends ends, std::string identifier, const ExtensionTimes& times, Reactor& reactor, QXLogHandle& log, Handlers handlers);
+  ExtensionProcess(Ends ends, std::string identifier, const ExtensionTimes& times, QXLogHandle& log, Handlers handlers);
 
   void connectionIsOver();
   // False: not dead yet.
@@ -69,7 +73,6 @@ class ExtensionProcess : public std::enable_shared_from_this<ExtensionProcess> {
   void lookForOverdueAnswers();
   [[nodiscard]] AnswerDeadlines::Message expectAnswer(const std::string& operationName);
   void gotAnswer(AnswerDeadlines::Message message);
-  void signalProcess(int signal) const;
   void note(QXLogType type, const std::string& what) const;
 
   // Constant after `create`.
@@ -78,7 +81,7 @@ class ExtensionProcess : public std::enable_shared_from_this<ExtensionProcess> {
   QXLogHandle& log_;
   const Handlers handlers_;
   const SpawnedProcess process_;
-  Reactor& reactor_;
+  UniqueDescriptor socketProbe_;  // the same socket as the endpoint's, to look at
   std::shared_ptr<Endpoint> endpoint_;
   std::unique_ptr<OutputLog> output_;
   std::unique_ptr<Timer> graceTimer_;

@@ -37,6 +37,8 @@ QXError notStarted(const std::string& identifier, QXError underlying) {
   return error;
 }
 
+QXError hostIsStopping() { return extensionHostError(ExtensionHostErrorCode::stopped, "The extension host is stopping."); }
+
 }  // namespace
 
 LinuxExtension::LinuxExtension(Bundle bundle, QXExtensionContextClass contextClass, std::shared_ptr<ExtensionServices> services)
@@ -51,7 +53,11 @@ std::shared_ptr<LinuxExtension> LinuxExtension::create(Bundle bundle, QXExtensio
   return extension;
 }
 
-LinuxExtension::~LinuxExtension() = default;
+LinuxExtension::~LinuxExtension() {
+  for (const Waiting& waiting : waiting_) {
+    waiting.completion(/*request=*/std::nullopt, extensionHostError(ExtensionHostErrorCode::stopped, "The extension was let go."));
+  }
+}
 
 bool LinuxExtension::isEqual(const QXExtension& other) const {
   const auto* extension = dynamic_cast<const LinuxExtension*>(&other);
@@ -59,13 +65,14 @@ bool LinuxExtension::isEqual(const QXExtension& other) const {
 }
 
 void LinuxExtension::beginExtensionRequest(BeginCompletion completion) {
+  if (const auto process = presentProcess()) process->noticeEnd();
   const QXUUID request = freshUUID();
   ProcessLifetime::Begin begin{};
   std::optional<QXError> refusal;
   {
     const std::lock_guard lock(mutex_);
-    begin = lifetime_.begin(request, Clock::now());
-    if (begin == ProcessLifetime::Begin::refuse) refusal = backingOffError();
+    begin = isStopped_ ? ProcessLifetime::Begin::refuse : lifetime_.begin(request, Clock::now());
+    if (begin == ProcessLifetime::Begin::refuse) refusal = isStopped_ ? hostIsStopping() : backingOffError();
     if (begin == ProcessLifetime::Begin::start || begin == ProcessLifetime::Begin::wait) {
       waiting_.push_back({request, std::move(completion)});
     }
@@ -114,11 +121,27 @@ void LinuxExtension::retire() {
   if (deadline) idleTimer_->setFor(*deadline);
 }
 
+void LinuxExtension::stop() {
+  std::shared_ptr<ExtensionProcess> process;
+  std::vector<Waiting> waiting;
+  {
+    const std::lock_guard lock(mutex_);
+    isStopped_ = true;
+    process.swap(process_);
+    waiting.swap(waiting_);
+  }
+  if (process) process->endAtOnce();
+  for (const Waiting& one : waiting) one.completion(/*request=*/std::nullopt, hostIsStopping());
+}
+
+std::shared_ptr<ExtensionProcess> LinuxExtension::presentProcess() const {
+  const std::lock_guard lock(mutex_);
+  return process_;
+}
+
 void LinuxExtension::startOnSpawner() {
-  const bool isTaken = services_->spawner.perform([weak = weak_from_this()] {
-    if (const auto strongSelf = weak.lock()) strongSelf->start();
-  });
-  if (!isTaken) didNotStart(extensionHostError(ExtensionHostErrorCode::stopped, "The extension host is stopping."));
+  const bool isTaken = services_->spawner.perform([strongSelf = shared_from_this()] { strongSelf->start(); });
+  if (!isTaken) didNotStart(hostIsStopping());
 }
 
 void LinuxExtension::start() {
@@ -158,9 +181,11 @@ std::variant<std::shared_ptr<ExtensionProcess>, QXError> LinuxExtension::makePro
   handlers.onGone = [weak = weak_from_this()] {
     if (const auto strongSelf = weak.lock()) strongSelf->processIsGone();
   };
-  return ExtensionProcess::create({std::move(std::get<SpawnedProcess>(spawned)), std::move(ourSocket), std::move(ourPipe)},
-                                  bundle_.identifier, contextClass_.hostInterface, services_->times, services_->reactor, services_->log,
-                                  std::move(handlers));
+  auto process =
+      ExtensionProcess::create({std::move(std::get<SpawnedProcess>(spawned)), std::move(ourSocket), std::move(ourPipe)}, bundle_.identifier,
+                               contextClass_.hostInterface, services_->times, services_->reactor, services_->log, std::move(handlers));
+  if (!process) return QXError::system(ENOMEM, "a new process could not be watched");
+  return process;
 }
 
 void LinuxExtension::didStart(std::shared_ptr<ExtensionProcess> process) {

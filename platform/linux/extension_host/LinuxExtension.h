@@ -53,6 +53,8 @@ class LinuxExtension : public QXExtension, public std::enable_shared_from_this<L
 
   // The bundle was updated or removed: requests are served as before, but the process does not linger.
   void retire();
+  // The host goes: ends the process at once; requests fail from now on.
+  void stop();
 
  private:
   struct Waiting {
@@ -62,6 +64,7 @@ class LinuxExtension : public QXExtension, public std::enable_shared_from_this<L
 
   LinuxExtension(Bundle bundle, QXExtensionContextClass contextClass, std::shared_ptr<ExtensionServices> services);
 
+  [[nodiscard]] std::shared_ptr<ExtensionProcess> presentProcess() const;
   void startOnSpawner();
   void start();
   [[nodiscard]] std::variant<std::shared_ptr<ExtensionProcess>, QXError> makeProcess();
@@ -83,6 +86,7 @@ class LinuxExtension : public QXExtension, public std::enable_shared_from_this<L
   std::vector<Waiting> waiting_;
   std::shared_ptr<ExtensionProcess> process_;
   bool idleTimerIsSet_ = false;
+  bool isStopped_ = false;
 };
 
 }  // namespace docuvend::linux_platform

@@ -47,6 +47,8 @@ struct LinuxExtensionHost::State {
   BundleRegistry& bundles;
   const std::shared_ptr<ExtensionServices> services;
 
+  std::vector<std::weak_ptr<LinuxExtension>> extensions;  // made so far; only on the matching thread, and when that is over
+
   std::mutex mutex;  // guards the three below
   bool mustLook = false;
   bool isStopped = false;
@@ -81,6 +83,7 @@ void LinuxExtensionHost::State::run() {
 }
 
 void LinuxExtensionHost::State::update(MatchState& match) {
+  std::erase_if(extensions, [](const std::weak_ptr<LinuxExtension>& extension) { return extension.expired(); });
   Extensions leftovers = match.reported.value_or(Extensions{});
   Extensions present;
   bool isChanged = !match.reported;
@@ -91,6 +94,7 @@ void LinuxExtensionHost::State::update(MatchState& match) {
     });
     if (same == leftovers.end()) {
       present.push_back(LinuxExtension::create(std::move(bundle), match.contextClass, services));
+      extensions.emplace_back(present.back());
       isChanged = true;
     } else {
       present.push_back(std::move(*same));
@@ -121,6 +125,9 @@ LinuxExtensionHost::~LinuxExtensionHost() {
   state_->changed.notify_one();
   state_->thread.join();
   state_->services->spawner.stop();
+  for (const auto& weak : state_->extensions) {
+    if (const auto extension = weak.lock()) extension->stop();
+  }
 }
 
 std::unique_ptr<QXExtensionMatch> LinuxExtensionHost::beginMatching(Attributes attributes, QXExtensionContextClass contextClass,

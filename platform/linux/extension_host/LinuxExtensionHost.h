@@ -19,7 +19,8 @@ class LinuxExtensionHost : public QXExtensionHost {
  public:
   // The references outlive the host and every extension that it handed out.
   LinuxExtensionHost(BundleRegistry& bundles, const Paths& paths, Reactor& reactor, QXLogHandle& log, const ExtensionTimes& times = {});
-  // Waits for a handler that runs, and ends all processes. Not from a handler.
+  // Waits for a handler that runs, and ends all processes: messages that wait for an answer fail, and so do requests from now on. Not from
+  // a handler.
   ~LinuxExtensionHost() override;
 
   // The interfaces of the context class outlive the host. Two matches of the same bundle have a process each.

@@ -3,8 +3,8 @@
 #include <fcntl.h>
 #include <signal.h>
 #include <spawn.h>
-#include <sys/pidfd.h>
 #include <sys/wait.h>
+#include "platform/linux/base/pidfd.h"
 
 #include <algorithm>
 #include <cassert>
@@ -12,6 +12,8 @@
 #include <string>
 #include <utility>
 #include <vector>
+
+#include "platform/linux/extension_host/pidfd.h"
 
 namespace docuvend::linux_platform {
 namespace {
@@ -150,7 +152,7 @@ std::variant<SpawnedProcess, QXError> ProcessSpawner::spawn(LaunchPlan plan, con
                                 pointers(plan.arguments).data(), pointers(plan.environment).data());
   if (error != 0) return QXError::system(error, plan.arguments.front() + " could not be executed");
   // The number cannot be another's: nobody has reaped the process yet.
-  process.descriptor.reset(pidfd_open(process.number, 0));
+  process.descriptor = openPidfd(process.number);
   if (!process.descriptor) {
     const int openError = errno;
     kill(process.number, SIGKILL);

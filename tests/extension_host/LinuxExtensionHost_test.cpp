@@ -1,0 +1,400 @@
+#include "platform/linux/extension_host/LinuxExtensionHost.h"
+
+#include <gtest/gtest.h>
+#include <poll.h>
+#include <unistd.h>
+
+#include <atomic>
+#include <chrono>
+#include <filesystem>
+#include <fstream>
+#include <iterator>
+#include <memory>
+#include <string>
+#include <thread>
+
+#include "platform/linux/base/UniqueDescriptor.h"
+#include "platform/linux/extension_host/ExtensionErrors.h"
+#include "platform/linux/extension_host/pidfd.h"
+#include "tests/extension_host/RealExtensions.h"
+
+namespace docuvend::linux_platform {
+namespace {
+
+using std::chrono::milliseconds;
+
+class LinuxExtensionHostTest : public ::testing::Test {
+ protected:
+  void SetUp() override {
+    if (!RealExtensions::mayRun()) GTEST_FAIL();
+  }
+
+  static ExtensionTimes times(milliseconds linger, milliseconds answerLimit = milliseconds(10'000)) {
+    ExtensionTimes result;
+    result.linger = linger;
+    result.answerLimit = answerLimit;
+    return result;
+  }
+  static void release(const RealExtensions& real, const std::string& identifier = "com.orvane.test") {
+    std::ofstream(real.home() + "/containers/" + identifier + "/release") << "now";
+  }
+};
+
+bool isOfKind(const std::optional<QXError>& error, ExtensionHostErrorCode code) {
+  return error && error->domain == kExtensionHostErrorDomain && error->code == static_cast<std::int64_t>(code);
+}
+
+// True as soon as no process has the directory in its command line any more.
+bool nobodyRuns(const std::string& directory) {
+  const auto deadline = std::chrono::steady_clock::now() + kPatience;
+  bool isFound = true;
+  while (isFound && std::chrono::steady_clock::now() < deadline) {
+    isFound = false;
+    for (const auto& entry : std::filesystem::directory_iterator("/proc")) {
+      std::ifstream file(entry.path() / "cmdline");
+      const std::string line((std::istreambuf_iterator<char>(file)), std::istreambuf_iterator<char>());
+      isFound = isFound || line.find(directory) != std::string::npos;
+    }
+  }
+  return !isFound;
+}
+
+TEST_F(LinuxExtensionHostTest, OnlyBundlesOfThePointAreExtensions) {
+  RealExtensions real;
+  Bundle other = real.makeBundle("com.orvane.other");
+  other.info = {{"QXExtension", QXDictionary{{std::string(kQXExtensionPointName), "com.orvane.other-point"}}}};
+  Bundle application = real.makeBundle("com.orvane.application");
+  application.info.clear();
+  const auto set = real.extensions({application, other, real.makeBundle("com.orvane.test")});
+  ASSERT_EQ(set.size(), 1U);
+  EXPECT_EQ(set.front()->identifier(), "com.orvane.test");
+  EXPECT_EQ(set.front()->description(), "<QXExtension com.orvane.test>");
+}
+
+TEST_F(LinuxExtensionHostTest, AnUnchangedExtensionIsTheSameObject) {
+  RealExtensions real;
+  Reports reports;
+  real.install({real.makeBundle("com.orvane.a")});
+  const auto match = real.match(reports);
+  const auto before = reports.await(0);
+  real.install({real.makeBundle("com.orvane.a"), real.makeBundle("com.orvane.b")});
+  const auto after = reports.await(1);
+  ASSERT_TRUE(before && after);
+  EXPECT_EQ(before->front(), after->front());
+}
+
+TEST_F(LinuxExtensionHostTest, AChangeThatChangesNothingIsNotReported) {
+  RealExtensions real;
+  Reports reports;
+  real.install({real.makeBundle("com.orvane.a")});
+  const auto match = real.match(reports);
+  ASSERT_TRUE(reports.await(0));
+  Bundle application = real.makeBundle("com.orvane.application");
+  application.info.clear();
+  real.install({real.makeBundle("com.orvane.a"), application});
+  // A match that begins now is looked at in the same pass or in a later one.
+  Reports later;
+  const auto laterMatch = real.match(later);
+  ASSERT_TRUE(later.await(0));
+  EXPECT_EQ(reports.count(), 1U);
+}
+
+TEST_F(LinuxExtensionHostTest, HandlersRunOnAThreadOfTheirOwnAndOneAtATime) {
+  RealExtensions real;
+  const QXRpcInterface host = qxInterfaceOf<_QXDocuvendHostProtocol>();
+  const QXRpcInterface vendor = qxInterfaceOf<_QXDocuvendVendor>();
+  Reports reports;
+  std::atomic<int> inside{0};
+  std::atomic<bool> overlapped{false};
+  std::atomic<bool> onCallersThread{false};
+  const auto handler = [&reports, &inside, &overlapped, &onCallersThread, caller = std::this_thread::get_id()](
+                           Reports::Set set, const std::optional<QXError>&) {
+    if (++inside != 1) overlapped = true;
+    if (std::this_thread::get_id() == caller) onCallersThread = true;
+    std::this_thread::yield();
+    reports.add(std::move(set));
+    --inside;
+  };
+  const auto first = real.host().beginMatching({}, {host, vendor}, handler);
+  const auto second = real.host().beginMatching({}, {host, vendor}, handler);
+  ASSERT_TRUE(reports.await(1));
+  real.install({real.makeBundle("com.orvane.a")});
+  ASSERT_TRUE(reports.await(3));
+  EXPECT_FALSE(overlapped);
+  EXPECT_FALSE(onCallersThread);
+}
+
+TEST_F(LinuxExtensionHostTest, ADroppedMatchIsNotReportedTo) {
+  RealExtensions real;
+  Reports dropped;
+  auto match = real.match(dropped);
+  ASSERT_TRUE(dropped.await(0));
+  match.reset();
+  Reports other;
+  const auto otherMatch = real.match(other);
+  ASSERT_TRUE(other.await(0));
+  real.install({real.makeBundle("com.orvane.a")});
+  ASSERT_TRUE(other.await(1));
+  EXPECT_EQ(dropped.count(), 1U);
+}
+
+TEST_F(LinuxExtensionHostTest, RequestsShareAProcess) {
+  RealExtensions real;
+  const auto extension = real.extension();
+  const Conversation first(extension);
+  const std::string process = first.identifier("process");
+  EXPECT_EQ(Conversation(extension).identifier("process"), process);
+  EXPECT_EQ(first.identifier("process"), process);
+}
+
+TEST_F(LinuxExtensionHostTest, ExtensionsDoNotShareAProcess) {
+  RealExtensions real;
+  const auto set = real.extensions({real.makeBundle("com.orvane.a"), real.makeBundle("com.orvane.b")});
+  ASSERT_EQ(set.size(), 2U);
+  EXPECT_NE(Conversation(set[0]).identifier("process"), Conversation(set[1]).identifier("process"));
+}
+
+TEST_F(LinuxExtensionHostTest, AProcessHasItsOutputsAndItsSocketAndNoOtherDescriptor) {
+  RealExtensions real;
+  EXPECT_EQ(Conversation(real.extension()).identifier("descriptors"), "0 1 2 3");
+}
+
+TEST_F(LinuxExtensionHostTest, AnIdleProcessEndsAfterTheLingerAndTheNextRequestStartsAnother) {
+  RealExtensions real(times(milliseconds(1)));
+  const auto extension = real.extension();
+  const std::string process = Conversation(extension).identifier("process");
+  ASSERT_TRUE(real.awaitLog("[INFO] The process of com.orvane.test exited with status 0."));
+  const Conversation second(extension);
+  EXPECT_FALSE(second.error());
+  EXPECT_NE(second.identifier("process"), process);
+}
+
+TEST_F(LinuxExtensionHostTest, AProcessWithARequestIsNotIdle) {
+  RealExtensions real(times(milliseconds(1)));
+  const auto set = real.extensions({real.makeBundle("com.orvane.a"), real.makeBundle("com.orvane.b")});
+  ASSERT_EQ(set.size(), 2U);
+  const Conversation open(set[0]);
+  const std::string process = open.identifier("process");
+  { const Conversation over(set[0]); }
+  // The other's end shows that time enough has gone by.
+  ASSERT_NE(Conversation(set[1]).identifier("process"), "");
+  ASSERT_TRUE(real.awaitLog("The process of com.orvane.b exited"));
+  EXPECT_EQ(open.identifier("process"), process);
+}
+
+TEST_F(LinuxExtensionHostTest, AProcessThatOutlivesItsConnectionIsEndedBySignal) {
+  ExtensionTimes quick = times(milliseconds(1));
+  quick.endGrace = milliseconds(20);
+  RealExtensions real(quick);
+  const auto extension = real.extension();
+  ASSERT_TRUE(await(Conversation(extension).start("stay")));
+  ASSERT_TRUE(real.awaitLog("[INFO] The process of com.orvane.test was ended by signal "));
+  EXPECT_FALSE(Conversation(extension).error());
+}
+
+TEST_F(LinuxExtensionHostTest, ACrashFailsTheMessagesThatWaitAndForgetsTheRequest) {
+  RealExtensions real;
+  const auto extension = real.extension();
+  const Conversation conversation(extension);
+  auto waiting = conversation.start("wait");
+  const auto crashed = await(conversation.start("crash"));
+  ASSERT_TRUE(crashed && crashed->error);
+  const auto failed = await(std::move(waiting));
+  ASSERT_TRUE(failed);
+  EXPECT_TRUE(failed->error);
+  ASSERT_TRUE(real.awaitLog("[NOTICE] The process of com.orvane.test "));
+  EXPECT_EQ(extension->extensionContextForRequest(conversation.request()), nullptr);
+}
+
+TEST_F(LinuxExtensionHostTest, AfterOneCrashTheVeryNextRequestWorks) {
+  RealExtensions real;
+  const auto extension = real.extension();
+  std::string process;
+  {
+    const Conversation conversation(extension);
+    process = conversation.identifier("process");
+    const auto crashed = await(conversation.start("crash"));
+    ASSERT_TRUE(crashed && crashed->error);
+  }
+  const Conversation next(extension);
+  ASSERT_FALSE(next.error()) << next.error()->description();
+  const std::string other = next.identifier("process");
+  EXPECT_FALSE(other.empty());
+  EXPECT_EQ(other.find_first_not_of("0123456789"), std::string::npos) << other;
+  EXPECT_NE(other, process);
+}
+
+TEST_F(LinuxExtensionHostTest, AMessageToAProcessThatIsGoneFails) {
+  RealExtensions real;
+  const Conversation conversation(real.extension());
+  ASSERT_TRUE(await(conversation.start("leave")));
+  const auto late = await(conversation.identify("process"));
+  ASSERT_TRUE(late);
+  EXPECT_TRUE(late->error);
+}
+
+TEST_F(LinuxExtensionHostTest, AfterTheSecondQuickDeathRequestsFailAtOnce) {
+  ExtensionTimes slow;
+  slow.quickDeath = std::chrono::minutes(10);
+  slow.firstBackOff = std::chrono::minutes(10);
+  RealExtensions real(slow);
+  const auto extension = real.extension();
+  for (int i = 0; i < 2; ++i) ASSERT_TRUE(await(Conversation(extension).start("crash")));
+  const Conversation refused(extension);
+  ASSERT_TRUE(refused.error());
+  EXPECT_TRUE(isOfKind(refused.error(), ExtensionHostErrorCode::backingOff)) << refused.error()->description();
+}
+
+TEST_F(LinuxExtensionHostTest, AfterTheBackOffItIsStartedAgain) {
+  ExtensionTimes quick;
+  quick.quickDeath = std::chrono::minutes(10);
+  quick.firstBackOff = milliseconds(1);
+  RealExtensions real(quick);
+  const auto extension = real.extension();
+  for (int i = 0; i < 2; ++i) ASSERT_TRUE(await(Conversation(extension).start("crash")));
+  const auto deadline = std::chrono::steady_clock::now() + kPatience;
+  std::optional<QXError> error;
+  do {
+    error = Conversation(extension).error();
+  } while (error && std::chrono::steady_clock::now() < deadline);
+  EXPECT_FALSE(error);
+}
+
+TEST_F(LinuxExtensionHostTest, AnIdentifierThatIsNotAnsweredInTimeEndsTheProcess) {
+  RealExtensions real(times(milliseconds(30'000), milliseconds(300)));
+  const auto extension = real.extension();
+  {
+    const Conversation conversation(extension);
+    const auto answer = await(conversation.identify("hang"));
+    ASSERT_TRUE(answer);
+    EXPECT_TRUE(isOfKind(answer->error, ExtensionHostErrorCode::notAnswering)) << (answer->error ? answer->error->description() : "");
+    EXPECT_EQ(extension->extensionContextForRequest(conversation.request()), nullptr);
+  }
+  ASSERT_TRUE(real.awaitLog("did not answer _identifierForItemAtURL:completion: in time."));
+  EXPECT_FALSE(Conversation(extension).error());
+}
+
+TEST_F(LinuxExtensionHostTest, StartingToProvideHasNoTimeLimitAndDelaysNoIdentifier) {
+  RealExtensions real(times(milliseconds(30'000), milliseconds(500)));
+  const auto set = real.extensions({real.makeBundle("com.orvane.a"), real.makeBundle("com.orvane.b")});
+  ASSERT_EQ(set.size(), 2U);
+  const Conversation slow(set[0]);
+  const std::string process = slow.identifier("process");
+  auto started = slow.start("wait");
+  // The other's end shows that the limit has gone by.
+  const auto hung = await(Conversation(set[1]).identify("hang"));
+  ASSERT_TRUE(hung && hung->error);
+  EXPECT_EQ(slow.identifier("process"), process);
+  release(real, "com.orvane.a");
+  const auto answer = await(std::move(started));
+  ASSERT_TRUE(answer);
+  ASSERT_FALSE(answer->error) << answer->error->description();
+  EXPECT_TRUE(answer->values[0].isAbsent());
+}
+
+TEST_F(LinuxExtensionHostTest, WhatAProcessWritesIsLoggedUnderItsName) {
+  RealExtensions real;
+  const Conversation conversation(real.extension());
+  EXPECT_EQ(conversation.identifier("say-good evening"), "said");
+  ASSERT_TRUE(real.awaitLog("[INFO] com.orvane.test: good evening"));
+}
+
+TEST_F(LinuxExtensionHostTest, ARefusalOfTheProviderIsItsAnswer) {
+  RealExtensions real;
+  EXPECT_NE(Conversation(real.extension()).identifier("nothing").find("no such item"), std::string::npos);
+}
+
+TEST_F(LinuxExtensionHostTest, AnAbsentArgumentIsAnErrorOfTheProviderLibrary) {
+  RealExtensions real;
+  const Conversation conversation(real.extension());
+  const auto answer = await(conversation.send("_identifierForItemAtURL:completion:", {QXValue()}));
+  ASSERT_TRUE(answer);
+  ASSERT_FALSE(answer->error);
+  EXPECT_NE(answer->values[0].as<QXError>(), nullptr);
+}
+
+TEST_F(LinuxExtensionHostTest, WithoutAnExecutableARequestFailsWithTheReason) {
+  RealExtensions real;
+  const Bundle bundle = real.makeBundle("com.orvane.test");
+  std::filesystem::remove(bundle.executable);
+  const auto set = real.extensions({bundle});
+  ASSERT_EQ(set.size(), 1U);
+  const Conversation conversation(set.front());
+  ASSERT_TRUE(isOfKind(conversation.error(), ExtensionHostErrorCode::notStarted));
+  ASSERT_TRUE(conversation.error()->underlying);
+  EXPECT_NE(conversation.error()->underlying->description().find(bundle.executable), std::string::npos);
+}
+
+TEST_F(LinuxExtensionHostTest, AnExecutableThatDoesNotServeFailsTheMessages) {
+  RealExtensions real;
+  const Bundle bundle = real.makeBundle("com.orvane.test");
+  std::ofstream(bundle.executable, std::ios::trunc) << "#!/bin/sh\necho nothing to serve\nexit 3\n";
+  const auto set = real.extensions({bundle});
+  ASSERT_EQ(set.size(), 1U);
+  const auto answer = await(Conversation(set.front()).identify("process"));
+  ASSERT_TRUE(answer);
+  EXPECT_TRUE(answer->error);
+  EXPECT_TRUE(real.awaitLog("[INFO] com.orvane.test: nothing to serve"));
+}
+
+TEST_F(LinuxExtensionHostTest, AnUpdatedExtensionsOldProcessEndsWithItsLastRequest) {
+  RealExtensions real;
+  Bundle bundle = real.makeBundle("com.orvane.test");
+  const auto old = real.extension();
+  std::string process;
+  {
+    const Conversation conversation(old);
+    process = conversation.identifier("process");
+    bundle.version = "2";
+    real.install({bundle});
+    EXPECT_EQ(conversation.identifier("process"), process);
+  }
+  EXPECT_TRUE(real.awaitLog("The process of com.orvane.test exited with status 0."));
+}
+
+TEST_F(LinuxExtensionHostTest, NoProcessOutlivesTheHost) {
+  // Ended at once after its start or when it runs: each moment of a start has its own way of leaving something behind.
+  for (const char* moment : {"starting", "running"}) {
+    RealExtensions real;
+    const auto extension = real.extension();
+    const Conversation conversation(extension);
+    ASSERT_FALSE(conversation.error());
+    if (std::string(moment) == "running") {
+      ASSERT_NE(conversation.identifier("process"), "");
+    }
+    const UniqueDescriptor process = openPidfd(conversation.connection()->processIdentifier());
+    ASSERT_TRUE(process);
+    real.dropHost();
+    pollfd ended{process.get(), POLLIN, 0};
+    EXPECT_EQ(poll(&ended, 1, static_cast<int>(milliseconds(kPatience).count())), 1) << moment;
+    EXPECT_TRUE(nobodyRuns(real.home())) << moment;
+    EXPECT_TRUE(Conversation(extension).error()) << moment;
+  }
+}
+
+TEST_F(LinuxExtensionHostTest, WhenTheHostGoesMessagesThatWaitFail) {
+  RealExtensions real;
+  const Conversation conversation(real.extension());
+  auto waiting = conversation.start("wait");
+  ASSERT_NE(conversation.identifier("process"), "");
+  real.dropHost();
+  const auto failed = await(std::move(waiting));
+  ASSERT_TRUE(failed);
+  EXPECT_TRUE(isOfKind(failed->error, ExtensionHostErrorCode::stopped));
+}
+
+TEST_F(LinuxExtensionHostTest, AConnectionAnswersForTheBundle) {
+  RealExtensions real;
+  Bundle bundle = real.makeBundle("com.orvane.test");
+  bundle.entitlements.emplace("com.orvane.right", true);
+  const auto set = real.extensions({bundle});
+  ASSERT_EQ(set.size(), 1U);
+  const Conversation conversation(set.front());
+  ASSERT_FALSE(conversation.error());
+  EXPECT_EQ(conversation.connection()->valueForEntitlement("com.orvane.right"), QXValue(true));
+  EXPECT_FALSE(conversation.connection()->valueForEntitlement("com.orvane.wrong"));
+  EXPECT_EQ(conversation.connection()->auditToken(), QXAuditToken{});
+}
+
+}  // namespace
+}  // namespace docuvend::linux_platform

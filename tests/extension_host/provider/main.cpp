@@ -1,0 +1,100 @@
+// A provider that does what the last component of an item's URL says.
+//
+//   identifierForItem   process      which process this is: a text that differs for each
+//                       descriptors  the numbers of the descriptors that were open at its start
+//                       hang         never answers
+//                       say-TEXT     writes TEXT to both outputs, a line each
+//                       anything     refused
+//   startProviding      crash        abort()
+//                       leave        _exit(7)
+//                       wait         answers when the file "release" lies in its container
+//                       stay         lets the process outlive its connection
+//                       anything     succeeds
+//   itemURL             the URL of a file of that name in its container
+#include <fcntl.h>
+#include <sys/random.h>
+#include <unistd.h>
+
+#include <chrono>
+#include <cstdio>
+#include <cstdlib>
+#include <string>
+#include <thread>
+
+#include "sdk/Provider.h"
+
+namespace docuvend {
+namespace {
+
+constexpr int kHighestDescriptor = 256;
+
+std::string openDescriptors() {
+  std::string result;
+  for (int number = 0; number < kHighestDescriptor; ++number) {
+    if (fcntl(number, F_GETFD) >= 0) result += (result.empty() ? "" : " ") + std::to_string(number);
+  }
+  return result;
+}
+
+std::string randomText() {
+  unsigned long number = 0;
+  if (getrandom(&number, sizeof number, 0) != sizeof number) std::abort();
+  return std::to_string(number);
+}
+
+[[noreturn]] void waitForever() {
+  for (;;) pause();
+}
+
+class TestProvider : public Provider {
+ public:
+  [[nodiscard]] Failure performInitialSetup() override { return std::nullopt; }
+  [[nodiscard]] Failure providePlaceholder(const QXURL&) override { return std::nullopt; }
+
+  [[nodiscard]] Failure startProviding(const QXURL& url) override {
+    const std::string what = command(url);
+    if (what == "crash") std::abort();
+    if (what == "leave") _exit(7);
+    if (what == "stay") std::atexit([] { waitForever(); });
+    while (what == "wait" && access("release", F_OK) != 0) std::this_thread::sleep_for(std::chrono::milliseconds(1));
+    return std::nullopt;
+  }
+
+  [[nodiscard]] Failure itemChanged(const QXURL&) override { return std::nullopt; }
+  [[nodiscard]] Failure stopProviding(const QXURL&) override { return std::nullopt; }
+
+  [[nodiscard]] Result<ItemID> identifierForItem(const QXURL& url) override {
+    const std::string what = command(url);
+    if (what == "process") return ItemID{process_};
+    if (what == "descriptors") return ItemID{descriptors_};
+    if (what == "hang") waitForever();
+    if (what.starts_with("say-")) {
+      std::fprintf(stderr, "%s\n", what.c_str() + 4);
+      std::printf("%s\n", what.c_str() + 4);
+      std::fflush(stdout);
+      return ItemID{"said"};
+    }
+    return QXError::make("TestProvider", 1, "no such item");
+  }
+
+  [[nodiscard]] Result<QXURL> itemURL(const ItemID& identifier) override {
+    return QXURL::fileURL(providerContainer().value_or("") + "/" + identifier.value, QXURLKind::file);
+  }
+
+ private:
+  static std::string command(const QXURL& url) {
+    const std::string path = url.fileSystemPath();
+    return path.substr(path.rfind('/') + 1);
+  }
+
+  const std::string descriptors_ = openDescriptors();
+  const std::string process_ = randomText();
+};
+
+}  // namespace
+}  // namespace docuvend
+
+int main() {
+  docuvend::TestProvider provider;
+  return docuvend::runProvider(provider);
+}
