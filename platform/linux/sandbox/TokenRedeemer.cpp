@@ -30,9 +30,7 @@ int accessMode(TokenUse use) { return use == TokenUse::writing ? O_RDWR : O_RDON
 // The item's name, for the name of a hidden sibling.
 std::optional<std::string> itemNameOf(const std::string& siblingName) {
   if (siblingName.size() < 2 || siblingName[0] != '.') return std::nullopt;
-  std::string name = siblingName.substr(1);
-  if (name == "." || name == "..") return std::nullopt;
-  return name;
+  return siblingName.substr(1);
 }
 
 // Opens the object itself and makes sure that it is still a regular file with one link.
