@@ -289,6 +289,7 @@ TEST(LinuxQueues, ABarrierIsAloneUnderLoad) {
   const auto queue = queues.concurrentQueue("concurrent");
   const auto read = [&] {
     ++readers;
+    std::this_thread::yield();
     violations += writers;
     --readers;
     ++ran;
@@ -296,6 +297,7 @@ TEST(LinuxQueues, ABarrierIsAloneUnderLoad) {
   const auto write = [&] {
     violations += writers++ + readers;
     ++guarded;
+    std::this_thread::yield();
     violations += readers;
     --writers;
     ++ran;
@@ -409,6 +411,29 @@ TEST(LinuxQueues, SuspendHoldsBackATaskThatWasLetInButNotBegun) {
   EXPECT_THAT(arrivals.names(), IsEmpty());
   queue->resume();
   ASSERT_TRUE(arrivals.waitFor(1));
+}
+
+TEST(LinuxQueues, ASyncThatWaitsForAResumeIsNotLetInByWhatIsSubmittedMeanwhile) {
+  for (int round = 0; round < 50; ++round) {
+    Arrivals waiting;
+    Arrivals finished;
+    LinuxQueues queues({1, 2});
+    const auto queue = queues.concurrentQueue("concurrent");
+    queue->suspend();
+    std::thread reader([&] {
+      waiting.arrive("");
+      queue->sync([&] { finished.arrive("sync"); });
+    });
+    ASSERT_TRUE(waiting.waitFor(1));
+    for (int i = 0; i < 20; ++i) {
+      queue->async([] {});
+      std::this_thread::yield();
+    }
+    EXPECT_THAT(finished.names(), IsEmpty());
+    queue->resume();
+    reader.join();
+    EXPECT_THAT(finished.names(), ElementsAre("sync"));
+  }
 }
 
 TEST(LinuxQueues, NothingIsPerformedBeforeTheMainRunLoopRuns) {

@@ -142,6 +142,18 @@ TYPED_TEST(QueueBehaviour, ABarrierRunsAfterWhatStandsBeforeItAndBeforeWhatStand
   }
 }
 
+TYPED_TEST(QueueBehaviour, ABarrierWaitsForTheReaderThatRuns) {
+  const auto queue = this->queues().concurrentQueue("concurrent");
+  queue->sync([this, queue] {
+    queue->barrierAsync(this->arrival("barrier"));
+    queue->async(this->arrival("behind"));
+    this->roundTrip();
+    EXPECT_THAT(this->arrivals.names(), IsEmpty());
+  });
+  this->settle(2);
+  EXPECT_THAT(this->arrivals.names(), ElementsAre("barrier", "behind"));
+}
+
 TYPED_TEST(QueueBehaviour, ASuspendedQueueRunsNothingUntilItIsResumed) {
   for (const auto& queue : {this->queues().serialQueue("serial"), this->queues().concurrentQueue("concurrent")}) {
     const std::size_t before = this->arrivals.names().size();
@@ -416,6 +428,18 @@ TYPED_TEST(QueueBehaviour, WhatATaskHeldIsReleasedBeforeTheNextTaskOfASerialQueu
     queue->async([held = std::move(held)] { ++*held; });
     EXPECT_TRUE(qxSync(*queue, [&weak] { return weak.expired(); }));
   }
+}
+
+TYPED_TEST(QueueBehaviour, WhatATaskHeldIsReleasedAsPartOfTheTask) {
+  const auto queue = this->queues().serialQueue("serial");
+  const auto release = [this, queue](int*) {
+    this->arrivals.arrive(queue->isCurrent() ? "released on the queue" : "released elsewhere");
+    queue->async(this->arrival("submitted by the release"));
+  };
+  static int thing = 0;
+  queue->async([held = std::shared_ptr<int>(&thing, release)] { ++*held; });
+  this->settle(2);
+  EXPECT_THAT(this->arrivals.names(), ElementsAre("released on the queue", "submitted by the release"));
 }
 
 TYPED_TEST(QueueBehaviour, TasksThatNeverRunAreDestroyedWithTheService) {
