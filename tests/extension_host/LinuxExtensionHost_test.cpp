@@ -16,7 +16,7 @@
 #include "platform/linux/base/UniqueDescriptor.h"
 #include "platform/linux/extension_host/ExtensionErrors.h"
 #include "platform/linux/extension_host/pidfd.h"
-#include "tests/extension_host/RealExtensions.h"
+#include "tests/extension_host/support/RealExtensions.h"
 
 namespace docuvend::linux_platform {
 namespace {

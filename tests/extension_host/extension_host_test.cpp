@@ -10,7 +10,7 @@
 #include <vector>
 
 #include "platform/fake/FakeExtensionHost.h"
-#include "tests/extension_host/RealExtensions.h"
+#include "tests/extension_host/support/RealExtensions.h"
 
 namespace docuvend {
 namespace {

@@ -1,4 +1,4 @@
-#include "tests/extension_host/RealExtensions.h"
+#include "tests/extension_host/support/RealExtensions.h"
 
 #include <sys/stat.h>
 #include <unistd.h>
