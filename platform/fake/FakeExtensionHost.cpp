@@ -76,6 +76,13 @@ void FakeVendor::failDelivery(std::size_t message, const QXError& error) {
   if (handler) handler(error);
 }
 
+void FakeVendor::forget() {
+  // What is let go may call back into here while it is destroyed.
+  const auto messages = std::exchange(messages_, {});
+  const auto proxies = std::exchange(proxies_, {});
+  const auto responders = std::exchange(responders_, {});
+}
+
 std::shared_ptr<QXRpcConnection> FakeVendor::connection() { return std::make_shared<VendorConnection>(shared_from_this()); }
 
 void FakeVendor::send(QXErrorHandler errorHandler, const QXRpcOperation& operation, QXArray arguments, QXRpcReply reply) {

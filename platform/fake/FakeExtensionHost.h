@@ -49,6 +49,9 @@ class FakeVendor : public std::enable_shared_from_this<FakeVendor> {
   void failDelivery(std::size_t message, const QXError& error);
   void failLastDelivery(const QXError& error) { failDelivery(messages_.size() - 1, error); }
 
+  // Lets go of all messages, proxies and responders. Their handlers may own the extension, and so this.
+  void forget();
+
   // For FakeExtension.
   [[nodiscard]] std::shared_ptr<QXRpcConnection> connection();
   void send(QXErrorHandler errorHandler, const QXRpcOperation& operation, QXArray arguments, QXRpcReply reply);

@@ -31,7 +31,9 @@ using Extensions = std::vector<std::shared_ptr<QXExtension>>;
 class TracingExtension : public FakeExtension {
  public:
   TracingExtension(FakePlatform& platform, std::optional<std::string> identifier, int version)
-      : FakeExtension(std::move(identifier), version), platform_(platform) {}
+      : FakeExtension(std::move(identifier), version), platform_(platform) {
+    platform.adopt(*this);
+  }
 
   [[nodiscard]] std::optional<std::string> identifier() const override {
     if (onIdentifier) onIdentifier();

@@ -8,6 +8,7 @@
 #include <memory>
 #include <string>
 #include <string_view>
+#include <vector>
 
 #include "platform/QXPlatform.h"
 #include "platform/fake/FakeApplicationRegistry.h"
@@ -25,10 +26,15 @@
 namespace docuvend::fake_platform {
 
 template <class Queues>
-struct FakePlatformOver {
+class FakePlatformOver {
+ public:
   FakePlatformOver() {
     QXPlatform::install({queues, log, rpc, applicationRegistry, sandbox, extensionHost, fileCoordinator, deviceLock, notificationCenter,
                          fileSystem, propertyLists});
+  }
+  // Conversations that the test left open own their extension, and are owned by it.
+  ~FakePlatformOver() {
+    for (const auto& vendor : vendors_) vendor->forget();
   }
   FakePlatformOver(const FakePlatformOver&) = delete;
   FakePlatformOver& operator=(const FakePlatformOver&) = delete;
@@ -43,9 +49,12 @@ struct FakePlatformOver {
   std::shared_ptr<FakeExtension> installProvider(const std::string& identifier, int version = 1) {
     installProviderBundle(identifier);
     auto extension = std::make_shared<FakeExtension>(identifier, version);
+    adopt(*extension);
     succeedSetup(*extension);
     return extension;
   }
+  // Of an extension that was made elsewhere: what its conversations own is let go with the platform.
+  void adopt(FakeExtension& extension) { vendors_.push_back(extension.vendor().shared_from_this()); }
   static void succeedSetup(FakeExtension& extension) {
     extension.vendor().respond("_performInitialSetupWithCompletion:", [](const QXArray&) {
       return QXArray{QXValue(), QXValue(), QXValue()};
@@ -73,6 +82,9 @@ struct FakePlatformOver {
   FakeNotificationCenter notificationCenter{queues.mainRunLoop()};
   FakeFileSystem fileSystem;
   FakePropertyLists propertyLists{fileSystem};
+
+ private:
+  std::vector<std::shared_ptr<FakeVendor>> vendors_;
 };
 
 using FakePlatform = FakePlatformOver<FakeQueues>;
