@@ -112,8 +112,8 @@ TEST_F(LinuxExtensionHostTest, HandlersRunOnAThreadOfTheirOwnAndOneAtATime) {
     if (++inside != 1) overlapped = true;
     if (std::this_thread::get_id() == caller) onCallersThread = true;
     std::this_thread::yield();
-    reports.add(std::move(set));
     --inside;
+    reports.add(std::move(set));
   };
   const auto first = real.host().beginMatching({}, {host, vendor}, handler);
   const auto second = real.host().beginMatching({}, {host, vendor}, handler);

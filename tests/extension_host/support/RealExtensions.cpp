@@ -40,10 +40,9 @@ void InstalledByTest::set(std::vector<Bundle> bundles) {
 }
 
 void Reports::add(Set set) {
-  {
-    const std::lock_guard lock(mutex_);
-    sets_.push_back(std::move(set));
-  }
+  const std::lock_guard lock(mutex_);
+  sets_.push_back(std::move(set));
+  // With the lock: whoever waits may let go of this object as soon as it can take it.
   changed_.notify_all();
 }
 
