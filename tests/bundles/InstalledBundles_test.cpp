@@ -22,6 +22,10 @@ class Changes {
     ++count_;
     changed_.notify_all();
   }
+  [[nodiscard]] int count() {
+    const std::lock_guard lock(mutex_);
+    return count_;
+  }
   // Waits until the condition holds, looking after each change.
   template <class Condition>
   [[nodiscard]] bool waitFor(Condition condition) {
@@ -105,6 +109,27 @@ TEST_F(InstalledBundlesTest, NoticesARemovalAndAnUpdate) {
   }));
 }
 
+TEST_F(InstalledBundlesTest, NoticesAnUpdateOfABundleThatCameLater) {
+  std::filesystem::create_directories(house_.paths.userBundles);
+  start();
+  BundleHouse::install(user(".a"), "org.a");
+  std::filesystem::rename(user(".a"), user("a"));
+  ASSERT_TRUE(appears("org.a"));
+  BundleHouse::write(user("a") + "/Entitlements.plist", BundleHouse::propertyList("<key>right</key><true/>"));
+  EXPECT_TRUE(changes_.waitFor([this] { return !bundles_->find("org.a")->entitlements.empty(); }));
+}
+
+TEST_F(InstalledBundlesTest, CallsNobodyForWhatChangesNoBundle) {
+  std::filesystem::create_directories(house_.paths.userBundles);
+  start();
+  BundleHouse::write(user("README"), "x");
+  BundleHouse::install(user(".a"), "org.a");
+  std::filesystem::rename(user(".a"), user("a"));
+  ASSERT_TRUE(appears("org.a"));
+  bundles_.reset();
+  EXPECT_EQ(changes_.count(), 1);
+}
+
 TEST_F(InstalledBundlesTest, NoticesThatItsDirectoryIsReplaced) {
   BundleHouse::install(user("a"), "org.a");
   start();
@@ -117,11 +142,13 @@ TEST_F(InstalledBundlesTest, NoticesThatItsDirectoryIsReplaced) {
 TEST_F(InstalledBundlesTest, AnUpdateOfTheOwnerUpdatesItsGroupsMembers) {
   BundleHouse::install(user("member"), "org.member", BundleHouse::entry("QXGroups", BundleHouse::array({"org.owner.docs"})));
   start();
-  EXPECT_TRUE(bundles_->find("org.member")->groups.empty());
+  const auto before = bundles_->find("org.member");
+  EXPECT_TRUE(before->groups.empty());
   BundleHouse::install(
       user("owner"), "org.owner",
       BundleHouse::entry("QXGroupMembers", "<dict><key>org.owner.docs</key>" + BundleHouse::array({"org.member"}) + "</dict>"));
   EXPECT_TRUE(changes_.waitFor([this] { return bundles_->find("org.member")->groups.size() == 1; }));
+  EXPECT_NE(bundles_->find("org.member")->version, before->version);
 }
 
 }  // namespace

@@ -25,7 +25,9 @@ struct Bundle {
   QXDictionary entitlements;                               // empty when there is no Entitlements.plist
   std::map<std::string, std::string, std::less<>> groups;  // groups that it belongs to: group to absolute container directory
   std::string container;                                   // its own container directory, absolute
-  std::string version;  // differs after every installation or update of the bundle (directory's device, inode and change times)
+  // Differs after every installation or update of the bundle, and when it has come to belong to other groups (device, inode and change
+  // times of the directory and its files, and the groups' names).
+  std::string version;
 };
 
 // What is installed. May be used from any thread.

@@ -87,7 +87,7 @@ BundleMap BundleScan::resolve() {
     bundle.container = containers + "/" + bundle.identifier;
     for (const auto& group : parsed.wantedGroups) {
       if (mayBelongToGroup(bundle.identifier, group, found_)) {
-        bundle.groups.insert_or_assign(group, groupContainers + "/" + group);
+        if (bundle.groups.try_emplace(group, groupContainers + "/" + group).second) bundle.version += "/" + group;
       } else {
         report("[ERROR] The bundle " + bundle.identifier + " may not belong to the group " + group + ".");
       }

@@ -19,9 +19,7 @@ constexpr int kQuietMilliseconds = 20;
 constexpr int kMostWatchTries = 4;
 constexpr std::chrono::milliseconds kLongestSettling{500};
 
-bool isSame(const Bundle& one, const Bundle& other) {
-  return one.version == other.version && one.directory == other.directory && one.groups == other.groups;
-}
+bool isSame(const Bundle& one, const Bundle& other) { return one.version == other.version && one.directory == other.directory; }
 
 bool areSame(const BundleMap& one, const BundleMap& other) {
   return std::equal(one.begin(), one.end(), other.begin(), other.end(),

@@ -27,7 +27,6 @@ class InstalledBundles final : public BundleRegistry {
 
   [[nodiscard]] std::optional<Bundle> find(const std::string& identifier) override;
   [[nodiscard]] std::vector<Bundle> all() override;
-  // A bundle whose groups changed with another bundle counts as updated.
   void onChange(std::function<void()> callback) override;
 
  private:
