@@ -1,0 +1,93 @@
+// A provider that does what the name of an item says, and takes any name below its storage for an item.
+//
+//   identifierForItem  control   an identifier with the character U+0001
+//                      refused   an error
+//                      garbage   bytes that are no frame, to the daemon
+//                      abort     abort()
+//                      anything  the name
+//   startProviding     stuck     says so, and waits until the file "free" lies in its container
+//                      anything  succeeds
+//   itemURL            outside   a file of the system
+//                      cellar    a file where another provider has its documents
+//                      storage   the storage itself
+//                      refused   an error
+//                      anything  the file of that name
+#include <sys/socket.h>
+#include <unistd.h>
+
+#include <array>
+#include <chrono>
+#include <cstdio>
+#include <cstdlib>
+#include <filesystem>
+#include <string>
+#include <thread>
+
+#include "sdk/Provider.h"
+
+namespace docuvend {
+namespace {
+
+constexpr int kDaemonSocket = 3;
+
+QXError refusal() { return QXError::make("TricksterErrorDomain", 1, "No."); }
+
+std::string storage(const std::string& group = "com.orvane.trickster.documents") {
+  return providerGroupContainer(group).value_or("") + "/Docuvend Storage";
+}
+
+std::string nameOf(const QXURL& url) {
+  const std::string path = url.fileSystemPath();
+  return path.substr(path.rfind('/') + 1);
+}
+
+class Trickster : public Provider {
+ public:
+  [[nodiscard]] Failure performInitialSetup() override {
+    std::error_code error;
+    std::filesystem::create_directory(storage(), error);
+    if (error) return QXError::system(error.value(), "cannot make the storage");
+    return std::nullopt;
+  }
+  [[nodiscard]] Failure providePlaceholder(const QXURL&) override { return std::nullopt; }
+
+  [[nodiscard]] Failure startProviding(const QXURL& url) override {
+    if (nameOf(url) != "stuck") return std::nullopt;
+    std::fputs("is stuck\n", stderr);
+    while (access("free", F_OK) != 0) std::this_thread::sleep_for(std::chrono::milliseconds(1));
+    return std::nullopt;
+  }
+
+  [[nodiscard]] Failure itemChanged(const QXURL&) override { return std::nullopt; }
+  [[nodiscard]] Failure stopProviding(const QXURL&) override { return std::nullopt; }
+
+  [[nodiscard]] Result<ItemID> identifierForItem(const QXURL& url) override {
+    const std::string name = nameOf(url);
+    if (name == "control") return ItemID{"one\x01two"};
+    if (name == "refused") return refusal();
+    if (name == "abort") std::abort();
+    if (name == "garbage") {
+      std::array<unsigned char, 64> bytes{};
+      bytes.fill(0xff);
+      if (send(kDaemonSocket, bytes.data(), bytes.size(), MSG_NOSIGNAL) < 0) std::abort();
+    }
+    return ItemID{name};
+  }
+
+  [[nodiscard]] Result<QXURL> itemURL(const ItemID& identifier) override {
+    const std::string& name = identifier.value;
+    if (name == "refused") return refusal();
+    if (name == "outside") return QXURL::fileURL("/etc/passwd", QXURLKind::file);
+    if (name == "cellar") return QXURL::fileURL(storage("com.orvane.cellar.documents") + "/letter.txt", QXURLKind::file);
+    if (name == "storage") return QXURL::fileURL(storage(), QXURLKind::directory);
+    return QXURL::fileURL(storage() + "/" + name, QXURLKind::file);
+  }
+};
+
+}  // namespace
+}  // namespace docuvend
+
+int main() {
+  docuvend::Trickster provider;
+  return docuvend::runProvider(provider);
+}
