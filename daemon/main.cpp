@@ -17,10 +17,12 @@ int main(int, char** arguments) {
     std::cerr << "docuvendd: " << error->description() << "\n";
     return EXIT_FAILURE;
   }
-  QXPlatform::install(std::get<std::unique_ptr<linux_platform::LinuxPlatform>>(created)->seam());
+  auto& platform = *std::get<std::unique_ptr<linux_platform::LinuxPlatform>>(created);
+  QXPlatform::install(platform.seam());
 
   dvLog("[NOTICE] %s starting.", arguments[0]);
   dvLog("[DEBUG] Debug logging enabled.");
+  platform.publishServices();
   const auto server = std::make_shared<DVServer>();
   server->setAccessControlStore(DVAccessControlStore::sharedStore());
   server->startCompletion(/*completion=*/{});

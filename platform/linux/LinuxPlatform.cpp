@@ -83,22 +83,19 @@ struct LinuxPlatform::Services {
   LinuxExtensionHost extensionHost{bundles, paths, reactor, log.defaultLog()};
   LinuxFileCoordinator fileCoordinator{fileSystem};
 
+  std::unique_ptr<LinuxSandbox> sandbox;  // made in `create`, never null after it
+
   // Made in `publish`.
-  std::unique_ptr<LinuxSandbox> sandbox;
   std::shared_ptr<SandboxListenerDelegate> sandboxDelegate;
   std::shared_ptr<FileCoordinationListenerDelegate> coordinationDelegate;
   std::shared_ptr<QXRpcListener> sandboxListener;
   std::shared_ptr<QXRpcListener> coordinationListener;
 
-  [[nodiscard]] std::optional<QXError> publish() {
-    auto made = LinuxSandbox::create(paths, bundles, peers);
-    if (auto* error = std::get_if<QXError>(&made)) return *error;
-    sandbox = std::get<std::unique_ptr<LinuxSandbox>>(std::move(made));
+  void publish() {
     sandboxDelegate = std::make_shared<SandboxListenerDelegate>(*sandbox, log.defaultLog());
     coordinationDelegate = std::make_shared<FileCoordinationListenerDelegate>(fileCoordinator, *sandbox);
     sandboxListener = listen(kSandboxServiceName, sandboxDelegate);
     coordinationListener = listen(kFileCoordinationServiceName, coordinationDelegate);
-    return std::nullopt;
   }
 
   void logProtections() {
@@ -128,13 +125,19 @@ std::variant<std::unique_ptr<LinuxPlatform>, QXError> LinuxPlatform::create() {
   if (auto* error = std::get_if<QXError>(&lock)) return *error;
 
   auto services = std::make_unique<Services>(std::move(paths), std::get<UniqueDescriptor>(std::move(lock)));
-  services->logProtections();
-  if (auto error = services->publish()) return *error;
+  auto sandbox = LinuxSandbox::create(services->paths, services->bundles, services->peers);
+  if (auto* error = std::get_if<QXError>(&sandbox)) return *error;
+  services->sandbox = std::get<std::unique_ptr<LinuxSandbox>>(std::move(sandbox));
   return std::unique_ptr<LinuxPlatform>(new LinuxPlatform(std::move(services)));
 }
 
 LinuxPlatform::LinuxPlatform(std::unique_ptr<Services> services) : services_(std::move(services)) {}
 LinuxPlatform::~LinuxPlatform() = default;
+
+void LinuxPlatform::publishServices() {
+  services_->logProtections();
+  services_->publish();
+}
 
 QXPlatform LinuxPlatform::seam() {
   Services& all = *services_;

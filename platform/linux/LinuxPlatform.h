@@ -1,7 +1,6 @@
 // All services of this system on Linux, put together.
 //
-// Besides what the daemon asks of the platform, this publishes the two services that the platform itself offers to processes:
-// "com.orvane.Sandbox" and "com.orvane.FileCoordination". One process of a user holds the platform at a time.
+// One process of a user holds the platform at a time.
 #pragma once
 
 #include <memory>
@@ -14,14 +13,17 @@ namespace docuvend::linux_platform {
 
 class LinuxPlatform {
  public:
-  // Fails, with one clear error, for root, without HOME or XDG_RUNTIME_DIR, and while another process holds the platform. Says in the log
-  // which protections this kernel gives.
+  // Fails, with one clear error, for root, without HOME or XDG_RUNTIME_DIR, and while another process holds the platform.
   [[nodiscard]] static std::variant<std::unique_ptr<LinuxPlatform>, QXError> create();
   ~LinuxPlatform();
   LinuxPlatform(const LinuxPlatform&) = delete;
   LinuxPlatform& operator=(const LinuxPlatform&) = delete;
 
   [[nodiscard]] QXPlatform seam();
+
+  // Says in the log which protections this kernel gives, and opens the two services that the platform itself offers to processes:
+  // "com.orvane.Sandbox" and "com.orvane.FileCoordination". Called once.
+  void publishServices();
 
  private:
   struct Services;
