@@ -43,11 +43,17 @@ const std::string& accessControlFilePath() {
 }
 
 // What a reader made of the file: the tree if it holds one, and the error to report, the reader's own before ours.
-std::pair<std::optional<DVGrantTree>, std::optional<QXError>> interpreted(QXPropertyLists::ReadResult result) {
+struct Interpretation {
+  std::optional<DVGrantTree> tree;
+  std::optional<QXError> error;
+  bool isMisshapen = false;
+};
+
+Interpretation interpreted(QXPropertyLists::ReadResult result) {
   if (!result.value) return {std::nullopt, std::move(result.error)};
   auto tree = DVGrantTree::fromPropertyList(*std::move(result.value));
   if (auto* problem = std::get_if<QXError>(&tree)) {
-    return {std::nullopt, result.error ? std::move(result.error) : std::optional(std::move(*problem))};
+    return {std::nullopt, result.error ? std::move(result.error) : std::optional(std::move(*problem)), /*isMisshapen=*/true};
   }
   return {std::get<DVGrantTree>(std::move(tree)), std::move(result.error)};
 }
@@ -113,8 +119,9 @@ void DVAccessControlStore::syncQueueReadAccessControl() {
   QXPropertyLists& propertyLists = QXPlatform::current().propertyLists;
   if (QXPlatform::current().fileSystem.exists(accessControlFilePath())) {
     if (const auto stream = propertyLists.openStream(accessControlFilePath())) {
-      auto [tree, error] = interpreted(propertyLists.read(*stream));
+      auto [tree, error, isMisshapen] = interpreted(propertyLists.read(*stream));
       syncQueueAccessControlDict_ = std::move(tree);
+      syncQueueFileIsMisshapen_ = isMisshapen;
       if (error) {
         dvLog("[ERROR] Cannot read access control from disk. Error: %@", *error);
       } else {
@@ -128,7 +135,11 @@ void DVAccessControlStore::syncQueueReadAccessControl() {
 void DVAccessControlStore::syncQueueCommitAccessControl() {
   assert(syncQueue_->isCurrent());
   dvLog("[INFO] Committing access control list");
-  if (!QXPlatform::current().propertyLists.writeXMLAtomically(syncQueueAccessControlDict_->dictionary(), accessControlFilePath())) {
+  QXPropertyLists& propertyLists = QXPlatform::current().propertyLists;
+  const bool isSafe = !syncQueueFileIsMisshapen_ || propertyLists.keepBeside(accessControlFilePath());
+  if (isSafe && propertyLists.writeXMLAtomically(syncQueueAccessControlDict_->dictionary(), accessControlFilePath())) {
+    syncQueueFileIsMisshapen_ = false;
+  } else {
     dvLog("[ERROR] Could not write to %@", accessControlFilePath());
   }
 }

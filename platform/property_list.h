@@ -31,6 +31,8 @@ class QXPropertyLists {
   // Writes the XML encoding so that a reader sees the old file or the new one, and the new one is on disk when this returns. A file
   // that could not be read as a property list is kept beside under another name before it is first overwritten. False: not written.
   [[nodiscard]] virtual bool writeXMLAtomically(const QXDictionary& dictionary, const std::string& path) = 0;
+  // Keeps the file beside under another name as well, for a caller that can read it and make nothing of it. False: it has no other name.
+  [[nodiscard]] virtual bool keepBeside(const std::string& path) = 0;
 };
 
 }  // namespace docuvend

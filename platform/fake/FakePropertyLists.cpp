@@ -139,11 +139,22 @@ bool FakePropertyLists::canWrite(const QXDictionary& dictionary, const std::stri
 void FakePropertyLists::keepUnreadable(const std::string& path) {
   if (!fileSystem_.isFile(path)) return;
   const auto found = contents_.find(path);
-  if (found != contents_.end() && !found->second.result.error) return;
+  if (found == contents_.end() || found->second.result.error) keep(path);
+}
+
+bool FakePropertyLists::keepBeside(const std::string& path) {
+  const std::lock_guard lock(mutex_);
+  return keep(path);
+}
+
+bool FakePropertyLists::keep(const std::string& path) {
+  if (!fileSystem_.isFile(path)) return false;
+  const auto found = contents_.find(path);
   int number = 1;
   while (fileSystem_.isFile(path + ".unreadable-" + std::to_string(number))) ++number;
   Content kept = found == contents_.end() ? Content{/*hasStream=*/true, notAPropertyList()} : found->second;
   setContent(path + ".unreadable-" + std::to_string(number), std::move(kept));
+  return true;
 }
 
 }  // namespace docuvend::fake_platform

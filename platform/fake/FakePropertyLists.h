@@ -38,6 +38,7 @@ class FakePropertyLists : public QXPropertyLists {
   std::unique_ptr<std::istream> openStream(const std::string& path) override;
   ReadResult read(std::istream& stream) override;
   bool writeXMLAtomically(const QXDictionary& dictionary, const std::string& path) override;
+  bool keepBeside(const std::string& path) override;
 
   // What reading the file yields from now on; each puts the file there.
   void setValue(const std::string& path, QXValue value);
@@ -63,6 +64,7 @@ class FakePropertyLists : public QXPropertyLists {
   void setContent(const std::string& path, Content content);
   [[nodiscard]] bool canWrite(const QXDictionary& dictionary, const std::string& path);
   void keepUnreadable(const std::string& path);
+  bool keep(const std::string& path);
 
   FakeFileSystem& fileSystem_;
 

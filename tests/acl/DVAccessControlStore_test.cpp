@@ -146,6 +146,16 @@ TEST_F(DVAccessControlStoreTest, ACorruptFileIsLoggedAndLeftAloneByReading) {
   EXPECT_TRUE(platform_.propertyLists.writes().empty());
 }
 
+TEST_F(DVAccessControlStoreTest, AFileOfAnotherShapeIsKeptBesideBeforeItIsReplaced) {
+  const QXDictionary misshapen{{"com.orvane.cellar", QXDictionary{{"com.example.editor", 1}}}};
+  platform_.propertyLists.setValue(kFile, misshapen);
+  grant(kReport);
+  EXPECT_EQ(platform_.propertyLists.value(kFile), QXValue(listOf(kCellar, kEditor, {"report"})));
+  EXPECT_EQ(platform_.propertyLists.value(std::string(kFile) + ".unreadable-1"), QXValue(misshapen));
+  grant(kLetter);
+  EXPECT_FALSE(platform_.propertyLists.value(std::string(kFile) + ".unreadable-2"));
+}
+
 TEST_F(DVAccessControlStoreTest, TheFirstGrantReplacesACorruptFileWithOnlyThatGrant) {
   platform_.propertyLists.setCorrupt(kFile);
   grant(kReport);

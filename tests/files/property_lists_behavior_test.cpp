@@ -86,6 +86,17 @@ TYPED_TEST(PropertyListsBehavior, ALaterWriteReplacesTheEarlierOne) {
   EXPECT_FALSE(this->files_.exists(this->path_ + ".unreadable-1"));
 }
 
+TYPED_TEST(PropertyListsBehavior, AFileThatIsKeptBesideStaysWhenItIsWritten) {
+  ASSERT_TRUE(this->lists().writeXMLAtomically({{"a", 1}}, this->path_));
+  ASSERT_TRUE(this->lists().keepBeside(this->path_));
+  ASSERT_TRUE(this->lists().writeXMLAtomically({{"a", 2}}, this->path_));
+  const auto stream = this->lists().openStream(this->path_ + ".unreadable-1");
+  ASSERT_TRUE(stream);
+  EXPECT_EQ(this->lists().read(*stream).value, QXValue(QXDictionary{{"a", 1}}));
+}
+
+TYPED_TEST(PropertyListsBehavior, AFileThatIsNotThereCannotBeKeptBeside) { EXPECT_FALSE(this->lists().keepBeside(this->path_)); }
+
 TYPED_TEST(PropertyListsBehavior, AStreamThatWasOpenReadsTheOldFile) {
   ASSERT_TRUE(this->lists().writeXMLAtomically({{"a", 1}}, this->path_));
   const auto stream = this->lists().openStream(this->path_);

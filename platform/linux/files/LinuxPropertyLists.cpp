@@ -56,6 +56,12 @@ bool LinuxPropertyLists::writeXMLAtomically(const QXDictionary& dictionary, cons
   return true;
 }
 
+bool LinuxPropertyLists::keepBeside(const std::string& path) {
+  auto begun = FileReplacer::begin(path);
+  auto* replacer = std::get_if<FileReplacer>(&begun);
+  return replacer != nullptr && !replacer->keepOld(kUnreadableSuffix);
+}
+
 LinuxPropertyLists::Stamp LinuxPropertyLists::stampOf(const struct stat& status) {
   return {status.st_dev, status.st_ino, status.st_size, status.st_mtim.tv_sec, status.st_mtim.tv_nsec};
 }

@@ -23,6 +23,7 @@ class LinuxPropertyLists : public QXPropertyLists {
   std::unique_ptr<std::istream> openStream(const std::string& path) override;
   ReadResult read(std::istream& stream) override;
   bool writeXMLAtomically(const QXDictionary& dictionary, const std::string& path) override;
+  bool keepBeside(const std::string& path) override;
 
  private:
   // What tells a file from every other one, and from itself after a change.
