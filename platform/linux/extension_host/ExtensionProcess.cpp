@@ -142,14 +142,11 @@ void ExtensionProcess::end() {
 }
 
 void ExtensionProcess::endAtOnce() {
-  {
-    const std::lock_guard lock(eventMutex_);
-    if (stage_ == Stage::killed) return;
-    if (std::exchange(stage_, Stage::killed) == Stage::alive) handlers_.onLost(ProcessLifetime::Cause::died);
-    isLetGo_ = true;
-    endProcessTree(process_);
-  }
-  endpoint_->close(extensionHostError(ExtensionHostErrorCode::stopped, "The extension host is stopping."));
+  const std::lock_guard lock(eventMutex_);
+  if (stage_ == Stage::killed) return;
+  isLetGo_ = true;
+  if (std::exchange(stage_, Stage::killed) == Stage::alive) handlers_.onLost(ProcessLifetime::Cause::died);
+  closeAndKill(extensionHostError(ExtensionHostErrorCode::stopped, "The extension host is stopping."));
 }
 
 std::shared_ptr<QXRpcProxy> ExtensionProcess::remoteObjectProxy(QXErrorHandler errorHandler) {
@@ -212,16 +209,19 @@ void ExtensionProcess::lookForOverdueAnswers() {
   }
   if (verdict.setTimer) answerTimer_->setFor(*verdict.setTimer);
   if (!verdict.overdue) return;
-  {
-    const std::lock_guard lock(eventMutex_);
-    if (stage_ != Stage::alive) return;
-    stage_ = Stage::killed;
-    endProcessTree(process_);
-    handlers_.onLost(ProcessLifetime::Cause::notAnswering);
-  }
   const std::string what = "did not answer " + *verdict.overdue + " in time";
+  const std::lock_guard lock(eventMutex_);
+  if (stage_ != Stage::alive) return;
+  stage_ = Stage::killed;
   note(QXLogType::defaultType, what);
-  endpoint_->close(extensionHostError(ExtensionHostErrorCode::notAnswering, "The process of " + identifier_ + " " + what + "."));
+  handlers_.onLost(ProcessLifetime::Cause::notAnswering);
+  closeAndKill(extensionHostError(ExtensionHostErrorCode::notAnswering, "The process of " + identifier_ + " " + what + "."));
+}
+
+void ExtensionProcess::closeAndKill(const QXError& why) {
+  // In this order, or the messages that wait may learn only that the peer has left.
+  endpoint_->close(why);
+  endProcessTree(process_);
 }
 
 AnswerDeadlines::Message ExtensionProcess::expectAnswer(const std::string& operationName) {

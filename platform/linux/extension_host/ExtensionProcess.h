@@ -71,6 +71,8 @@ class ExtensionProcess : public std::enable_shared_from_this<ExtensionProcess> {
   [[nodiscard]] bool reap();
   void graceIsOver();
   void lookForOverdueAnswers();
+  // With the event lock.
+  void closeAndKill(const QXError& why);
   [[nodiscard]] AnswerDeadlines::Message expectAnswer(const std::string& operationName);
   void gotAnswer(AnswerDeadlines::Message message);
   void note(QXLogType type, const std::string& what) const;
