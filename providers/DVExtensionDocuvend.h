@@ -48,7 +48,7 @@ class DVExtensionDocuvend final : public QXDocuvend, public std::enable_shared_f
   using VendorProxy = QXRemote<_QXDocuvendVendor>;
   // Ends the request at the extension host. May be called from any thread, and be kept.
   using FinishHandler = std::function<void()>;
-  // Of the error and the proxy one is present. The handler owes the request its end, also when it was given an error.
+  // Of the error and the proxy one is present. Whether and when the request ends is the handler's affair.
   using RequestHandler = std::function<void(std::optional<QXError> error, std::optional<VendorProxy> proxy, FinishHandler finish)>;
 
   // --- Registry and discovery

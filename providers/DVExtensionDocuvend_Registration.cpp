@@ -1,6 +1,6 @@
 // A provider is registered with file coordination after its extension has run its own setup. A try is a request, the setup, and the
 // registration on the provider's operation queue; a try that fails before that last step is followed by another one a while later, as
-// long as the count lasts. The request that failed before there was a proxy is left unfinished: the host has nothing to end.
+// long as the count lasts. The request that failed before there was a proxy is left unfinished.
 #include <chrono>
 #include <utility>
 

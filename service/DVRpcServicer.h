@@ -3,7 +3,7 @@
 // Its operations run on the connection's own context, one after another, and the servicer holds no state that changes. A request that
 // fails before it reaches a provider is answered by a task on the global queue, never inside the call; later answers come on whatever
 // thread the provider's own answer came. A provider may answer twice, and then so may a request: the connection takes the first. An empty
-// reply handler is never called. A request that is under way keeps the servicer alive, also when its client has left.
+// reply handler is never called. A grant or an item operation that is under way keeps the servicer alive, also when its client has left.
 //
 // One source per concern: DVRpcServicer_Checks, _Grants, _Items, _Listing, _Bookmarks.
 #pragma once

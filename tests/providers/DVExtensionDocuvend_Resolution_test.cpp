@@ -21,7 +21,8 @@ class ResolutionTest : public ProvidersTest {
     bool whenTrue = true;
     bool whenFalse = false;
     const auto first = DVExtensionDocuvend::providerForURL(url, &whenTrue);
-    EXPECT_EQ(whenTrue, DVExtensionDocuvend::providerForURL(url, &whenFalse) == first && whenFalse) << "the flag is always written";
+    EXPECT_EQ(DVExtensionDocuvend::providerForURL(url, &whenFalse), first);
+    EXPECT_EQ(whenTrue, whenFalse) << "the flag is always written";
     return (first ? first->identifier()->value : std::string("none")) + (whenTrue ? " excluded" : "");
   }
   // As above, once, with what was logged.
@@ -157,7 +158,7 @@ TEST_F(ResolutionTest, WhenEveryProviderFailsNobodyOwnsTheURLAndItIsNotExcluded)
 
 TEST_F(ResolutionTest, TheFirstAnswerDecidesAndNobodyIsAskedAfterIt) {
   have({installReady(kCellar), installReady(kAttic), installReady(kShed)});
-  const QXURL url = file("/shared/a");
+  const QXURL url = file("/elsewhere/a");
   for (const std::string& identifier : {kCellar, kAttic, kShed}) {
     platform.fileSystem.setRelationship(FakePlatform::storageURL(identifier), url, QXRelationship::contains);
   }
