@@ -23,10 +23,10 @@ namespace docuvend {
 // Errors that this library makes itself.
 inline constexpr const char* kConsumerErrorDomain = "DVConsumerErrorDomain";
 enum class ConsumerErrorCode : std::int64_t {
-  unreachable = 1,       // the daemon cannot be connected to
-  deadlinePassed = 2,    // no answer in time
-  noAnswer = 3,          // the answer carried neither a value nor an error
-  noToken = 4,           // the platform issued no token for the file
+  unreachable = 1,     // the daemon cannot be connected to
+  deadlinePassed = 2,  // no answer in time
+  noAnswer = 3,        // the answer carried neither a value nor an error
+  noToken = 4,         // the platform issued no token for the file
 };
 
 template <class T>

@@ -6,6 +6,8 @@
 #include <iterator>
 #include <sstream>
 
+#include "platform/linux/wire/FileCoordinationProtocol.h"
+#include "platform/linux/wire/SandboxProtocol.h"
 #include "platform/rpc_errors.h"
 #include "platform/rpc_protocol.h"
 #include "providers/_QXDocuvendVendor.h"
@@ -66,6 +68,11 @@ TEST_F(ProtocolPageTest, ShowsTheBytesOfTheWorkedExchange) {
 
 TEST_F(ProtocolPageTest, ListsTheOperationsOfTheDaemonInOrder) {
   EXPECT_EQ(rows("Operations: `DVDaemon`"), protocolRows(qxInterfaceOf<DVDaemon>()));
+}
+
+TEST_F(ProtocolPageTest, ListsTheOperationsOfThePlatformsServicesInOrder) {
+  EXPECT_EQ(rows("Operations: `QXSandboxRedemption`"), protocolRows(qxInterfaceOf<linux_platform::QXSandboxRedemption>()));
+  EXPECT_EQ(rows("Operations: `QXFileCoordination`"), protocolRows(qxInterfaceOf<linux_platform::QXFileCoordination>()));
 }
 
 TEST_F(ProtocolPageTest, ListsTheOperationsOfAProviderExtensionInOrder) {
