@@ -186,8 +186,21 @@ TEST_F(LinuxRpcServiceTest, APathMayBeLongerThanASocketAddress) {
   const auto endpoint = Endpoint::create(driver.reactor, std::get<UniqueDescriptor>(std::move(socket)), {}, {});
   endpoint->resume();
   EXPECT_TRUE(roundTrip(LinuxDriver::Client(endpoint)));
-  listener.reset();
-  EXPECT_FALSE(std::filesystem::exists(path));
+}
+
+TEST(BoundSocketTest, TheNameGoesWithTheSocketWhereverItIs) {
+  const tests::TemporaryDirectory directory;
+  std::string deep = directory.path();
+  while (deep.size() <= 2 * sizeof(sockaddr_un::sun_path)) deep += "/" + std::string(50, 'd');
+  std::filesystem::create_directories(deep);
+  for (const std::string& path : {directory.path() + "/s", deep + "/s"}) {
+    {
+      const auto bound = BoundSocket::create(path);
+      ASSERT_TRUE(std::holds_alternative<std::unique_ptr<BoundSocket>>(bound)) << std::get<QXError>(bound).description();
+      EXPECT_TRUE(std::filesystem::is_socket(path));
+    }
+    EXPECT_FALSE(std::filesystem::exists(path));
+  }
 }
 
 TEST_F(LinuxRpcServiceTest, AMalformedFrameClosesThatConnectionWithOneLogLineAndTheServiceGoesOn) {

@@ -35,10 +35,10 @@ class TestPeerDirectory final : public linux_platform::PeerDirectory {
     identity->pid = ::getpid();
     identity->uid = ::geteuid();
     identity->standing = standing_;
+    identity->entitlements = entitlements_;
     if (standing_ == linux_platform::Standing::nobody) return identity;
     identity->token = tokenOf(++connections_);
     identity->bundleIdentifier = bundleIdentifier_;
-    identity->entitlements = entitlements_;
     return identity;
   }
   std::shared_ptr<const linux_platform::PeerIdentity> declare(const linux_platform::PeerIdentity& peer,

@@ -509,8 +509,14 @@ TEST_F(EndpointTest, APeerThatDoesNotReadIsDroppedAndHoldsNobodyUp) {
 }
 
 TEST_F(EndpointTest, WhatTheSocketDoesNotTakeAtOnceIsWrittenWhenThePeerReads) {
+  reactor = std::make_unique<Reactor>(1U);
   auto raw = connectRaw(nullptr);
   raw.sayHello();
+  ASSERT_TRUE(server.hellos->take());
+  // With one thread, a task that was posted afterwards runs when nothing but reading is waited for.
+  Mailbox<int> idle;
+  reactor->post([&idle] { idle.put(1); });
+  ASSERT_TRUE(idle.take());
   const auto remote = server.endpoint->remoteObjectProxy({});
   const QXRpcOperation operation{"data:", {QXValueKind::data}, {}};
   constexpr std::size_t kBlocks = 6;
