@@ -7,7 +7,6 @@
 #include <cerrno>
 #include <iostream>
 #include <memory>
-#include <nlohmann/json.hpp>
 #include <utility>
 #include <vector>
 
@@ -15,6 +14,7 @@
 #include "platform/linux/log/LogText.h"
 #include "sdk/Consumer.h"
 #include "service/DVBookmarkableString.h"
+#include "tools/docuvendctl/JSONText.h"
 
 namespace docuvend::ctl {
 namespace {
@@ -159,9 +159,9 @@ constexpr std::array kCommands = {
 
 void print(const Fields& fields, OutputForm form) {
   if (form == OutputForm::json) {
-    nlohmann::ordered_json object = nlohmann::ordered_json::object();
-    for (const auto& [name, text] : fields) object[name] = text;
-    std::cout << object.dump(-1, ' ', /*ensure_ascii=*/false, nlohmann::json::error_handler_t::replace) << "\n";
+    JSONObject object;
+    for (const auto& [name, text] : fields) object.add(name, text);
+    std::cout << object.text() << "\n";
     return;
   }
   // A script gets the exact text; a person's terminal is not to be steered by it.
@@ -174,9 +174,13 @@ void print(const Fields& fields, OutputForm form) {
 ExitStatus fail(const QXError& error, OutputForm form) {
   const ExitStatus status = statusOf(error);
   if (form == OutputForm::json) {
-    const nlohmann::ordered_json object = {
-        {"error", {{"domain", error.domain}, {"code", error.code}, {"description", error.description()}}}};
-    std::cerr << object.dump(-1, ' ', /*ensure_ascii=*/false, nlohmann::json::error_handler_t::replace) << "\n";
+    JSONObject inner;
+    inner.add("domain", error.domain);
+    inner.add("code", error.code);
+    inner.add("description", error.description());
+    JSONObject object;
+    object.add("error", inner);
+    std::cerr << object.text() << "\n";
   } else {
     std::cerr << "docuvendctl: " << visibleLogText(error.description()) << "\n";
   }

@@ -1,0 +1,76 @@
+// The program itself, where it needs no daemon.
+#include <gmock/gmock.h>
+#include <gtest/gtest.h>
+
+#include <filesystem>
+
+#include "tests/system/house/Process.h"
+
+namespace docuvend::ctl {
+namespace {
+
+using ::testing::EndsWith;
+using ::testing::HasSubstr;
+using ::testing::StartsWith;
+using tests::Ending;
+
+Ending run(const std::vector<std::string>& arguments, const std::vector<std::string>& environment = {}) {
+  std::vector<std::string> words = {std::string(DOCUVEND_BIN) + "/docuvendctl"};
+  words.insert(words.end(), arguments.begin(), arguments.end());
+  return tests::Process({words, environment, {}}).wait();
+}
+
+void expectOneLine(const std::string& text) {
+  ASSERT_FALSE(text.empty());
+  EXPECT_EQ(text.find('\n'), text.size() - 1) << text;
+}
+
+TEST(Docuvendctl, ExplainsItself) {
+  const Ending help = run({"--help"});
+  EXPECT_EQ(help.status, 0);
+  EXPECT_EQ(help.errors, "");
+  EXPECT_THAT(help.output, StartsWith("docuvendctl [--as BUNDLE] [--json] [--timeout SECONDS] COMMAND [OPERAND...]\n"));
+  for (const char* command : {"wake", "providers", "grant", "start", "bookmark", "resolve", "cat", "put"}) {
+    EXPECT_THAT(help.output, HasSubstr("\n  " + std::string(command) + " ")) << command;
+  }
+}
+
+TEST(Docuvendctl, AWrongCommandLineIsOneLineAndStatus2) {
+  for (const auto& arguments : std::vector<std::vector<std::string>>{
+           {}, {"--what"}, {"dance"}, {"wake", "up"}, {"grant", "/x", "p"}, {"cat"}, {"--timeout", "0", "wake"}}) {
+    const Ending ending = run(arguments);
+    EXPECT_EQ(ending.status, 2) << ending.errors;
+    EXPECT_EQ(ending.output, "");
+    EXPECT_THAT(ending.errors, StartsWith("docuvendctl: "));
+    expectOneLine(ending.errors);
+  }
+}
+
+TEST(Docuvendctl, AWordThatWouldSteerATerminalIsShownHarmlessly) {
+  const Ending ending = run({"\x1b[31m\nwake"});
+  EXPECT_EQ(ending.status, 2);
+  EXPECT_EQ(ending.errors, "docuvendctl: unknown command \\x1b[31m\\nwake; --help lists them\n");
+}
+
+TEST(Docuvendctl, WithoutADaemonItSaysSoWithStatus7) {
+  std::string place = (std::filesystem::temp_directory_path() / "dvXXXXXX").string();
+  ASSERT_NE(::mkdtemp(place.data()), nullptr);
+  for (const auto& environment : std::vector<std::vector<std::string>>{{}, {"XDG_RUNTIME_DIR=r"}, {"XDG_RUNTIME_DIR=" + place}}) {
+    const Ending ending = run({"wake"}, environment);
+    EXPECT_EQ(ending.status, 7) << ending.errors;
+    expectOneLine(ending.errors);
+  }
+  std::filesystem::remove(place);
+}
+
+TEST(Docuvendctl, AFailureInJSONIsOneObject) {
+  const Ending ending = run({"--json", "wake"});
+  EXPECT_EQ(ending.status, 7);
+  EXPECT_EQ(ending.output, "");
+  EXPECT_THAT(ending.errors, StartsWith("{\"error\":{\"domain\":\"DVConsumerErrorDomain\",\"code\":1,\"description\":\""));
+  EXPECT_THAT(ending.errors, EndsWith("}}\n"));
+  expectOneLine(ending.errors);
+}
+
+}  // namespace
+}  // namespace docuvend::ctl
