@@ -1,0 +1,85 @@
+// A named service of one process, at the place where consumers look for it, whose operations do what a test says.
+#pragma once
+
+#include <gtest/gtest.h>
+#include <sys/epoll.h>
+#include <sys/socket.h>
+
+#include <memory>
+#include <mutex>
+#include <optional>
+#include <string>
+#include <utility>
+#include <vector>
+
+#include "platform/linux/rpc/BoundSocket.h"
+#include "platform/linux/wire/Endpoint.h"
+#include "platform/linux/wire/Reactor.h"
+#include "platform/rpc_protocol.h"
+
+namespace docuvend::tests {
+
+template <class Protocol>
+class ScriptedService {
+ public:
+  ScriptedService(const std::string& path, std::shared_ptr<Protocol> object) : object_(std::move(object)) {
+    auto bound = linux_platform::BoundSocket::create(path);
+    if (auto* socket = std::get_if<std::unique_ptr<linux_platform::BoundSocket>>(&bound)) socket_ = std::move(*socket);
+    if (!socket_) {
+      ADD_FAILURE() << "no socket for " << path;
+      return;
+    }
+    // `this` is safe: the reactor has run its last handler before anything else of the service goes.
+    registration_ = reactor_->watch(socket_->descriptor(), EPOLLIN, [this](std::uint32_t) -> std::uint32_t {
+      accept();
+      return EPOLLIN;
+    });
+  }
+  // As when a daemon is killed: every connection ends.
+  ~ScriptedService() {
+    registration_.reset();
+    {
+      const std::lock_guard lock(mutex_);
+      endpoints_.clear();
+    }
+    reactor_.reset();
+  }
+  ScriptedService(const ScriptedService&) = delete;
+  ScriptedService& operator=(const ScriptedService&) = delete;
+
+  // What the clients so far declared, in the order of their hellos.
+  [[nodiscard]] std::vector<std::optional<std::string>> declared() {
+    const std::lock_guard lock(mutex_);
+    return declared_;
+  }
+
+ private:
+  void accept() {
+    linux_platform::UniqueDescriptor client(::accept4(socket_->descriptor(), nullptr, nullptr, SOCK_CLOEXEC));
+    if (!client) return;
+    linux_platform::Endpoint::Handlers handlers;
+    handlers.onHello = [this](const linux_platform::Hello& hello) -> std::optional<QXError> {
+      const std::lock_guard lock(mutex_);
+      declared_.push_back(hello.declaredBundle);
+      return std::nullopt;
+    };
+    auto endpoint = linux_platform::Endpoint::create(*reactor_, std::move(client), {}, std::move(handlers));
+    endpoint->setExportedInterface(qxInterfaceOf<Protocol>());
+    endpoint->setExportedObject(std::make_shared<QXRpcExport<Protocol>>(object_));
+    {
+      const std::lock_guard lock(mutex_);
+      endpoints_.push_back(endpoint);
+    }
+    endpoint->resume();
+  }
+
+  const std::shared_ptr<Protocol> object_;
+  std::mutex mutex_;  // guards the two below
+  std::vector<std::optional<std::string>> declared_;
+  std::vector<std::shared_ptr<linux_platform::Endpoint>> endpoints_;
+  std::unique_ptr<linux_platform::BoundSocket> socket_;
+  std::unique_ptr<linux_platform::Reactor> reactor_ = std::make_unique<linux_platform::Reactor>(1);
+  std::shared_ptr<linux_platform::Reactor::Registration> registration_;
+};
+
+}  // namespace docuvend::tests
