@@ -190,13 +190,16 @@ std::variant<std::shared_ptr<ExtensionProcess>, QXError> LinuxExtension::makePro
 
 void LinuxExtension::didStart(std::shared_ptr<ExtensionProcess> process) {
   std::vector<Waiting> ready;
+  bool isTooLate = false;
   {
     const std::lock_guard lock(mutex_);
     lifetime_.started(Clock::now());
-    process_ = process;
     ready.swap(waiting_);
+    isTooLate = isStopped_;
+    if (!isTooLate) process_ = process;
   }
   process->resume();
+  if (isTooLate) process->endAtOnce();
   for (const Waiting& waiting : ready) waiting.completion(waiting.request, /*error=*/std::nullopt);
 }
 

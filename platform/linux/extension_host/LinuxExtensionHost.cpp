@@ -124,10 +124,11 @@ LinuxExtensionHost::~LinuxExtensionHost() {
   }
   state_->changed.notify_one();
   state_->thread.join();
-  state_->services->spawner.stop();
   for (const auto& weak : state_->extensions) {
     if (const auto extension = weak.lock()) extension->stop();
   }
+  // Last, because processes die with its thread, and then nobody hears why.
+  state_->services->spawner.stop();
 }
 
 std::unique_ptr<QXExtensionMatch> LinuxExtensionHost::beginMatching(Attributes attributes, QXExtensionContextClass contextClass,
