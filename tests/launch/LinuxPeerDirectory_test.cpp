@@ -4,13 +4,10 @@
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
 #include <signal.h>
-#include <sys/mount.h>
 #include <sys/socket.h>
 #include <sys/stat.h>
 #include <unistd.h>
 
-#include <array>
-#include <cerrno>
 #include <cstring>
 
 #include "platform/linux/launch/LaunchDescription.h"
@@ -19,11 +16,9 @@
 namespace docuvend::linux_platform {
 namespace {
 
-using ::testing::Contains;
 using ::testing::ElementsAre;
 using ::testing::HasSubstr;
 using ::testing::IsEmpty;
-using ::testing::Not;
 using Identity = std::shared_ptr<const PeerIdentity>;
 
 class LinuxPeerDirectoryTest : public PeerTest {
@@ -135,16 +130,13 @@ TEST_F(LinuxPeerDirectoryTest, AConfinedProcessWhoseBundleIsGoneIsNobody) {
 }
 
 TEST_F(LinuxPeerDirectoryTest, NamespacesWithoutADescriptionAreNobodys) {
-  const auto peer = unconfined(enterNamespaces);
+  const auto peer = unconfined({"enter", "once"});
   expectNobody(identify(peer));
   EXPECT_THAT(lastReason(), HasSubstr("cannot open its description"));
 }
 
 TEST_F(LinuxPeerDirectoryTest, NamespacesThatWereMadeInsideNamespacesAreNobodys) {
-  const auto peer = unconfined([] {
-    const int error = enterNamespaces();
-    return error != 0 ? error : enterNamespaces();
-  });
+  const auto peer = unconfined({"enter", "once", "enter", "twice"});
   expectNobody(identify(peer));
   EXPECT_THAT(lastReason(), HasSubstr("its mount namespace was made inside a confinement"));
 }
@@ -154,12 +146,7 @@ TEST_F(LinuxPeerDirectoryTest, ADescriptionThatWasMountedInsideAConfinementIsNot
   (void)install("org.a");
   const std::string place = house_.root() + "/forged";
   BundleHouse::write(place + "/.docuvend-info", description("org.a"));
-  const auto peer = unconfined([&place] {
-    if (const int error = enterNamespaces()) return error;
-    if (const int error = enterNamespaces()) return error;
-    if (::mount(place.c_str(), place.c_str(), nullptr, MS_BIND | MS_REC, nullptr) != 0) return errno;
-    return ::chroot(place.c_str()) == 0 ? 0 : errno;
-  });
+  const auto peer = unconfined({"enter", "once", "enter", "twice", "bind", place, "chroot", place});
   expectNobody(identify(peer));
   EXPECT_THAT(lastReason(), HasSubstr("its mount namespace was made inside a confinement"));
 }
@@ -168,10 +155,7 @@ TEST_F(LinuxPeerDirectoryTest, ARootThatIsAPlainDirectoryIsNotBelieved) {
   (void)install("org.a");
   const std::string place = house_.root() + "/forged";
   BundleHouse::write(place + "/.docuvend-info", description("org.a"));
-  const auto peer = unconfined([&place] {
-    if (const int error = enterNamespaces()) return error;
-    return ::chroot(place.c_str()) == 0 ? 0 : errno;
-  });
+  const auto peer = unconfined({"enter", "once", "chroot", place});
   expectNobody(identify(peer));
   EXPECT_THAT(lastReason(), HasSubstr("its root is not that of a mount"));
 }
@@ -265,7 +249,7 @@ TEST_F(LinuxPeerDirectoryTest, AConfinedProcessCannotDeclareAnything) {
 
 TEST_F(LinuxPeerDirectoryTest, NobodyCannotDeclareAnything) {
   (void)install("org.a");
-  const auto peer = unconfined(enterNamespaces);
+  const auto peer = unconfined({"enter", "once"});
   EXPECT_FALSE(directory_.declare(*identify(peer), "org.a"));
 }
 
@@ -293,7 +277,7 @@ TEST_F(LinuxPeerDirectoryTest, WhoseConnectionHasEndedIsNotFound) {
 }
 
 TEST_F(LinuxPeerDirectoryTest, NobodyIsNotFoundByTheZeroToken) {
-  const auto peer = unconfined(enterNamespaces);
+  const auto peer = unconfined({"enter", "once"});
   const auto nobody = identify(peer);
   EXPECT_FALSE(directory_.find(QXAuditToken{}));
 }
@@ -305,7 +289,7 @@ TEST_P(OlderKernel, StillTellsTheConfinedFromTheUnconfinedFromNobody) {
   LinuxPeerDirectory directory(bundles_, house_.log.defaultLog(), GetParam());
   const auto inside = confined(install("org.a"));
   const auto outside = unconfined();
-  const auto between = unconfined(enterNamespaces);
+  const auto between = unconfined({"enter", "once"});
   auto gone = unconfined();
   ASSERT_EQ(::kill(gone.process.pid(), SIGKILL), 0);
   EXPECT_EQ(gone.process.status(), 128 + SIGKILL);

@@ -1,28 +1,22 @@
 #include "tests/launch/PeerTest.h"
 
-#include <fcntl.h>
-#include <sched.h>
 #include <sys/socket.h>
 #include <sys/un.h>
 #include <unistd.h>
 
 #include <cerrno>
 #include <stdexcept>
-#include <string_view>
 
 namespace docuvend::linux_platform {
 namespace {
+
+const std::string kProbe = std::string(DOCUVEND_BIN) + "/docuvend-launch-probe";
 
 sockaddr_un addressOf(const std::string& path) {
   sockaddr_un address{};
   address.sun_family = AF_UNIX;
   path.copy(address.sun_path, sizeof(address.sun_path) - 1);
   return address;
-}
-
-bool writeFile(const char* path, const std::string& text) {
-  const UniqueDescriptor file(::open(path, O_WRONLY | O_CLOEXEC));
-  return file && ::write(file.get(), text.data(), text.size()) == static_cast<ssize_t>(text.size());
 }
 
 }  // namespace
@@ -51,18 +45,11 @@ Peer PeerTest::confined(const Bundle& bundle, const std::string& attempt) {
   return {std::move(process), accept()};
 }
 
-Peer PeerTest::unconfined(std::function<int()> work) {
-  auto process = startChild([this, &work] {
-    const UniqueDescriptor socket(::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0));
-    const auto address = addressOf(socketPath_);
-    if (::connect(socket.get(), reinterpret_cast<const sockaddr*>(&address), sizeof(address)) != 0) return errno;
-    const int status = work();
-    char byte = 0;
-    if (::write(socket.get(), &byte, 1) != 1) return errno;
-    while (::read(socket.get(), &byte, 1) > 0) {
-    }
-    return status;
-  });
+Peer PeerTest::unconfined(const std::vector<std::string>& attempts) {
+  std::vector<std::string> words = {kProbe, "join", socketPath_};
+  words.insert(words.end(), attempts.begin(), attempts.end());
+  words.insert(words.end(), {"stay", "here"});
+  auto process = startProgram(std::move(words));
   auto connection = accept();
   char byte = 0;
   if (::read(connection.get(), &byte, 1) != 1) throw std::runtime_error("the peer is gone");
@@ -76,31 +63,24 @@ Peer PeerTest::handMade(const std::vector<std::string>& arguments) {
       "/proc",          "--bind",         house_.root(),   house_.root(),       "--ro-bind",  DOCUVEND_BIN, "/programs"};
   words.insert(words.end(), arguments.begin(), arguments.end());
   words.insert(words.end(), {"--", "/programs/docuvend-launch-probe", "stay-connected", socketPath_});
-  auto process = startChild([&words] {
+  auto process = startProgram(std::move(words));
+  return {std::move(process), accept()};
+}
+
+RunningProcess PeerTest::startProgram(std::vector<std::string> words) {
+  return startChild([&words] {
     std::vector<char*> pointers;
     for (auto& word : words) pointers.push_back(word.data());
     pointers.push_back(nullptr);
     ::execv(pointers[0], pointers.data());
     return errno;
   });
-  return {std::move(process), accept()};
 }
 
 UniqueDescriptor PeerTest::accept() {
   UniqueDescriptor connection(::accept4(listener_.get(), nullptr, nullptr, SOCK_CLOEXEC));
   if (!connection) throw std::runtime_error("nobody connected");
   return connection;
-}
-
-int enterNamespaces() {
-  const std::string user = std::to_string(::geteuid());
-  const std::string group = std::to_string(::getegid());
-  if (::unshare(CLONE_NEWUSER | CLONE_NEWNS) != 0) return errno;
-  if (!writeFile("/proc/self/setgroups", "deny") || !writeFile("/proc/self/uid_map", user + " " + user + " 1") ||
-      !writeFile("/proc/self/gid_map", group + " " + group + " 1")) {
-    return errno;
-  }
-  return 0;
 }
 
 }  // namespace docuvend::linux_platform

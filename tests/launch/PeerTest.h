@@ -39,19 +39,17 @@ class PeerTest : public ConfinedTest {
   // Installs the probe with one entitlement and lists it.
   Bundle install(const std::string& identifier);
   [[nodiscard]] Peer confined(const Bundle& bundle, const std::string& attempt = "stay-connected");
-  // A child of this process, not confined. It does `work` when it is connected, and is taken for connected when that is done; then it
-  // stays until its connection closes. Its status is what `work` gave.
-  [[nodiscard]] Peer unconfined(std::function<int()> work = [] { return 0; });
+  // The probe, not confined. It makes its attempts when it is connected, and is given back when they are made; then it stays until its
+  // connection closes.
+  [[nodiscard]] Peer unconfined(const std::vector<std::string>& attempts = {});
   // Whom an outsider has bubblewrap confine with arguments of its own; they follow namespaces and a read-only view of everything.
   [[nodiscard]] Peer handMade(const std::vector<std::string>& arguments);
   [[nodiscard]] UniqueDescriptor accept();
+  [[nodiscard]] static RunningProcess startProgram(std::vector<std::string> words);
 
   std::string socketPath_;
   UniqueDescriptor listener_;
   ListedBundles bundles_;
 };
-
-// Goes into new user and mount namespaces below those of the calling process; 0, or an errno.
-[[nodiscard]] int enterNamespaces();
 
 }  // namespace docuvend::linux_platform

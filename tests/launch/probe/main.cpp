@@ -20,8 +20,8 @@
 #include <cstdio>
 #include <cstdlib>
 #include <cstring>
-#include <map>
 #include <string>
+#include <utility>
 #include <vector>
 
 extern char** environ;
@@ -116,6 +116,32 @@ std::string stayConnectedAsOrphan(const std::string& path) {
   return {text, static_cast<std::size_t>(std::max<ssize_t>(count, 0))};
 }
 
+// Goes into new user and mount namespaces below those that it is in.
+std::string enterNamespaces() {
+  const std::string user = std::to_string(::geteuid());
+  const std::string group = std::to_string(::getegid());
+  if (::unshare(CLONE_NEWUSER | CLONE_NEWNS) != 0) return outcome(-1);
+  for (const auto& [path, text] : std::vector<std::pair<std::string, std::string>>{{"/proc/self/setgroups", "deny"},
+                                                                                   {"/proc/self/uid_map", user + " " + user + " 1"},
+                                                                                   {"/proc/self/gid_map", group + " " + group + " 1"}}) {
+    const int file = ::open(path.c_str(), O_WRONLY | O_CLOEXEC);
+    if (::write(file, text.data(), text.size()) < 0) return outcome(-1);
+    ::close(file);
+  }
+  return "ok";
+}
+
+// The connection that "join" makes and "stay" keeps until the other side closes.
+int joined = -1;
+
+std::string stay() {
+  char byte = 0;
+  if (::write(joined, &byte, 1) != 1) return outcome(-1);
+  while (::read(joined, &byte, 1) > 0) {
+  }
+  return "ok";
+}
+
 std::string echoOnce() {
   char byte = 0;
   if (::read(kExtensionSocket, &byte, 1) != 1) return "nothing";
@@ -179,6 +205,10 @@ std::string attempt(const std::string& what, const std::string& subject) {
   if (what == "connect") return connectTo(subject, /*isAbstract=*/false, socket);
   if (what == "stay-connected") return stayConnected(subject);
   if (what == "stay-connected-as-orphan") return stayConnectedAsOrphan(subject);
+  if (what == "join") return connectTo(subject, /*isAbstract=*/false, joined);
+  if (what == "stay") return stay();
+  if (what == "enter") return enterNamespaces();
+  if (what == "bind") return outcome(::mount(subject.c_str(), subject.c_str(), nullptr, MS_BIND | MS_REC, nullptr));
   if (what == "unshare") return outcome(::unshare(subject == "user" ? CLONE_NEWUSER : CLONE_NEWNS));
   if (what == "mount") return outcome(::mount(subject.c_str(), "/.docuvend-info", nullptr, MS_BIND, nullptr));
   if (what == "chroot") return outcome(::chroot(subject.c_str()));
