@@ -9,11 +9,19 @@
 #include <unistd.h>
 
 #include <cstring>
+#include <ostream>
 
 #include "platform/linux/launch/LaunchDescription.h"
 #include "tests/launch/PeerTest.h"
 
 namespace docuvend::linux_platform {
+
+// Found by the test library, which names each test's kernel with it.
+static void PrintTo(const KernelFacilities& kernel, std::ostream* stream) {
+  *stream << "Without" << (kernel.peerPidfd ? "" : "PeerPidfds") << (kernel.pidfdNamespaces ? "" : "PidfdNamespaces")
+          << (kernel.uniquePidfdInodes ? "" : "UniqueInodes");
+}
+
 namespace {
 
 using ::testing::ElementsAre;
@@ -318,10 +326,7 @@ std::vector<KernelFacilities> olderKernels() {
   return kernels;
 }
 
-std::string kernelName(const ::testing::TestParamInfo<KernelFacilities>& info) {
-  return std::string("Without") + (info.param.peerPidfd ? "" : "PeerPidfds") + (info.param.pidfdNamespaces ? "" : "PidfdNamespaces") +
-         (info.param.uniquePidfdInodes ? "" : "UniqueInodes");
-}
+std::string kernelName(const ::testing::TestParamInfo<KernelFacilities>& info) { return ::testing::PrintToString(info.param); }
 
 INSTANTIATE_TEST_SUITE_P(Kernels, OlderKernel, ::testing::ValuesIn(olderKernels()), kernelName);
 
