@@ -173,6 +173,10 @@ class ConsumerTest : public ::testing::Test {
     if (!consumer_) throw std::runtime_error(std::get<QXError>(connected).description());
     return *consumer_;
   }
+  // Wakings are put into `taken_` instead of being answered.
+  void holdWakings() {
+    script_.waking = [this](DVDaemon::Done completion) { taken_.put(std::move(completion)); };
+  }
   Document document() const { return {*script_.url, script_.itemToken, script_.siblingURL, script_.siblingToken}; }
   // The file that tokens are redeemed for.
   UniqueDescriptor makeFile(const std::string& contents) {
@@ -205,6 +209,7 @@ class ConsumerTest : public ::testing::Test {
   std::string root_;
   Script script_;
   Calls calls_;
+  Mailbox<DVDaemon::Done> taken_;
   std::unique_ptr<ScriptedService<DVDaemon>> daemon_;
   std::unique_ptr<ScriptedService<QXSandboxRedemption>> sandbox_;
   std::unique_ptr<ScriptedService<QXFileCoordination>> coordination_;
@@ -259,24 +264,22 @@ TEST_F(ConsumerTest, OneConnectionServesManyCallsAndThreads) {
 }
 
 TEST_F(ConsumerTest, AnAnswerThatDoesNotComeIsTheDeadlinesErrorAndLateItIsDropped) {
-  Mailbox<DVDaemon::Done> taken;
-  script_.waking = [&taken](DVDaemon::Done completion) { taken.put(std::move(completion)); };
+  holdWakings();
   startServices();
   Consumer& daemon = consumer({std::nullopt, std::chrono::milliseconds(1), std::chrono::milliseconds(1)});
   EXPECT_EQ(errorIn(daemon.wakeUp()), own(ConsumerErrorCode::deadlinePassed));
-  const auto late = taken.take();
+  const auto late = taken_.take();
   ASSERT_TRUE(late);
   (*late)();
   EXPECT_EQ(errorIn(daemon.wakeUp()), own(ConsumerErrorCode::deadlinePassed));
 }
 
 TEST_F(ConsumerTest, ADaemonThatEndsDuringACallIsAnErrorAndNotAWait) {
-  Mailbox<DVDaemon::Done> taken;
-  script_.waking = [&taken](DVDaemon::Done completion) { taken.put(std::move(completion)); };
+  holdWakings();
   startServices();
   Consumer& daemon = consumer();
   auto answer = std::async(std::launch::async, [&daemon] { return daemon.wakeUp(); });
-  const auto held = taken.take();
+  const auto held = taken_.take();
   ASSERT_TRUE(held);
   stopServices();
   ASSERT_EQ(answer.wait_for(kPatience), std::future_status::ready);
