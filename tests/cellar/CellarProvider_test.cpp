@@ -187,6 +187,15 @@ TEST_F(CellarProviderTest, WhatIsWrittenHereIsNotOverwritten) {
   EXPECT_EQ(read(local("a.txt")), "mine!");
 }
 
+TEST_F(CellarProviderTest, WhatIsWrittenHereIsProvidedEvenIfItIsGoneInTheCloud) {
+  write(cloud + "/a.txt", "hello");
+  setUp();
+  save("a.txt", "mine!");
+  fs::remove(cloud + "/a.txt");
+  start("a.txt");
+  EXPECT_EQ(read(local("a.txt")), "mine!");
+}
+
 TEST_F(CellarProviderTest, AChangeGoesToTheCloud) {
   write(cloud + "/a.txt", "hello");
   setUp();
@@ -346,6 +355,14 @@ TEST_F(CellarProviderTest, StoppingDoesNotGiveUpWhatIsNotSaved) {
   EXPECT_EQ(read(local("a.txt")), "mine!");
   change("a.txt");
   fs::remove(cloud + "/a.txt");
+  EXPECT_TRUE(isKind(provider->stopProviding(url("a.txt")), CellarErrorCode::notSaved));
+  EXPECT_EQ(read(local("a.txt")), "mine!");
+}
+
+TEST_F(CellarProviderTest, StoppingDoesNotGiveUpWhatWasWrittenOverAPlaceholder) {
+  write(cloud + "/a.txt", "hello");
+  setUp();
+  write(local("a.txt"), "mine!");
   EXPECT_TRUE(isKind(provider->stopProviding(url("a.txt")), CellarErrorCode::notSaved));
   EXPECT_EQ(read(local("a.txt")), "mine!");
 }

@@ -59,6 +59,7 @@ TEST_F(AnswerDeadlinesTest, TheTimerIsSetAgainForTheOldestThatIsLeft) {
   const auto verdict = deadlines.timerFired(now + kLimit);
   EXPECT_FALSE(verdict.overdue);
   EXPECT_EQ(verdict.setTimer, now + kOne + kLimit);
+  EXPECT_FALSE(deadlines.sent("d", now + kLimit).setTimer);
   EXPECT_EQ(deadlines.timerFired(*verdict.setTimer).overdue, "b");
 }
 
