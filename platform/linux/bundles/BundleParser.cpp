@@ -137,7 +137,8 @@ class Parser {
     auto& version = result_.bundle.version;
     for (const auto number : {std::uint64_t{status.st_dev}, std::uint64_t{status.st_ino}, static_cast<std::uint64_t>(status.st_ctim.tv_sec),
                               static_cast<std::uint64_t>(status.st_ctim.tv_nsec)}) {
-      version += (version.empty() ? "" : ".") + std::to_string(number);
+      if (!version.empty()) version += '.';
+      version += std::to_string(number);
     }
   }
 
