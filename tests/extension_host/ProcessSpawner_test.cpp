@@ -96,22 +96,22 @@ TEST_F(ProcessSpawnerTest, AProcessHasItsEnvironmentAndBothOutputsAndNoInput) {
 }
 
 TEST_F(ProcessSpawnerTest, DescriptorsLieUnderTheirNumbersAlsoIfTheyCrossAndGapsAreClosed) {
-  // Open ones under the very numbers that the process is to see as others.
-  UniqueDescriptor first = file("first");
-  UniqueDescriptor second = file("second");
-  const int low = first.get();
-  const int high = second.get();
-  ASSERT_LT(low, high);
-  const std::string text = "cat <&" + std::to_string(low) + "; echo; cat <&" + std::to_string(high) + "; echo; ls /proc/self/fd | wc -l";
-  LaunchPlan plan = shell(text);
-  plan.inherited.push_back({low, std::move(second)});
-  plan.inherited.push_back({high, std::move(first)});
+  // Each lies under the number that the process is to see another as.
+  std::array<UniqueDescriptor, 3> files = {file("first"), file("second"), file("third")};
+  const std::array<int, 3> numbers = {files[0].get(), files[1].get(), files[2].get()};
+  std::string script;
+  for (const int number : numbers) script += "cat <&" + std::to_string(number) + "; echo; ";
+  LaunchPlan plan = shell(script + "ls /proc/self/fd | wc -l");
+  plan.inherited.push_back({numbers[0], std::move(files[2])});
+  plan.inherited.push_back({numbers[1], std::move(files[0])});
+  plan.inherited.push_back({numbers[2], std::move(files[1])});
   // Inheritable by mistake, and not meant for the process.
   const UniqueDescriptor stray(dup(output.get()));
   ASSERT_FALSE(spawn(std::move(plan)));
-  EXPECT_EQ(line(), "second");
+  EXPECT_EQ(line(), "third");
   EXPECT_EQ(line(), "first");
-  EXPECT_EQ(line(), "6");  // three, two, and the directory that is listed
+  EXPECT_EQ(line(), "second");
+  EXPECT_EQ(line(), "7");  // three, three, and the directory that is listed
 }
 
 TEST_F(ProcessSpawnerTest, AProgramThatDoesNotExistIsAnError) {

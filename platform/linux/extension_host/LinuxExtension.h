@@ -8,6 +8,7 @@
 #include <mutex>
 #include <optional>
 #include <string>
+#include <utility>
 #include <variant>
 #include <vector>
 
@@ -26,6 +27,9 @@ namespace docuvend::linux_platform {
 
 // What the extensions of one host share. The references outlive the extensions.
 struct ExtensionServices {
+  ExtensionServices(Paths allPaths, Reactor& itsReactor, QXLogHandle& itsLog, const ExtensionTimes& itsTimes)
+      : paths(std::move(allPaths)), reactor(itsReactor), log(itsLog), times(itsTimes) {}
+
   Paths paths;
   Reactor& reactor;
   QXLogHandle& log;
