@@ -9,7 +9,7 @@
 namespace docuvend::linux_platform {
 namespace {
 
-std::string tag(std::string_view name) { return "<" + std::string(name) + ">"; }
+std::string tag(std::string_view name) { return std::string(1, '<').append(name).append(1, '>'); }
 
 // The value of a leaf, or none when its text is not one.
 std::optional<QXValue> leafValue(std::string_view name, std::string text) {

@@ -79,7 +79,8 @@ class Writer {
 
   [[nodiscard]] bool leaf(std::string_view name, std::string_view content) {
     if (!isXMLText(content)) return false;
-    std::string element = "<" + std::string(name) + ">";
+    std::string element(1, '<');
+    element.append(name).append(1, '>');
     while (!content.empty()) {
       const std::size_t plain = std::min(content.find_first_of("&<>\r"), content.size());
       element += content.substr(0, plain);
