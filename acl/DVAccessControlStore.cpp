@@ -136,11 +136,12 @@ void DVAccessControlStore::syncQueueCommitAccessControl() {
   assert(syncQueue_->isCurrent());
   dvLog("[INFO] Committing access control list");
   QXPropertyLists& propertyLists = QXPlatform::current().propertyLists;
-  const bool isSafe = !syncQueueFileIsMisshapen_ || propertyLists.keepBeside(accessControlFilePath());
-  if (isSafe && propertyLists.writeXMLAtomically(syncQueueAccessControlDict_->dictionary(), accessControlFilePath())) {
+  const std::string& path = accessControlFilePath();
+  if (syncQueueFileIsMisshapen_ && (!QXPlatform::current().fileSystem.exists(path) || propertyLists.keepBeside(path))) {
     syncQueueFileIsMisshapen_ = false;
-  } else {
-    dvLog("[ERROR] Could not write to %@", accessControlFilePath());
+  }
+  if (syncQueueFileIsMisshapen_ || !propertyLists.writeXMLAtomically(syncQueueAccessControlDict_->dictionary(), path)) {
+    dvLog("[ERROR] Could not write to %@", path);
   }
 }
 

@@ -53,7 +53,8 @@ class DVAccessControlStore final : public DVAccessControl, public std::enable_sh
 
   // Only on syncQueue; by the constructor before that. Absent only while the file is being read.
   std::optional<DVGrantTree> syncQueueAccessControlDict_;
-  // The file is a property list that is no access control list: somebody's edit went wrong, and it is not overwritten without a copy.
+  // The file is a property list that is no access control list, and there is no copy of it yet: somebody's edit went wrong, and it is
+  // not overwritten without one.
   bool syncQueueFileIsMisshapen_ = false;
 };
 

@@ -206,6 +206,24 @@ TEST_F(DVAccessControlStoreTest, AFileOfAnotherShapeIsRejectedLikeAnUnreadableOn
   EXPECT_EQ(platform_.propertyLists.value(kFile), QXValue(listOf(kCellar, kEditor, {"letter"})));
 }
 
+TEST_F(DVAccessControlStoreTest, AFileOfAnotherShapeIsKeptOnceHoweverOftenWritingFails) {
+  platform_.propertyLists.setValue(kFile, QXArray{"a"});
+  platform_.propertyLists.failWrite(1, FakeWriteFailure::once);
+  grant(kReport);
+  grant(kLetter);
+  EXPECT_EQ(platform_.propertyLists.value(kFile), QXValue(listOf(kCellar, kEditor, {"report", "letter"})));
+  EXPECT_TRUE(platform_.fileSystem.isFile(std::string(kFile) + ".unreadable-1"));
+  EXPECT_FALSE(platform_.fileSystem.isFile(std::string(kFile) + ".unreadable-2"));
+}
+
+TEST_F(DVAccessControlStoreTest, AFileOfAnotherShapeThatIsGoneByThenIsNoObstacle) {
+  platform_.propertyLists.setValue(kFile, QXArray{"a"});
+  (void)store();
+  platform_.fileSystem.remove(kFile);
+  grant(kReport);
+  EXPECT_EQ(platform_.propertyLists.value(kFile), QXValue(listOf(kCellar, kEditor, {"report"})));
+}
+
 TEST_F(DVAccessControlStoreTest, AFileThatIsNoDictionaryIsRejectedAtStart) {
   platform_.propertyLists.setValue(kFile, QXArray{"a"});
   EXPECT_FALSE(isGranted(kReport));
