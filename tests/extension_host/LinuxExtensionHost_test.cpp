@@ -338,7 +338,7 @@ TEST_F(LinuxExtensionHostTest, AnExecutableThatDoesNotServeFailsTheMessages) {
 }
 
 TEST_F(LinuxExtensionHostTest, AnUpdatedExtensionsOldProcessEndsWithItsLastRequest) {
-  RealExtensions real;
+  RealExtensions real(times(std::chrono::hours(1)));
   Bundle bundle = real.makeBundle("com.orvane.test");
   const auto old = real.extension();
   std::string process;

@@ -34,7 +34,7 @@ class ProcessLifetimeTest : public ::testing::Test {
     ASSERT_EQ(lifetime.gone(), Next::nothing);
   }
 
-  const ExtensionTimes times;
+  const ExtensionTimes times{};
   ProcessLifetime lifetime{times};
   ProcessLifetime::Time now{std::chrono::hours(1)};
 };
