@@ -7,6 +7,7 @@
 #include <cerrno>
 #include <iostream>
 #include <memory>
+#include <nlohmann/json.hpp>
 #include <utility>
 #include <vector>
 
@@ -14,7 +15,6 @@
 #include "platform/linux/log/LogText.h"
 #include "sdk/Consumer.h"
 #include "service/DVBookmarkableString.h"
-#include "tools/docuvendctl/JSONText.h"
 
 namespace docuvend::ctl {
 namespace {
@@ -157,11 +157,16 @@ constexpr std::array kCommands = {
     Command{"put", "STRING", 1, "save the standard input as the document's new contents, all or nothing", put},
 };
 
+// Bytes that are no UTF-8 become the replacement character.
+std::string oneLine(const nlohmann::ordered_json& object) {
+  return object.dump(/*indent=*/-1, ' ', /*ensure_ascii=*/false, nlohmann::ordered_json::error_handler_t::replace);
+}
+
 void print(const Fields& fields, OutputForm form) {
   if (form == OutputForm::json) {
-    JSONObject object;
-    for (const auto& [name, text] : fields) object.add(name, text);
-    std::cout << object.text() << "\n";
+    nlohmann::ordered_json object = nlohmann::ordered_json::object();
+    for (const auto& [name, text] : fields) object[name] = text;
+    std::cout << oneLine(object) << "\n";
     return;
   }
   // A script gets the exact text; a person's terminal is not to be steered by it.
@@ -174,13 +179,7 @@ void print(const Fields& fields, OutputForm form) {
 ExitStatus fail(const QXError& error, OutputForm form) {
   const ExitStatus status = statusOf(error);
   if (form == OutputForm::json) {
-    JSONObject inner;
-    inner.add("domain", error.domain);
-    inner.add("code", error.code);
-    inner.add("description", error.description());
-    JSONObject object;
-    object.add("error", inner);
-    std::cerr << object.text() << "\n";
+    std::cerr << oneLine({{"error", {{"domain", error.domain}, {"code", error.code}, {"description", error.description()}}}}) << "\n";
   } else {
     std::cerr << "docuvendctl: " << visibleLogText(error.description()) << "\n";
   }
