@@ -5,6 +5,8 @@
 #include <sys/socket.h>
 
 #include <cerrno>
+#include <chrono>
+#include <thread>
 #include <utility>
 #include <vector>
 
@@ -12,6 +14,7 @@ namespace docuvend::linux_platform {
 namespace {
 
 constexpr int kAcceptsAtATime = 16;
+constexpr std::chrono::milliseconds kPauseWithoutDescriptors{100};
 
 UniqueDescriptor spareDescriptor() { return UniqueDescriptor(::open("/dev/null", O_RDONLY | O_CLOEXEC)); }
 
@@ -66,6 +69,7 @@ void LinuxRpcListener::acceptWaiting() {
 bool LinuxRpcListener::acceptOne() {
   UniqueDescriptor socket(::accept4(socket_, nullptr, nullptr, SOCK_CLOEXEC));
   if (socket) {
+    isStarved_ = false;
     admit(std::move(socket));
     return true;
   }
@@ -85,12 +89,16 @@ bool LinuxRpcListener::acceptOne() {
 }
 
 // Without a descriptor for it the client would stay first in line for ever and keep a thread busy: it gets the spare one, and is dropped.
+// Where even that is of no use, this thread waits a little, so that others may release something.
 void LinuxRpcListener::acceptAndDrop(int errnoValue) {
-  surroundings_.log.write(QXLogType::defaultType,
-                          "[NOTICE] Refusing a connection: " + QXError::system(errnoValue, "cannot accept it").texts.at("description"));
+  if (!std::exchange(isStarved_, true)) {
+    surroundings_.log.write(QXLogType::defaultType,
+                            "[NOTICE] Refusing connections: " + QXError::system(errnoValue, "cannot accept").texts.at("description"));
+  }
   spare_.reset();
-  UniqueDescriptor(::accept4(socket_, nullptr, nullptr, SOCK_CLOEXEC)).reset();
+  const bool dropped = static_cast<bool>(UniqueDescriptor(::accept4(socket_, nullptr, nullptr, SOCK_CLOEXEC)));
   spare_ = spareDescriptor();
+  if (!dropped) std::this_thread::sleep_for(kPauseWithoutDescriptors);
 }
 
 void LinuxRpcListener::admit(UniqueDescriptor socket) {

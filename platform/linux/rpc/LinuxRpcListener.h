@@ -59,6 +59,7 @@ class LinuxRpcListener final : public QXRpcListener, public std::enable_shared_f
 
   // Only in the listening socket's handler.
   UniqueDescriptor spare_;
+  bool isStarved_ = false;  // logged once until a client is accepted again
   std::uint64_t nextNumber_ = 0;
 
   std::mutex mutex_;  // guards the rest
