@@ -11,6 +11,7 @@
 #include <string>
 #include <thread>
 #include <utility>
+#include <vector>
 
 #include "platform/linux/base/Paths.h"
 #include "platform/linux/bundles/InstalledBundles.h"
@@ -26,6 +27,7 @@
 #include "platform/linux/identity/LinuxPeerDirectory.h"
 #include "platform/linux/log/LinuxLog.h"
 #include "platform/linux/queue/LinuxQueues.h"
+#include "platform/linux/rpc/ActivatedSockets.h"
 #include "platform/linux/rpc/LinuxRpcService.h"
 #include "platform/linux/sandbox/LinuxSandbox.h"
 #include "platform/linux/sandbox/SandboxListenerDelegate.h"
@@ -64,12 +66,15 @@ std::variant<UniqueDescriptor, QXError> takePlatformLock(const Paths& paths) {
 
 struct LinuxPlatform::Services {
   Services(Paths found, UniqueDescriptor lock)
-      : paths(std::move(found)), platformLock(std::move(lock)), rpc(reactor, peers, log.defaultLog(), publicSocketPaths(paths)) {}
+      : paths(std::move(found)),
+        platformLock(std::move(lock)),
+        rpc(reactor, peers, log.defaultLog(), publicSocketPaths(paths), std::move(activatedSockets)) {}
 
   // In the order in which they lean on each other.
   const Paths paths;
   const UniqueDescriptor platformLock;
   LinuxLog log{LinuxLogOptions::fromEnvironment(kProgramName)};
+  std::vector<ActivatedSocket> activatedSockets = takeActivatedSockets(log.defaultLog());  // before anything has threads; given to `rpc`
   LinuxQueues& queues = LinuxQueues::processWide();
   LinuxFileSystem fileSystem{paths};
   LinuxPropertyLists propertyLists;
