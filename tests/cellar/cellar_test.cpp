@@ -124,7 +124,8 @@ TEST_F(CellarTest, ACrashInTheMiddleIsAnErrorAndTheNextTryWorks) {
   EXPECT_TRUE(ask("_startProvidingItemAtURL:completion:", {url("letter.txt")}));
   EXPECT_EQ(read(local("letter.txt")), std::string(text.size(), '\0'));
   EXPECT_FALSE(fs::exists(container() + "/crash-once"));
-  ASSERT_FALSE(ask("_startProvidingItemAtURL:completion:", {url("letter.txt")}));
+  const auto error = ask("_startProvidingItemAtURL:completion:", {url("letter.txt")});
+  ASSERT_FALSE(error) << error->description();
   EXPECT_EQ(read(local("letter.txt")), text);
 }
 

@@ -11,7 +11,10 @@ std::optional<QXValue> ExtensionConnection::valueForEntitlement(const std::strin
 }
 
 std::shared_ptr<QXRpcProxy> ExtensionConnection::remoteObjectProxy(QXErrorHandler errorHandler) {
-  return process_->remoteObjectProxy(std::move(errorHandler));
+  return process_->remoteObjectProxy([onFailedMessage = onFailedMessage_, errorHandler = std::move(errorHandler)](const QXError& error) {
+    onFailedMessage();
+    if (errorHandler) errorHandler(error);
+  });
 }
 
 }  // namespace docuvend::linux_platform

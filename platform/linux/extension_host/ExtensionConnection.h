@@ -1,6 +1,7 @@
 // The daemon's side of one request: the connection to the extension's process as the requests see it.
 #pragma once
 
+#include <functional>
 #include <memory>
 #include <optional>
 #include <string>
@@ -15,8 +16,9 @@ namespace docuvend::linux_platform {
 // of the bundle; it has no audit token of its own, because it was not it that connected.
 class ExtensionConnection : public QXRpcConnection {
  public:
-  ExtensionConnection(std::shared_ptr<ExtensionProcess> process, QXDictionary entitlements)
-      : process_(std::move(process)), entitlements_(std::move(entitlements)) {}
+  // `onFailedMessage` is called for each message of this request that failed, before the sender's own handler.
+  ExtensionConnection(std::shared_ptr<ExtensionProcess> process, QXDictionary entitlements, std::function<void()> onFailedMessage)
+      : process_(std::move(process)), entitlements_(std::move(entitlements)), onFailedMessage_(std::move(onFailedMessage)) {}
 
   void setExportedInterface(QXRpcInterface) override {}
   void setExportedObject(std::shared_ptr<QXRpcExportedObject>) override {}
@@ -29,6 +31,7 @@ class ExtensionConnection : public QXRpcConnection {
  private:
   std::shared_ptr<ExtensionProcess> process_;
   QXDictionary entitlements_;
+  std::function<void()> onFailedMessage_;
 };
 
 class ExtensionContext : public QXExtensionContext {

@@ -18,14 +18,13 @@
 #include <signal.h>
 #include <sys/epoll.h>
 #include <sys/wait.h>
-#include "platform/linux/base/pidfd.h"
 
 #include <chrono>
 #include <utility>
 
+#include "platform/linux/base/pidfd.h"
 #include "platform/linux/extension_host/ExtensionErrors.h"
 #include "platform/linux/extension_host/ProcessTree.h"
-#include "platform/linux/extension_host/pidfd.h"
 
 namespace docuvend::linux_platform {
 namespace {
@@ -178,13 +177,14 @@ bool ExtensionProcess::reap() {
     isReaped_ = true;
     if (isLetGo_) importance = QXLogType::info;
     before = std::exchange(stage_, Stage::killed);
+    // Before the messages fail: whoever tries again then must not be sent to this process.
+    if (before == Stage::alive) handlers_.onLost(ProcessLifetime::Cause::died);
   }
   if (before == Stage::alive) {
     endpoint_->close(extensionHostError(ExtensionHostErrorCode::ended, "The process of " + identifier_ + " " + how + "."));
   }
   note(importance, how);
   const std::lock_guard lock(eventMutex_);
-  if (before == Stage::alive) handlers_.onLost(ProcessLifetime::Cause::died);
   handlers_.onGone();
   return true;
 }

@@ -107,7 +107,12 @@ void LinuxExtension::cancelExtensionRequest(const QXUUID& request) {
 std::shared_ptr<QXExtensionContext> LinuxExtension::extensionContextForRequest(const QXUUID& request) {
   const std::lock_guard lock(mutex_);
   if (!process_ || !lifetime_.isOpen(request)) return nullptr;
-  return std::make_shared<ExtensionContext>(std::make_shared<ExtensionConnection>(process_, bundle_.entitlements));
+  // Whoever sent a message that failed leaves its request open, for ever: the request has nothing more to come and ends here.
+  auto onFailedMessage = [weak = weak_from_this(), request] {
+    if (const auto strongSelf = weak.lock()) strongSelf->cancelExtensionRequest(request);
+  };
+  return std::make_shared<ExtensionContext>(
+      std::make_shared<ExtensionConnection>(process_, bundle_.entitlements, std::move(onFailedMessage)));
 }
 
 void LinuxExtension::retire() {

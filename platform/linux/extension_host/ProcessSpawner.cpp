@@ -4,7 +4,6 @@
 #include <signal.h>
 #include <spawn.h>
 #include <sys/wait.h>
-#include "platform/linux/base/pidfd.h"
 
 #include <algorithm>
 #include <cassert>
@@ -13,7 +12,7 @@
 #include <utility>
 #include <vector>
 
-#include "platform/linux/extension_host/pidfd.h"
+#include "platform/linux/base/pidfd.h"
 
 namespace docuvend::linux_platform {
 namespace {

@@ -11,7 +11,7 @@
 #include <fstream>
 #include <string>
 
-#include "platform/linux/extension_host/pidfd.h"
+#include "platform/linux/base/pidfd.h"
 
 namespace docuvend::linux_platform {
 

@@ -36,10 +36,10 @@ void Timer::setFor(std::chrono::steady_clock::time_point time) {
   // The steady clock is CLOCK_MONOTONIC. A zero time would switch the timer off; one that is past fires at once.
   const auto since = std::max(time.time_since_epoch(), std::chrono::steady_clock::duration(1));
   const auto seconds = std::chrono::duration_cast<std::chrono::seconds>(since);
-  itimerspec specification{};
-  specification.it_value.tv_sec = seconds.count();
-  specification.it_value.tv_nsec = std::chrono::duration_cast<std::chrono::nanoseconds>(since - seconds).count();
-  timerfd_settime(state_->descriptor.get(), TFD_TIMER_ABSTIME, &specification, nullptr);
+  itimerspec setting{};
+  setting.it_value.tv_sec = seconds.count();
+  setting.it_value.tv_nsec = std::chrono::duration_cast<std::chrono::nanoseconds>(since - seconds).count();
+  timerfd_settime(state_->descriptor.get(), TFD_TIMER_ABSTIME, &setting, nullptr);
 }
 
 }  // namespace docuvend::linux_platform
