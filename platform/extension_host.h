@@ -49,7 +49,7 @@ class QXExtension {
 
   // Starts the extension's process or reaches the running one. No input items.
   virtual void beginExtensionRequest(BeginCompletion completion) = 0;
-  // Unknown identifiers are ignored.
+  // Unknown identifiers are ignored. A request of which a message failed has ended by itself.
   virtual void cancelExtensionRequest(const QXUUID& request) = 0;
   // None when the request is unknown, or its process is gone.
   [[nodiscard]] virtual std::shared_ptr<QXExtensionContext> extensionContextForRequest(const QXUUID& request) = 0;

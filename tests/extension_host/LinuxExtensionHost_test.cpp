@@ -15,7 +15,7 @@
 
 #include "platform/linux/base/UniqueDescriptor.h"
 #include "platform/linux/extension_host/ExtensionErrors.h"
-#include "platform/linux/extension_host/pidfd.h"
+#include "platform/linux/base/pidfd.h"
 #include "tests/extension_host/support/RealExtensions.h"
 
 namespace docuvend::linux_platform {
@@ -231,6 +231,23 @@ TEST_F(LinuxExtensionHostTest, AMessageToAProcessThatIsGoneFails) {
   const auto late = await(conversation.identify("process"));
   ASSERT_TRUE(late);
   EXPECT_TRUE(late->error);
+}
+
+TEST_F(LinuxExtensionHostTest, ARequestEndsWithTheFailureOfItsMessageAndItsLivingProcessCanBecomeIdle) {
+  RealExtensions real(times(milliseconds(1)));
+  const auto extension = real.extension();
+  const auto begun = begin(*extension);
+  ASSERT_TRUE(begun && begun->request);
+  const auto context = extension->extensionContextForRequest(*begun->request);
+  ASSERT_TRUE(context);
+  std::promise<QXError> failed;
+  const QXRemote<_QXDocuvendVendor> vendor(
+      context->auxiliaryConnection()->remoteObjectProxy([&failed](const QXError& error) { failed.set_value(error); }));
+  // No text on the wire holds this character: the message fails and the process lives.
+  vendor.call<&_QXDocuvendVendor::_URLForItemIdentifier>(ItemID{"\x01"}, [](std::optional<QXError>, std::optional<QXURL>) {});
+  ASSERT_TRUE(await(failed.get_future()));
+  EXPECT_EQ(extension->extensionContextForRequest(*begun->request), nullptr);
+  EXPECT_TRUE(real.awaitLog("[INFO] The process of com.orvane.test exited with status 0."));
 }
 
 TEST_F(LinuxExtensionHostTest, AfterTheSecondQuickDeathRequestsFailAtOnce) {

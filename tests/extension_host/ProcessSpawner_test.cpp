@@ -20,7 +20,7 @@
 #include <vector>
 
 #include "platform/linux/extension_host/ProcessTree.h"
-#include "platform/linux/extension_host/pidfd.h"
+#include "platform/linux/base/pidfd.h"
 
 namespace docuvend::linux_platform {
 namespace {

@@ -9,6 +9,7 @@
 
 #include "platform/linux/base/UniqueDescriptor.h"
 #include "platform/linux/base/kernel.h"
+#include "platform/linux/base/pidfd.h"
 #include "platform/linux/identity/ProcessReading.h"
 #include "platform/linux/launch/policy/Landlock.h"
 
@@ -45,7 +46,7 @@ KernelFacilities KernelFacilities::probe() {
   KernelFacilities facilities;
   facilities.peerPidfd = probePeerPidfd();
   facilities.landlockLevel = docuvend::linux_platform::landlockLevel();
-  const UniqueDescriptor self = openProcess(::getpid());
+  const UniqueDescriptor self = openPidfd(::getpid());
   if (!self) return facilities;
   const UniqueDescriptor mountNamespace(::ioctl(self.get(), kernel::kPidfdGetMountNamespace, 0));
   facilities.pidfdNamespaces = static_cast<bool>(mountNamespace);

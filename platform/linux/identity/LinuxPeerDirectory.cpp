@@ -10,6 +10,7 @@
 #include <utility>
 
 #include "platform/linux/base/kernel.h"
+#include "platform/linux/base/pidfd.h"
 #include "platform/linux/identity/ProcessReading.h"
 
 namespace docuvend::linux_platform {
@@ -30,7 +31,7 @@ std::array<std::uint8_t, 16> readBoot() {
 }
 
 UniqueDescriptor openPeer(int socket, pid_t pid, const KernelFacilities& facilities) {
-  if (!facilities.peerPidfd) return openProcess(pid);
+  if (!facilities.peerPidfd) return openPidfd(pid);
   int number = -1;
   socklen_t size = sizeof(number);
   if (::getsockopt(socket, SOL_SOCKET, SO_PEERPIDFD, &number, &size) != 0) return {};

@@ -117,8 +117,6 @@ std::optional<std::uint64_t> readSerial(pid_t pid, const UniqueDescriptor& pidfd
 
 }  // namespace
 
-UniqueDescriptor openProcess(pid_t pid) { return UniqueDescriptor(static_cast<int>(::syscall(SYS_pidfd_open, pid, 0))); }
-
 bool isAlive(const UniqueDescriptor& pidfd) {
   pollfd waiting{pidfd.get(), POLLIN, 0};
   return pidfd && ::poll(&waiting, 1, 0) == 0;

@@ -15,9 +15,6 @@
 
 namespace docuvend::linux_platform {
 
-// Holds the process that has that number now; empty when there is none.
-[[nodiscard]] UniqueDescriptor openProcess(pid_t pid);
-
 // True while the process has not ended.
 [[nodiscard]] bool isAlive(const UniqueDescriptor& pidfd);
 
