@@ -8,6 +8,7 @@
 #include <unistd.h>
 
 #include <algorithm>
+#include <ostream>
 #include <vector>
 
 #include "platform/linux/wire/Limits.h"
@@ -83,6 +84,7 @@ struct Malformation {
   Bytes bytes;
   std::string reason;
 };
+void PrintTo(const Malformation& malformation, std::ostream* out) { *out << malformation.reason; }
 
 std::vector<Malformation> malformations() {
   std::vector<Malformation> all = {

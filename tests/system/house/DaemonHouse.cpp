@@ -85,6 +85,8 @@ DaemonHouse::DaemonHouse() {
 DaemonHouse::~DaemonHouse() {
   endDaemon(SIGTERM);
   expectNothingLeft();
+  // In a build with sanitizers: what they say of the daemon and of its extensions.
+  EXPECT_EQ(loggedContaining("Sanitizer: ") + loggedContaining("runtime error: "), 0);
   if (::testing::Test::HasFailure()) std::cerr << "--- the daemon's log\n" << contentsOf(logFile()) << "---\n";
   std::error_code ignored;
   fs::remove_all(root_, ignored);
