@@ -74,6 +74,8 @@ class Endpoint::State final : public AnswerSink, public std::enable_shared_from_
   void run(ReplyFrame reply);
   void run(FailureFrame failure);
   void run(EndFrame end) { close(end.error, Farewell::silent); }
+  // The message that an answer is for, taken out. None when it has been answered before, or was never sent: then the connection ends.
+  std::optional<OutgoingCalls::Call> settle(std::uint64_t callID);
   void closeMalformed(const Malformed& malformed);
 
   // With the mutex held.
@@ -209,19 +211,21 @@ void Endpoint::State::run(RequestFrame request) {
   incoming.run(std::move(request), shared_from_this());
 }
 
-void Endpoint::State::run(ReplyFrame reply) {
+std::optional<OutgoingCalls::Call> Endpoint::State::settle(std::uint64_t callID) {
   OutgoingCalls::Forgotten forgotten;
   std::optional<OutgoingCalls::Call> call;
   bool issued = false;
   {
     const std::lock_guard lock(mutex_);
-    issued = outgoing_.wasIssued(reply.callID);
-    call = outgoing_.settle(reply.callID, forgotten);
+    issued = outgoing_.wasIssued(callID);
+    call = outgoing_.settle(callID, forgotten);
   }
-  if (!issued) {
-    closeMalformed({"an answer to a request that was not made"});
-    return;
-  }
+  if (!issued) closeMalformed({"an answer to a request that was not made"});
+  return call;
+}
+
+void Endpoint::State::run(ReplyFrame reply) {
+  const auto call = settle(reply.callID);
   if (!call || !call->reply) return;
   if (const auto mismatch = qxMismatch(call->replies, reply.values)) {
     if (*call->errorHandler) (*call->errorHandler)(failure(QXRpcErrorCode::invalidReply, *mismatch));
@@ -231,19 +235,8 @@ void Endpoint::State::run(ReplyFrame reply) {
 }
 
 void Endpoint::State::run(FailureFrame failure) {
-  OutgoingCalls::Forgotten forgotten;
-  std::optional<OutgoingCalls::Call> call;
-  bool issued = false;
-  {
-    const std::lock_guard lock(mutex_);
-    issued = outgoing_.wasIssued(failure.callID);
-    call = outgoing_.settle(failure.callID, forgotten);
-  }
-  if (!issued) {
-    closeMalformed({"an answer to a request that was not made"});
-  } else if (call && *call->errorHandler) {
-    (*call->errorHandler)(failure.error);
-  }
+  const auto call = settle(failure.callID);
+  if (call && *call->errorHandler) (*call->errorHandler)(failure.error);
 }
 
 void Endpoint::State::closeMalformed(const Malformed& malformed) {
