@@ -226,6 +226,32 @@ TEST_F(DVRpcServicerBookmarksTest, AProviderThatIsNotRegisteredNeverAnswers) {
   EXPECT_EQ(logged(), (Entries{{QXLogType::debug, "[DEBUG] Getting URL from bookmarkable string: “docuvend:com.orvane.nobody/item 7”."}}));
 }
 
+TEST_F(DVRpcServicerBookmarksTest, AReplyThatNeverComesIsNotKept) {
+  grant(kNobody, kItem, kEditor);
+  const auto alive = std::make_shared<int>(0);
+  servicer_->documentURLFromBookmarkableString(
+      "docuvend:com.orvane.nobody/item 7",
+      [alive](std::optional<QXURL>, std::optional<QXData>, std::optional<QXURL>, std::optional<QXData>, std::optional<QXError>) {});
+  platform_.queues.runAll();
+  EXPECT_EQ(alive.use_count(), 1);
+}
+
+TEST_F(DVRpcServicerBookmarksTest, AFailureAfterTheAnswerIsToleratedInBothDirections) {
+  grantToEditor();
+  answerItemID(*cellar_, /*error=*/std::nullopt, kItem.value);
+  toString(kReport);
+  cellar_->vendor().failLastDelivery(kExtensionError);
+  ASSERT_EQ(answers_.size(), 2U);
+  EXPECT_TRUE(answers_[0].string);
+  EXPECT_EQ(answers_[1].error, DVPluginOperationFailedError(kExtensionError));
+  answerURL(*cellar_, /*error=*/std::nullopt, kReport);
+  toURL(kString);
+  cellar_->vendor().failLastDelivery(kExtensionError);
+  ASSERT_EQ(answers_.size(), 4U);
+  EXPECT_EQ(answers_[2].url, kReport);
+  EXPECT_EQ(answers_[3].error, DVSandboxExtensionFailedError(std::nullopt));
+}
+
 TEST_F(DVRpcServicerBookmarksTest, AProviderThatCannotMapTheItemFailsTheRequestAndItsErrorIsDropped) {
   grantToEditor();
   answerURL(*cellar_, kExtensionError, /*url=*/std::nullopt);

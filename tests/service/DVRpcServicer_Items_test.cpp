@@ -64,6 +64,15 @@ TEST_F(DVRpcServicerItemsTest, AProviderThatCannotStartGivesItsErrorToTheConsume
   EXPECT_EQ(logged(), (Entries{{QXLogType::debug, kServing}}));
 }
 
+TEST_F(DVRpcServicerItemsTest, AFailureAfterTheAnswerIsTolerated) {
+  grant(kCellar, kItem, kEditor);
+  start(kReport, kCellar, kEditor);
+  cellar_->vendor().failLastDelivery(kExtensionError);
+  ASSERT_EQ(answers_.size(), 2U);
+  EXPECT_EQ(answers_[0].error, std::nullopt);
+  EXPECT_EQ(answers_[1].error, DVPluginOperationFailedError(kExtensionError));
+}
+
 TEST_F(DVRpcServicerItemsTest, ChangesNothingInTheAccessControlList) {
   grant(kCellar, kItem, kEditor);
   start(kReport, kCellar, kEditor);

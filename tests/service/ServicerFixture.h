@@ -25,7 +25,7 @@ class StoreSource final : public DVAccessControlSource {
   std::weak_ptr<DVAccessControlStore> store;
 };
 
-// What a reply handler was given, and on which queue.
+// What a reply handler was given, on which queue, and how many lines this room had logged by then.
 struct Answer {
   std::optional<QXError> error = std::nullopt;
   std::optional<QXData> itemToken = std::nullopt;
@@ -35,6 +35,7 @@ struct Answer {
   std::optional<std::string> string = std::nullopt;
   std::optional<QXURL> url = std::nullopt;
   std::string queue = {};
+  std::size_t linesBefore = 0;
 
   [[nodiscard]] bool hasNoValue() const { return !itemToken && !siblingURL && !siblingToken && !providers && !string && !url; }
 };
@@ -134,6 +135,7 @@ class ServicerFixture : public testing::Test {
     EXPECT_EQ(answers_.size(), 1U);
     if (answers_.empty()) answers_.emplace_back();
     EXPECT_EQ(answers_.front().queue, fake_platform::kFakeGlobalQueueLabel);
+    EXPECT_EQ(answers_.front().linesBefore, logged().size()) << "what is logged is logged before the answer";
     return answers_.front();
   }
   // The one answer: the extension's own brought it.
@@ -142,6 +144,7 @@ class ServicerFixture : public testing::Test {
     if (answers_.empty()) answers_.emplace_back();
     EXPECT_EQ(answers_.front().queue, "");
     EXPECT_EQ(platform_.queues.pending(), 0U);
+    EXPECT_EQ(answers_.front().linesBefore, logged().size()) << "what is logged is logged before the answer";
     return answers_.front();
   }
 
@@ -186,6 +189,7 @@ class ServicerFixture : public testing::Test {
 
   void note(Answer answer) {
     answer.queue = platform_.queues.currentLabel();
+    answer.linesBefore = logged().size();
     answers_.push_back(std::move(answer));
   }
 };

@@ -5,6 +5,7 @@
 
 #include <algorithm>
 #include <filesystem>
+#include <fstream>
 
 #include "tests/system/house/DaemonHouse.h"
 
@@ -34,6 +35,27 @@ TEST_F(Start, SaysSoWithItsProgramsPath) {
   EXPECT_EQ(house_.logged("[NOTICE] " + std::string(DOCUVEND_BIN) + "/docuvendd starting."), 1);
   EXPECT_EQ(house_.logged("[DEBUG] Debug logging enabled."), 1);
   EXPECT_EQ(house_.logged("[INFO] Server starting."), 1);
+}
+
+TEST_F(Start, ItsFirstLinesAreTheStartThenTheListThenTheServer) {
+  const std::string directory = house_.home() + "/Library/Docuvend";
+  std::filesystem::create_directories(directory);
+  std::ofstream(directory + "/AccessControl.plist")
+      << "<?xml version=\"1.0\" encoding=\"UTF-8\"?>\n<plist version=\"1.0\"><dict/></plist>\n";
+  house_.startDaemon();
+  const std::string accepted = "[INFO] New connection accepted.";
+  ASSERT_TRUE(house_.awaitLog(accepted, 1));
+  const auto log = house_.log();
+  const auto line = [&log](const std::string& start) {
+    const auto found = std::find_if(log.begin(), log.end(), [&start](const std::string& entry) { return entry.starts_with(start); });
+    return found - log.begin();
+  };
+  EXPECT_EQ(line("[NOTICE] " + std::string(DOCUVEND_BIN) + "/docuvendd starting."), 0);
+  EXPECT_EQ(line("[DEBUG] Debug logging enabled."), 1);
+  EXPECT_LT(line("[DEBUG] Debug logging enabled."), line("[INFO] Successfully read access control from disk."));
+  EXPECT_LT(line("[INFO] Successfully read access control from disk."), line("[INFO] Server starting."));
+  EXPECT_LT(line("[INFO] Server starting."), line("[INFO] Updating provider list."));
+  EXPECT_LT(line("[INFO] Updating provider list."), line(accepted));
 }
 
 TEST_F(Start, EveryConnectionIsAcceptedAndLoggedOnce) {
