@@ -32,7 +32,7 @@ std::optional<QXError> problemWithProvider(const std::string& place, const QXVal
   const auto* provider = value.as<QXDictionary>();
   if (provider == nullptr) return misshapen(place, "a dictionary");
   for (const auto& [consumerID, consumer] : *provider) {
-    if (auto problem = problemWithConsumer(place + ", consumer " + consumerID, consumer)) return problem;
+    if (auto problem = problemWithConsumer(std::string(place).append(", consumer ").append(consumerID), consumer)) return problem;
   }
   return std::nullopt;
 }
