@@ -382,20 +382,5 @@ TEST_F(LinuxRpcServiceTest, TheServiceMayCallItsClients) {
   EXPECT_EQ(texts.take(), std::optional<std::string>("b"));
 }
 
-TEST_F(LinuxRpcServiceTest, AConnectionOverASocketPairHasNoIdentity) {
-  auto [ours, theirs] = tests::socketPair();
-  const auto connection = connectionOverSocket(driver.reactor, driver.log.defaultLog(), std::move(ours), 4711,
-                                               [this](const QXError& reason) { closed.put(reason); });
-  EXPECT_EQ(connection->processIdentifier(), 0);
-  EXPECT_EQ(connection->auditToken(), QXAuditToken{});
-  EXPECT_EQ(connection->valueForEntitlement("right"), std::nullopt);
-  connection->resume();
-  const RawPeer raw(std::move(theirs));
-  ASSERT_TRUE(raw.read<Hello>());
-  raw.write(std::vector<std::uint8_t>{0, 0, 0, 0});
-  EXPECT_THAT(closed.take(), IsRpcError(QXRpcErrorCode::malformedFrame));
-  EXPECT_THAT(driver.log.texts(), testing::ElementsAre("[NOTICE] Closing the connection of PID 4711: a frame without a head"));
-}
-
 }  // namespace
 }  // namespace docuvend::linux_platform

@@ -31,13 +31,6 @@ std::shared_ptr<LinuxRpcConnection> LinuxRpcConnection::create(Reactor& reactor,
   return connection;
 }
 
-std::shared_ptr<LinuxRpcConnection> connectionOverSocket(Reactor& reactor, QXLogHandle& log, UniqueDescriptor socket, int loggedProcess,
-                                                         LinuxRpcConnection::EndHandler onEnd) {
-  std::shared_ptr<LinuxRpcConnection> connection(new LinuxRpcConnection(nullptr));
-  connection->endpoint_ = Endpoint::create(reactor, std::move(socket), Hello{}, handlersFor(log, loggedProcess, std::move(onEnd)));
-  return connection;
-}
-
 std::optional<QXError> LinuxRpcConnection::peerSaidHello(PeerDirectory& peers, const Hello& hello) {
   if (!hello.declaredBundle) return std::nullopt;
   auto declared = peers.declare(*peer(), *hello.declaredBundle);
@@ -61,19 +54,13 @@ void LinuxRpcConnection::setExportedObject(std::shared_ptr<QXRpcExportedObject> 
 
 void LinuxRpcConnection::resume() { endpoint_->resume(); }
 
-int LinuxRpcConnection::processIdentifier() const {
-  const auto known = peer();
-  return known ? known->pid : 0;
-}
+int LinuxRpcConnection::processIdentifier() const { return peer()->pid; }
 
-QXAuditToken LinuxRpcConnection::auditToken() const {
-  const auto known = peer();
-  return known ? known->token : QXAuditToken{};
-}
+QXAuditToken LinuxRpcConnection::auditToken() const { return peer()->token; }
 
 std::optional<QXValue> LinuxRpcConnection::valueForEntitlement(const std::string& name) const {
   const auto known = peer();
-  if (!known || known->standing == Standing::nobody) return std::nullopt;
+  if (known->standing == Standing::nobody) return std::nullopt;
   const auto found = known->entitlements.find(name);
   if (found == known->entitlements.end()) return std::nullopt;
   return found->second;

@@ -41,9 +41,6 @@ class LinuxRpcConnection final : public QXRpcConnection, public std::enable_shar
   void close(const QXError& reason);
 
  private:
-  friend std::shared_ptr<LinuxRpcConnection> connectionOverSocket(Reactor& reactor, QXLogHandle& log, UniqueDescriptor socket,
-                                                                  int loggedProcess, EndHandler onEnd);
-
   explicit LinuxRpcConnection(std::shared_ptr<const PeerIdentity> peer) : peer_(std::move(peer)) {}
   [[nodiscard]] std::optional<QXError> peerSaidHello(PeerDirectory& peers, const Hello& hello);
   [[nodiscard]] std::shared_ptr<const PeerIdentity> peer() const;
@@ -51,13 +48,7 @@ class LinuxRpcConnection final : public QXRpcConnection, public std::enable_shar
   std::shared_ptr<Endpoint> endpoint_;  // constant after creation
 
   mutable std::mutex mutex_;
-  std::shared_ptr<const PeerIdentity> peer_;  // null: no identity; a declaration replaces it
+  std::shared_ptr<const PeerIdentity> peer_;  // guarded by mutex_, never null; a declaration replaces it
 };
-
-// A connection over one end of a socket pair, whose other end a process was given that this one started. It has no identity: process
-// identifier 0, the zero token, no entitlements. `loggedProcess` names the peer in the log. The owner holds the connection: released, it
-// ends.
-[[nodiscard]] std::shared_ptr<LinuxRpcConnection> connectionOverSocket(Reactor& reactor, QXLogHandle& log, UniqueDescriptor socket,
-                                                                       int loggedProcess, LinuxRpcConnection::EndHandler onEnd);
 
 }  // namespace docuvend::linux_platform
