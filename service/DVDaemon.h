@@ -44,12 +44,27 @@ class DVDaemon {
   virtual void extendSandboxForFileURL(std::optional<QXURL> url, std::optional<ProviderID> fromProviderID,
                                        std::optional<ConsumerID> toConsumerID, SandboxReply completionHandler) = 0;
 
-  // Has the provider materialise the item. Needs "com.orvane.docuvend.acl-read" or "com.orvane.docuvend.acl-write", and a grant.
+  // Has the provider make a placeholder for the item. Needs "com.orvane.docuvend.acl-read" or "com.orvane.docuvend.acl-write", and a grant.
+  // The provider is found by its identifier alone: it is the provider's to refuse a URL that is not its own.
+  virtual void providePlaceholderForItemAtURL(std::optional<QXURL> url, std::optional<ProviderID> fromProviderID,
+                                              std::optional<ConsumerID> forConsumerID, ErrorReply completionHandler) = 0;
+
+  // Has the provider materialise the item. Needs either entitlement, and a grant.
   virtual void startProvidingItemAtURL(std::optional<QXURL> url, std::optional<ProviderID> fromProviderID,
                                        std::optional<ConsumerID> forConsumerID, ErrorReply completionHandler) = 0;
 
+  // Tells the provider that the consumer needs the item's contents no longer. Needs either entitlement, and no grant. The reply always
+  // carries an error: DVPluginOperationFailedError with nothing beneath it is success.
+  virtual void stopProvidingItemAtURL(std::optional<QXURL> url, std::optional<ProviderID> fromProviderID,
+                                      std::optional<ConsumerID> forConsumerID, ErrorReply completionHandler) = 0;
+
   // Lists the providers. Needs either entitlement.
   virtual void providersCompletionHandler(ProvidersReply completionHandler) = 0;
+
+  // Grants the consumer the item and names it in a form that outlives its URL. Needs no entitlement: the caller must be a bundle, and one
+  // that may write the file already.
+  virtual void extendBookmarkForFileURL(std::optional<QXURL> url, std::optional<ConsumerID> toConsumerID,
+                                        StringReply completionHandler) = 0;
 
   // Names the document in a form that outlives its URL. Needs no right. Neither string nor error: no provider owns the URL.
   virtual void bookmarkableStringFromDocumentURL(std::optional<QXURL> url, StringReply completion) = 0;
@@ -65,8 +80,12 @@ struct QXProtocolTable<DVDaemon> {
   static constexpr auto operations = std::tuple{
       QXOperation<&DVDaemon::wakeUpCompletion>{"wakeUpCompletion:"},
       QXOperation<&DVDaemon::extendSandboxForFileURL>{"extendSandboxForFileURL:fromProviderID:toConsumerID:completionHandler:"},
+      QXOperation<&DVDaemon::providePlaceholderForItemAtURL>{
+          "providePlaceholderForItemAtURL:fromProviderID:forConsumerID:completionHandler:"},
       QXOperation<&DVDaemon::startProvidingItemAtURL>{"startProvidingItemAtURL:fromProviderID:forConsumerID:completionHandler:"},
+      QXOperation<&DVDaemon::stopProvidingItemAtURL>{"stopProvidingItemAtURL:fromProviderID:forConsumerID:completionHandler:"},
       QXOperation<&DVDaemon::providersCompletionHandler>{"providersCompletionHandler:"},
+      QXOperation<&DVDaemon::extendBookmarkForFileURL>{"extendBookmarkForFileURL:toConsumerID:completionHandler:"},
       QXOperation<&DVDaemon::bookmarkableStringFromDocumentURL>{"bookmarkableStringFromDocumentURL:completion:"},
       QXOperation<&DVDaemon::documentURLFromBookmarkableString>{"documentURLFromBookmarkableString:completion:"},
   };

@@ -43,9 +43,14 @@ class DVRpcServicer final : public DVDaemon, public std::enable_shared_from_this
   void wakeUpCompletion(Done completion) override;
   void extendSandboxForFileURL(std::optional<QXURL> url, std::optional<ProviderID> fromProviderID, std::optional<ConsumerID> toConsumerID,
                                SandboxReply completionHandler) override;
+  void providePlaceholderForItemAtURL(std::optional<QXURL> url, std::optional<ProviderID> fromProviderID,
+                                      std::optional<ConsumerID> forConsumerID, ErrorReply completionHandler) override;
   void startProvidingItemAtURL(std::optional<QXURL> url, std::optional<ProviderID> fromProviderID, std::optional<ConsumerID> forConsumerID,
                                ErrorReply completionHandler) override;
+  void stopProvidingItemAtURL(std::optional<QXURL> url, std::optional<ProviderID> fromProviderID, std::optional<ConsumerID> forConsumerID,
+                              ErrorReply completionHandler) override;
   void providersCompletionHandler(ProvidersReply completionHandler) override;
+  void extendBookmarkForFileURL(std::optional<QXURL> url, std::optional<ConsumerID> toConsumerID, StringReply completionHandler) override;
   void bookmarkableStringFromDocumentURL(std::optional<QXURL> url, StringReply completion) override;
   void documentURLFromBookmarkableString(std::optional<std::string> string, DocumentReply completion) override;
 
@@ -54,6 +59,7 @@ class DVRpcServicer final : public DVDaemon, public std::enable_shared_from_this
 
   // What a request carries from its first step to its reply.
   struct SandboxRequest;
+  struct BookmarkRequest;
   struct ItemRequest;
   struct StringRequest;
   struct DocumentRequest;
@@ -64,13 +70,18 @@ class DVRpcServicer final : public DVDaemon, public std::enable_shared_from_this
   // Null when the server or its store has gone away.
   [[nodiscard]] std::shared_ptr<DVAccessControlStore> accessControlStore() const;
 
-  // --- Sandbox grant
+  // --- Grants
   void recordGrantAndIssueTokens(const SandboxRequest& request, const std::optional<QXError>& error,
                                  const std::optional<ItemID>& itemID) const;
   void replyWithTokens(const SandboxRequest& request) const;
+  void recordGrantAndReplyWithString(const BookmarkRequest& request, const std::optional<QXError>& error,
+                                     const std::optional<ItemID>& itemID) const;
 
-  // --- Start providing
-  void startProvidingIfAllowed(const ItemRequest& request, const std::optional<QXError>& error, const std::optional<ItemID>& itemID) const;
+  // --- Item operations
+  // False: the client has been answered.
+  [[nodiscard]] bool clientMayAskForItems(const ErrorReply& reply) const;
+  void forwardIfAllowed(ItemRequest request) const;
+  void forwardItem(const ItemRequest& request, const std::optional<QXError>& error, const std::optional<ItemID>& itemID) const;
 
   // --- Bookmarkable strings
   static void replyWithString(const StringRequest& request, const std::optional<QXError>& error, const std::optional<ItemID>& itemID);

@@ -3,6 +3,7 @@
 #include "common/DVErrors.h"
 #include "common/DVLog.h"
 #include "providers/DVExtensionDocuvend.h"
+#include "service/DVBookmarkableString.h"
 #include "service/DVRequests.h"
 #include "service/DVRpcServicer.h"
 #include "service/DVSandboxTokens.h"
@@ -20,6 +21,13 @@ struct DVRpcServicer::SandboxRequest {
   ConsumerID consumerID;
   Provider provider;
   SandboxReply reply;
+};
+
+struct DVRpcServicer::BookmarkRequest {
+  QXURL url;
+  ConsumerID consumerID;
+  Provider provider;
+  StringReply reply;
 };
 
 void DVRpcServicer::extendSandboxForFileURL(std::optional<QXURL> url, std::optional<ProviderID> fromProviderID,
@@ -74,6 +82,49 @@ void DVRpcServicer::replyWithTokens(const SandboxRequest& request) const {
   dvLog("[INFO] Successfully extended sandbox for URL %@ from provider ID %@ to consumer ID %@.", request.url, request.providerID,
         request.consumerID);
   if (request.reply) request.reply(/*error=*/std::nullopt, tokens->item, tokens->siblingURL, tokens->sibling);
+}
+
+void DVRpcServicer::extendBookmarkForFileURL(std::optional<QXURL> url, std::optional<ConsumerID> toConsumerID,
+                                             StringReply completionHandler) {
+  const auto caller = clientBundleIdentifier();
+  dvLog("[DEBUG] Extending bookmark privileges for URL: “%@” from bundle %@ to %@.", url, caller, toConsumerID);
+  std::optional<QXError> error;
+  if (!toConsumerID || !caller) error = DVNotPermittedError();
+  // Asked in any case. Who passes on a document must be able to write it already.
+  if (!url || !clientHasSandboxAccessToFile(*url)) error = DVNotPermittedError();
+
+  Provider provider;
+  if (!error) {
+    provider = DVExtensionDocuvend::providerForURL(*url);
+    if (!provider) error = DVNotFoundErrorURL(*url);
+  }
+  if (error) {
+    dvLog("[ERROR] Could not extend bookmark privileges for URL %@ from bundle %@ to consumer ID %@, error: %@", url, caller, toConsumerID,
+          *error);
+    dvSubmitError(std::move(completionHandler), *std::move(error));
+    return;
+  }
+
+  BookmarkRequest request{*std::move(url), *std::move(toConsumerID), provider, std::move(completionHandler)};
+  const QXURL itemURL = request.url;
+  provider->itemIDForURL(itemURL, [strongSelf = shared_from_this(), request = std::move(request)](std::optional<QXError> failure,
+                                                                                                  std::optional<ItemID> itemID) {
+    strongSelf->recordGrantAndReplyWithString(request, failure, itemID);
+  });
+}
+
+void DVRpcServicer::recordGrantAndReplyWithString(const BookmarkRequest& request, const std::optional<QXError>& error,
+                                                  const std::optional<ItemID>& itemID) const {
+  // As for a sandbox grant: no item, nothing to grant.
+  if (error || !itemID) {
+    dvReplyWithError(request.reply, DVPluginOperationFailedError(error));
+    return;
+  }
+  const ProviderID providerID = request.provider->identifier().value_or(ProviderID{});
+  if (const auto store = accessControlStore()) store->allowProviderWithIdentifier(providerID, *itemID, request.consumerID);
+  std::string string = DVBookmarkableString{providerID, *itemID}.text();
+  dvLog("[DEBUG] Successfully generated bookmarkable string “%@” from URL %@.", string, request.url);
+  if (request.reply) request.reply(std::move(string), /*error=*/std::nullopt);
 }
 
 }  // namespace docuvend

@@ -200,7 +200,7 @@ TEST_F(DVRpcListenerDelegateClientTest, AClientThatWantsNoReplyIsServed) {
 TEST_F(DVRpcListenerDelegateClientTest, AnUnknownOperationReachesNoServicer) {
   platform_.log.clear();
   connection_->invoke(
-      "stopProvidingItemAtURL:fromProviderID:forConsumerID:completionHandler:", {QXValue(), QXValue(), QXValue()}, [](QXArray) { FAIL(); },
+      "forgetItemAtURL:fromProviderID:forConsumerID:completionHandler:", {QXValue(), QXValue(), QXValue()}, [](QXArray) { FAIL(); },
       [this](const QXError& error) { failures_.push_back(error); });
   platform_.queues.runAll();
   EXPECT_EQ(failures_.size(), 1U);

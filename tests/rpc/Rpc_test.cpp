@@ -354,8 +354,11 @@ class Daemon final : public DVDaemon {
     }
     completionHandler(std::nullopt, QXData::fromText(fromProviderID->value), url, std::nullopt);
   }
+  void providePlaceholderForItemAtURL(std::optional<QXURL>, std::optional<ProviderID>, std::optional<ConsumerID>, ErrorReply) override {}
   void startProvidingItemAtURL(std::optional<QXURL>, std::optional<ProviderID>, std::optional<ConsumerID>, ErrorReply) override {}
+  void stopProvidingItemAtURL(std::optional<QXURL>, std::optional<ProviderID>, std::optional<ConsumerID>, ErrorReply) override {}
   void providersCompletionHandler(ProvidersReply) override {}
+  void extendBookmarkForFileURL(std::optional<QXURL>, std::optional<ConsumerID>, StringReply) override {}
   void bookmarkableStringFromDocumentURL(std::optional<QXURL>, StringReply) override {}
   void documentURLFromBookmarkableString(std::optional<std::string>, DocumentReply) override {}
 };

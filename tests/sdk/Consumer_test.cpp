@@ -85,6 +85,21 @@ class ScriptedDaemon : public DVDaemon {
     calls_.add("start " + url->absoluteString() + " " + fromProviderID->value + " " + forConsumerID->value);
     completionHandler(script_.error);
   }
+  void providePlaceholderForItemAtURL(std::optional<QXURL> url, std::optional<ProviderID> fromProviderID,
+                                      std::optional<ConsumerID> forConsumerID, ErrorReply completionHandler) override {
+    calls_.add("placeholder " + url->absoluteString() + " " + fromProviderID->value + " " + forConsumerID->value);
+    completionHandler(script_.error);
+  }
+  void stopProvidingItemAtURL(std::optional<QXURL> url, std::optional<ProviderID> fromProviderID, std::optional<ConsumerID> forConsumerID,
+                              ErrorReply completionHandler) override {
+    calls_.add("stop " + url->absoluteString() + " " + fromProviderID->value + " " + forConsumerID->value);
+    completionHandler(script_.error);
+  }
+  void extendBookmarkForFileURL(std::optional<QXURL> url, std::optional<ConsumerID> toConsumerID, StringReply completionHandler) override {
+    calls_.add("bookmark " + url->absoluteString() + " " + toConsumerID->value);
+    if (script_.error) return completionHandler({}, script_.error);
+    completionHandler(script_.string, {});
+  }
   void providersCompletionHandler(ProvidersReply completionHandler) override {
     if (script_.error) return completionHandler(script_.error, {});
     completionHandler({}, script_.providers);
