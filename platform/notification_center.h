@@ -20,6 +20,10 @@ class QXNotificationCenter {
 
   // Calls back on the main run loop each time the notification is posted, for the life of the process.
   virtual void addObserver(const std::string& notification, std::function<void()> callback, QXSuspensionBehavior behavior) = 0;
+
+  // Calls every observer of that name once, each on the main run loop, later. May be called from any thread. Whoever hears of an event of
+  // the system from outside posts it.
+  virtual void post(const std::string& notification) = 0;
 };
 
 }  // namespace docuvend

@@ -27,7 +27,7 @@ class FakeNotificationCenter : public QXNotificationCenter {
   void addObserver(const std::string& notification, std::function<void()> callback, QXSuspensionBehavior behavior) override;
 
   // Hands each observer's callback to the run loop, in the order of their registration.
-  void post(const std::string& notification);
+  void post(const std::string& notification) override;
   // Everybody who was ever registered, in order.
   [[nodiscard]] std::vector<Observer> observers() const;
 

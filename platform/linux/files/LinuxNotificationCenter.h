@@ -19,8 +19,7 @@ class LinuxNotificationCenter : public QXNotificationCenter {
   explicit LinuxNotificationCenter(QXRunLoop& runLoop) : runLoop_(runLoop) {}
 
   void addObserver(const std::string& notification, std::function<void()> callback, QXSuspensionBehavior behavior) override;
-
-  void post(const std::string& notification);
+  void post(const std::string& notification) override;
 
  private:
   struct Observer {
