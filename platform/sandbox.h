@@ -5,6 +5,7 @@
 #include <string>
 #include <string_view>
 
+#include "platform/QXError.h"
 #include "platform/rpc.h"
 
 namespace docuvend {
@@ -21,6 +22,11 @@ class QXSandbox {
   // Issues a read-write extension for the file at that path: printable text that whoever holds it can redeem for an open file.
   // None when the platform refuses one for this path.
   [[nodiscard]] virtual std::optional<std::string> issueReadWriteExtension(const std::string& path) = 0;
+
+  // Takes back what was issued until now: every extension for a file below that directory, or for any file when none is given, is refused
+  // from when this returns, also after a restart of the daemon in the same login session. Open files stay open, and what is issued
+  // afterwards is good. After an error the extensions are refused by this process; a restart may make them good again.
+  [[nodiscard]] virtual std::optional<QXError> invalidateReadWriteExtensions(const std::optional<std::string>& directory) = 0;
 
   // 0: the process that the token identifies may perform the operation on the path. Any other number: it may not, or the question
   // could not be answered. Leaves no trace.

@@ -17,6 +17,11 @@ void FakeSandbox::setAnswer(const std::string& path, int code) {
   answers_[path] = code;
 }
 
+void FakeSandbox::setInvalidationError(std::optional<QXError> error) {
+  const std::lock_guard lock(mutex_);
+  invalidationError_ = std::move(error);
+}
+
 std::vector<std::string> FakeSandbox::issueCalls() const {
   const std::lock_guard lock(mutex_);
   return issueCalls_;
@@ -27,11 +32,22 @@ std::vector<FakeSandbox::Check> FakeSandbox::checks() const {
   return checks_;
 }
 
+std::vector<std::optional<std::string>> FakeSandbox::invalidations() const {
+  const std::lock_guard lock(mutex_);
+  return invalidations_;
+}
+
 std::optional<std::string> FakeSandbox::issueReadWriteExtension(const std::string& path) {
   const std::lock_guard lock(mutex_);
   issueCalls_.push_back(path);
   if (refused_.contains(path)) return std::nullopt;
   return "token:" + path;
+}
+
+std::optional<QXError> FakeSandbox::invalidateReadWriteExtensions(const std::optional<std::string>& directory) {
+  const std::lock_guard lock(mutex_);
+  invalidations_.push_back(directory);
+  return invalidationError_;
 }
 
 int FakeSandbox::checkWithoutReport(const QXAuditToken& token, std::string_view operation, const std::string& path) {

@@ -1,11 +1,13 @@
 // The sandbox in memory.
 //
 // Differs from the real one: a token is "token:" and the path, whatever lies at the path; the answer to a check is what the test has
-// set, except that the zero token and any operation but writing are refused as the platform refuses them. May be used from any thread.
+// set, except that the zero token and any operation but writing are refused as the platform refuses them. Taking tokens back is recorded
+// and changes nothing: nobody redeems them here. May be used from any thread.
 #pragma once
 
 #include <map>
 #include <mutex>
+#include <optional>
 #include <set>
 #include <string>
 #include <vector>
@@ -33,12 +35,18 @@ class FakeSandbox final : public QXSandbox {
   // What a check of that path answers.
   void setAnswer(const std::string& path, int code);
 
+  // What taking back answers from now on.
+  void setInvalidationError(std::optional<QXError> error);
+
   // The paths that tokens were asked for, in order, refused ones included.
   [[nodiscard]] std::vector<std::string> issueCalls() const;
   // What was checked, in order.
   [[nodiscard]] std::vector<Check> checks() const;
+  // The directories that tokens were taken back below, in order, failures included; none stands for all tokens.
+  [[nodiscard]] std::vector<std::optional<std::string>> invalidations() const;
 
   std::optional<std::string> issueReadWriteExtension(const std::string& path) override;
+  std::optional<QXError> invalidateReadWriteExtensions(const std::optional<std::string>& directory) override;
   int checkWithoutReport(const QXAuditToken& token, std::string_view operation, const std::string& path) override;
 
  private:
@@ -49,6 +57,8 @@ class FakeSandbox final : public QXSandbox {
   int answer_ = kRefused;
   std::vector<std::string> issueCalls_;
   std::vector<Check> checks_;
+  std::vector<std::optional<std::string>> invalidations_;
+  std::optional<QXError> invalidationError_;
 };
 
 }  // namespace docuvend::fake_platform

@@ -37,7 +37,7 @@ class Linux : public linux_platform::testing::SandboxHouse {
   std::string refusedPath() { return storage; }
 
  private:
-  linux_platform::LinuxSandbox sandbox_{linux_platform::TokenKey::random(), bundles, peers};
+  linux_platform::LinuxSandbox sandbox_{linux_platform::TokenKey::random(), keyFile, bundles, peers};
 };
 
 template <class Platform>
@@ -57,6 +57,13 @@ TYPED_TEST(QXSandboxTest, IssuesPrintableTextForAFileAndForOneThatIsNotThereYet)
 
 TYPED_TEST(QXSandboxTest, IssuesNothingWhereItRefuses) {
   EXPECT_EQ(this->sandbox().issueReadWriteExtension(this->refusedPath()), std::nullopt);
+}
+
+TYPED_TEST(QXSandboxTest, TakesBackWhatItIssuedAndGoesOnIssuing) {
+  for (const auto& directory : {std::optional(this->storage), std::optional<std::string>()}) {
+    EXPECT_EQ(this->sandbox().invalidateReadWriteExtensions(directory), std::nullopt);
+    EXPECT_TRUE(this->sandbox().issueReadWriteExtension(this->document));
+  }
 }
 
 TYPED_TEST(QXSandboxTest, AllowsTheWriterToWriteAndNothingElse) {

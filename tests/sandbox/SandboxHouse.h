@@ -159,6 +159,7 @@ class SandboxHouse : public ::testing::Test {
   const std::string otherGroup = home + "/groups/com.example.other";
   const std::string editorContainer = home + "/containers/com.example.editor";
   const std::string outside = home + "/outside";
+  const std::string keyFile = directory.path() + "/token-key";
   MadeUpBundles bundles;
   MadeUpPeers peers;
 };

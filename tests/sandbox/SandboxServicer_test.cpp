@@ -70,7 +70,7 @@ class SandboxServicerTest : public testing::SandboxHouse {
   }
 
   fake_platform::FakeLog log;
-  LinuxSandbox sandbox{TokenKey::random(), bundles, peers};
+  LinuxSandbox sandbox{TokenKey::random(), keyFile, bundles, peers};
   const std::shared_ptr<SandboxListenerDelegate> delegate = std::make_shared<SandboxListenerDelegate>(sandbox, log.defaultLog());
   fake_platform::FakeRpcListener listener;
   std::shared_ptr<fake_platform::FakeRpcConnection> connection;
@@ -120,6 +120,15 @@ TEST_F(SandboxServicerTest, ServesEveryBearerOfThisUser) {
   EXPECT_TRUE(redeem(token, true).file);
   connectAs(peers.add(confined("com.example.other", "9")));
   EXPECT_TRUE(redeem(token, true).file);
+}
+
+TEST_F(SandboxServicerTest, RefusesATokenThatWasTakenBackAndServesItsSuccessor) {
+  const QXData token = issued(document);
+  const Redeemed before = redeem(token, true);
+  EXPECT_EQ(sandbox.invalidateReadWriteExtensions(storage), std::nullopt);
+  expectError(redeem(token, false).error, SandboxErrorCode::badToken);
+  EXPECT_EQ(::pwrite(before.file->number, "C", 1, 0), 1) << "an open file stays open";
+  EXPECT_TRUE(redeem(issued(document), true).file);
 }
 
 TEST_F(SandboxServicerTest, ServesNobodyElse) {

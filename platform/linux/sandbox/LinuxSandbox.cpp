@@ -43,11 +43,16 @@ std::variant<std::unique_ptr<LinuxSandbox>, QXError> LinuxSandbox::create(const 
                                                                           PeerDirectory& peers) {
   auto key = TokenKey::loadOrCreate(paths.tokenKey);
   if (auto* error = std::get_if<QXError>(&key)) return std::move(*error);
-  return std::make_unique<LinuxSandbox>(std::get<TokenKey>(key), registry, peers);
+  return std::make_unique<LinuxSandbox>(std::get<TokenKey>(key), paths.tokenKey, registry, peers);
 }
 
-LinuxSandbox::LinuxSandbox(TokenKey key, BundleRegistry& registry, PeerDirectory& peers)
-    : key_(std::move(key)), peers_(peers), containers_(registry), redeemer_(key_, containers_), query_(registry, peers, ledger_) {}
+LinuxSandbox::LinuxSandbox(TokenKey key, std::string keyFile, BundleRegistry& registry, PeerDirectory& peers)
+    : keyFile_(std::move(keyFile)),
+      key_(std::move(key)),
+      peers_(peers),
+      containers_(registry),
+      redeemer_(key_, containers_),
+      query_(registry, peers, ledger_) {}
 
 std::optional<std::string> LinuxSandbox::issueReadWriteExtension(const std::string& path) {
   auto issued = issue(path);
@@ -58,7 +63,20 @@ std::optional<std::string> LinuxSandbox::issueReadWriteExtension(const std::stri
 std::variant<std::string, PathRefusal> LinuxSandbox::issue(const std::string& path) {
   const auto place = containers_.place(path);
   if (const auto* refusal = std::get_if<PathRefusal>(&place)) return *refusal;
+  const std::shared_lock lock(keyMutex_);
   return SandboxToken{TokenKind::readWrite, std::get<PlacedItem>(place).path, SandboxToken::freshNonce()}.sealed(key_);
+}
+
+// A new key makes the tokens for all files worthless, those below the directory among them.
+std::optional<QXError> LinuxSandbox::invalidateReadWriteExtensions(const std::optional<std::string>& /*directory*/) {
+  const std::lock_guard lock(keyMutex_);
+  auto renewed = TokenKey::renew(keyFile_);
+  if (auto* error = std::get_if<QXError>(&renewed)) {
+    key_ = TokenKey::random();
+    return std::move(*error);
+  }
+  key_ = std::get<TokenKey>(renewed);
+  return std::nullopt;
 }
 
 int LinuxSandbox::checkWithoutReport(const QXAuditToken& token, std::string_view operation, const std::string& path) {
@@ -79,6 +97,7 @@ std::shared_ptr<const PeerIdentity> LinuxSandbox::somebody(const QXAuditToken& c
 std::variant<UniqueDescriptor, QXError> LinuxSandbox::redeem(const QXAuditToken& caller, std::string_view token, TokenUse use) {
   const auto peer = somebody(caller);
   if (!peer) return nobodyError();
+  const std::shared_lock lock(keyMutex_);
   auto redeemed = redeemer_.redeem(token, use);
   if (auto* error = std::get_if<QXError>(&redeemed)) return std::move(*error);
   auto& file = std::get<RedeemedFile>(redeemed);
@@ -89,6 +108,7 @@ std::variant<UniqueDescriptor, QXError> LinuxSandbox::redeem(const QXAuditToken&
 std::optional<QXError> LinuxSandbox::replaceItem(const QXAuditToken& caller, std::string_view itemToken, std::string_view siblingToken) {
   const auto peer = somebody(caller);
   if (!peer) return nobodyError();
+  const std::shared_lock lock(keyMutex_);
   auto replaced = redeemer_.replaceItem(itemToken, siblingToken);
   if (auto* error = std::get_if<QXError>(&replaced)) return std::move(*error);
   // The item is another object now, and the one who put it there may say that it has written it.

@@ -5,6 +5,7 @@
 
 #include <memory>
 #include <optional>
+#include <shared_mutex>
 #include <string>
 #include <string_view>
 #include <variant>
@@ -24,9 +25,11 @@ class LinuxSandbox final : public QXSandbox {
   // With the session's key from `paths.tokenKey`, whose directory exists. The registry and the directory outlive it.
   [[nodiscard]] static std::variant<std::unique_ptr<LinuxSandbox>, QXError> create(const Paths& paths, BundleRegistry& registry,
                                                                                    PeerDirectory& peers);
-  LinuxSandbox(TokenKey key, BundleRegistry& registry, PeerDirectory& peers);
+  // The key is kept in that file.
+  LinuxSandbox(TokenKey key, std::string keyFile, BundleRegistry& registry, PeerDirectory& peers);
 
   std::optional<std::string> issueReadWriteExtension(const std::string& path) override;
+  std::optional<QXError> invalidateReadWriteExtensions(const std::optional<std::string>& directory) override;
   int checkWithoutReport(const QXAuditToken& token, std::string_view operation, const std::string& path) override;
 
   // The same, with the reason.
@@ -40,7 +43,9 @@ class LinuxSandbox final : public QXSandbox {
  private:
   [[nodiscard]] std::shared_ptr<const PeerIdentity> somebody(const QXAuditToken& caller) const;
 
-  const TokenKey key_;
+  const std::string keyFile_;
+  std::shared_mutex keyMutex_;
+  TokenKey key_;  // guarded by keyMutex_
   PeerDirectory& peers_;
   GroupContainers containers_;
   RedemptionLedger ledger_;

@@ -14,6 +14,7 @@
 #include <cstdlib>
 
 #include "platform/linux/base/UniqueDescriptor.h"
+#include "platform/linux/files/FileReplacer.h"
 
 namespace docuvend::linux_platform {
 namespace {
@@ -115,6 +116,17 @@ int TokenKey::create(const std::string& path) {
   if (!transfersAll(::pwrite(temporary.get(), key.bytes_.data(), kLength, 0))) return EIO;
   if (::fsync(temporary.get()) != 0) return errno;
   return temporary.renameUnlessThere(path) ? 0 : errno;
+}
+
+std::variant<TokenKey, QXError> TokenKey::renew(const std::string& path) {
+  TokenKey key = random();
+  auto begun = FileReplacer::begin(path);
+  if (auto* error = std::get_if<QXError>(&begun)) return std::move(*error);
+  auto& replacer = std::get<FileReplacer>(begun);
+  if (::fchmod(replacer.descriptor(), kOwnerReadWrite) != 0) return QXError::system(errno, "cannot renew " + path);
+  if (auto error = replacer.write({reinterpret_cast<const char*>(key.bytes_.data()), kLength})) return *std::move(error);
+  if (auto error = replacer.commit()) return *std::move(error);
+  return key;
 }
 
 TokenKey::Tag TokenKey::authenticate(std::string_view text) const {

@@ -24,6 +24,8 @@ class TokenKey {
   // The key in that file, which is made when it is missing. Two processes that make it at once end with the same key. An error when
   // the file is not a regular file of this user with mode 600, one link and the length of a key: such a file is never used or mended.
   [[nodiscard]] static std::variant<TokenKey, QXError> loadOrCreate(const std::string& path);
+  // A new key in the place of whatever lies at that path. After an error the file holds what it held.
+  [[nodiscard]] static std::variant<TokenKey, QXError> renew(const std::string& path);
   // A key that no file holds.
   [[nodiscard]] static TokenKey random();
 
