@@ -69,10 +69,13 @@ TEST_F(DVRpcListenerDelegateTest, ExportsTheDaemonsProtocolInItsOrder) {
   EXPECT_EQ(interface->protocolName(), "DVDaemon");
   std::vector<std::string> names;
   for (const QXRpcOperation& operation : interface->operations()) names.push_back(operation.name);
-  EXPECT_EQ(names, (std::vector<std::string>{
-                       "wakeUpCompletion:", "extendSandboxForFileURL:fromProviderID:toConsumerID:completionHandler:",
-                       "startProvidingItemAtURL:fromProviderID:forConsumerID:completionHandler:", "providersCompletionHandler:",
-                       "bookmarkableStringFromDocumentURL:completion:", "documentURLFromBookmarkableString:completion:"}));
+  EXPECT_EQ(names,
+            (std::vector<std::string>{"wakeUpCompletion:", "extendSandboxForFileURL:fromProviderID:toConsumerID:completionHandler:",
+                                      "providePlaceholderForItemAtURL:fromProviderID:forConsumerID:completionHandler:",
+                                      "startProvidingItemAtURL:fromProviderID:forConsumerID:completionHandler:",
+                                      "stopProvidingItemAtURL:fromProviderID:forConsumerID:completionHandler:",
+                                      "providersCompletionHandler:", "extendBookmarkForFileURL:toConsumerID:completionHandler:",
+                                      "bookmarkableStringFromDocumentURL:completion:", "documentURLFromBookmarkableString:completion:"}));
 }
 
 TEST_F(DVRpcListenerDelegateTest, RestrictsTheListOfProvidersAndNothingElse) {
