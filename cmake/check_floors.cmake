@@ -13,7 +13,7 @@ set(rooms_daemon "platform;common;acl;providers;service;daemon")
 set(rooms_platform/linux "platform;platform/linux")
 set(rooms_platform/fake "platform;platform/fake")
 set(rooms_sdk "platform;platform/linux/wire;platform/linux/base;sdk")
-set(headers_sdk "service/DVDaemon.h;service/DVAdministration.h;providers/_QXDocuvendVendor.h;providers/_QXDocuvendHostProtocol.h")
+set(headers_sdk "common/DVErrorCodes.h;service/DVDaemon.h;service/DVAdministration.h;providers/_QXDocuvendVendor.h;providers/_QXDocuvendHostProtocol.h")
 set(system_rooms platform common acl providers service daemon)
 
 set(standard_headers

@@ -2,31 +2,16 @@
 // platform are passed on as they come, or stand beneath one of these.
 #pragma once
 
-#include <cstdint>
 #include <optional>
 #include <string>
 #include <string_view>
 
+#include "common/DVErrorCodes.h"
 #include "platform/QXError.h"
 #include "platform/QXURL.h"
 #include "platform/identifiers.h"
 
 namespace docuvend {
-
-inline constexpr const char* kDVErrorDomain = "DVErrorDomain";
-
-// The codes stand on the wire: they are never renumbered.
-enum class DVErrorCode : std::int64_t {
-  clientLacksEntitlement = 1,
-  notPermitted = 2,
-  invalidBookmarkableString = 3,
-  invalidParameter = 4,
-  notFound = 5,
-  notFoundURL = 6,
-  pluginOperationFailed = 7,
-  proxyNotFound = 8,
-  sandboxExtensionFailed = 9,
-};
 
 [[nodiscard]] QXError DVClientLacksEntitlement();
 [[nodiscard]] QXError DVNotPermittedError();

@@ -12,7 +12,8 @@
 
 #include "platform/linux/wire/Endpoint.h"
 #include "platform/rpc_protocol.h"
-#include "sdk/Consumer.h"
+#include "sdk/ConsumerErrors.h"
+#include "sdk/Result.h"
 
 namespace docuvend::sdk_detail {
 
@@ -28,18 +29,22 @@ struct AnswerOf<std::function<void(std::optional<Replies>...)>> {
   }
 };
 
-// Sends `Method` over the endpoint and waits for its reply's values, for the delivery's failure, or for the deadline. The endpoint's reactor
-// must not be waiting for the calling thread.
+// The values of an operation's reply.
+template <auto Method>
+using ReplyValues = typename AnswerOf<typename rpc_detail::Traits<Method>::CompletionType>::Values;
+
+// Sends `Method` over the endpoint and waits for its reply's values, for the delivery's failure, or for the deadline. The endpoint's
+// reactor must not be waiting for the calling thread.
 template <class Protocol, auto Method, class... Arguments>
-[[nodiscard]] auto callAndWait(linux_platform::Endpoint& endpoint, std::chrono::milliseconds deadline, Arguments&&... arguments)
-    -> Result<typename AnswerOf<typename rpc_detail::Traits<Method>::CompletionType>::Values> {
+[[nodiscard]] Result<ReplyValues<Method>> callAndWait(linux_platform::Endpoint& endpoint, std::chrono::milliseconds deadline,
+                                                      Arguments&&... arguments) {
   using Answer = AnswerOf<typename rpc_detail::Traits<Method>::CompletionType>;
   auto promise = std::make_shared<typename Answer::Promise>();
   auto answer = promise->get_future();
   const QXRemote<Protocol> remote(endpoint.remoteObjectProxy([promise](const QXError& error) { promise->set_value(error); }));
   remote.template call<Method>(std::forward<Arguments>(arguments)..., Answer::fulfil(promise));
   if (answer.wait_for(deadline) != std::future_status::ready) {
-    return QXError::make(kConsumerErrorDomain, static_cast<std::int64_t>(ConsumerErrorCode::deadlinePassed), "No answer came in time.");
+    return makeConsumerError(ConsumerErrorCode::deadlinePassed, "No answer came in time.");
   }
   return answer.get();
 }

@@ -13,26 +13,17 @@
 #include <memory>
 #include <optional>
 #include <string>
-#include <variant>
 
 #include "platform/QXValue.h"
 #include "platform/identifiers.h"
+#include "sdk/ConsumerErrors.h"
+#include "sdk/Result.h"
 
 namespace docuvend {
 
-// Errors that this library makes itself.
-inline constexpr const char* kConsumerErrorDomain = "DVConsumerErrorDomain";
-enum class ConsumerErrorCode : std::int64_t {
-  unreachable = 1,     // the daemon cannot be connected to
-  deadlinePassed = 2,  // no answer in time
-  noAnswer = 3,        // the answer carried neither a value nor an error
-  noToken = 4,         // the platform issued no token for the file
-};
-
-template <class T>
-using Result = std::variant<T, QXError>;
-// None: done.
-using Failure = std::optional<QXError>;
+namespace sdk_detail {
+class ServiceConnections;
+}
 
 enum class Access { read, readWrite };
 
@@ -65,9 +56,15 @@ class Consumer {
 
   [[nodiscard]] Failure wakeUp();
   [[nodiscard]] Result<Document> extendSandbox(const QXURL& url, const ProviderID& fromProvider, const ConsumerID& toConsumer);
+  // Has the provider make a placeholder for the item: a file of the right size without the contents.
+  [[nodiscard]] Failure providePlaceholder(const QXURL& url, const ProviderID& fromProvider, const ConsumerID& forConsumer);
   [[nodiscard]] Failure startProviding(const QXURL& url, const ProviderID& fromProvider, const ConsumerID& forConsumer);
+  // Tells the provider that the consumer needs the item's contents no longer.
+  [[nodiscard]] Failure stopProviding(const QXURL& url, const ProviderID& fromProvider, const ConsumerID& forConsumer);
   // Keyed by provider identifier.
   [[nodiscard]] Result<QXDictionary> providers();
+  // Grants a document that this application may write to another; the string by which that one finds it.
+  [[nodiscard]] Result<std::string> extendBookmark(const QXURL& url, const ConsumerID& toConsumer);
   [[nodiscard]] Result<std::string> bookmarkableString(const QXURL& url);
   [[nodiscard]] Result<Document> documentURL(const std::string& bookmarkableString);
 
@@ -82,9 +79,10 @@ class Consumer {
   [[nodiscard]] Failure finishedWriting(const QXURL& url);
 
  private:
-  struct State;
-  explicit Consumer(std::unique_ptr<State> state);
-  std::unique_ptr<State> state_;
+  Consumer(std::shared_ptr<sdk_detail::ServiceConnections> services, Options options);
+
+  const std::shared_ptr<sdk_detail::ServiceConnections> services_;
+  const Options options_;
 };
 
 }  // namespace docuvend

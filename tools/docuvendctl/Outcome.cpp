@@ -36,6 +36,7 @@ ExitStatus statusOf(const QXError& error) {
   if (error.domain == kConsumerErrorDomain) {
     switch (static_cast<ConsumerErrorCode>(error.code)) {
       case ConsumerErrorCode::unreachable:
+      case ConsumerErrorCode::connectionLost:
         return ExitStatus::unreachable;
       case ConsumerErrorCode::deadlinePassed:
         return ExitStatus::deadlinePassed;
