@@ -52,6 +52,7 @@ std::variant<Paths, QXError> Paths::fromEnvironment() {
   paths.publicSockets = paths.runtime + "/public";
   paths.lockState = paths.runtime + "/lock-state";
   paths.tokenKey = paths.runtime + "/token-key";
+  paths.tokenFloors = paths.runtime + "/token-floors";
   return paths;
 }
 

@@ -19,6 +19,7 @@ struct Paths {
   std::string publicSockets;    // runtime + "/public": what confined processes see of it
   std::string lockState;        // runtime + "/lock-state"
   std::string tokenKey;         // runtime + "/token-key"
+  std::string tokenFloors;      // runtime + "/token-floors"
 
   // An error that says so when HOME or XDG_RUNTIME_DIR is missing or relative, or when the run-time directory is not this user's own
   // with mode 700. Creates nothing.
