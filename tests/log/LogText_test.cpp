@@ -43,7 +43,10 @@ TEST(LogText, ShowsWhatCouldForgeALineOrDisturbATerminalAndLeavesTheRest) {
       {"beyond \xf4\x90\x80\x80", "beyond \\xf4\\x90\\x80\\x80"},
       {"\xc3\xa9\xc3", "\u00e9\\xc3"},
   };
-  for (const Row& row : rows) EXPECT_EQ(visibleLogText(row.text), row.expected) << "for \"" << row.expected << "\"";
+  for (const Row& row : rows) {
+    EXPECT_EQ(visibleLogText(row.text), row.expected) << "for \"" << row.expected << "\"";
+    EXPECT_EQ(visibleText(row.text), row.expected) << "for \"" << row.expected << "\"";
+  }
 }
 
 TEST(LogText, ShowsALongTextUpToTheBoundWhole) {
@@ -54,6 +57,7 @@ TEST(LogText, ShowsALongTextUpToTheBoundWhole) {
 TEST(LogText, CutsALongerTextAndSaysWhatIsMissing) {
   const std::string text(kLongestLogText + 100, 'a');
   EXPECT_EQ(visibleLogText(text), std::string(kLongestLogText, 'a') + "... [100 more bytes]");
+  EXPECT_EQ(visibleText(text), text);
 }
 
 TEST(LogText, CutsBetweenCharactersAndNeverInsideAnEscape) {

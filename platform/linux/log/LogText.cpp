@@ -68,17 +68,29 @@ std::string visible(std::string_view character) {
   return isHarmful(code) ? escapedCode(code) : std::string(character);
 }
 
+// Takes the character in front, or the byte that is none, off the text: how it is shown.
+std::string nextVisible(std::string_view& rest) {
+  const std::size_t length = characterLength(rest);
+  std::string shown = length == 0 ? escapedByte(static_cast<unsigned char>(rest.front())) : visible(rest.substr(0, length));
+  rest.remove_prefix(std::max<std::size_t>(length, 1));
+  return shown;
+}
+
 }  // namespace
+
+std::string visibleText(std::string_view text) {
+  std::string result;
+  while (!text.empty()) result += nextVisible(text);
+  return result;
+}
 
 std::string visibleLogText(std::string_view text) {
   std::string result;
-  std::string_view rest = text;
-  while (!rest.empty()) {
-    const std::size_t length = characterLength(rest);
-    const std::string next = length == 0 ? escapedByte(static_cast<unsigned char>(rest.front())) : visible(rest.substr(0, length));
-    if (result.size() + next.size() > kLongestLogText) return result + "... [" + std::to_string(rest.size()) + " more bytes]";
+  while (!text.empty()) {
+    const std::size_t missing = text.size();
+    const std::string next = nextVisible(text);
+    if (result.size() + next.size() > kLongestLogText) return result + "... [" + std::to_string(missing) + " more bytes]";
     result += next;
-    rest.remove_prefix(std::max<std::size_t>(length, 1));
   }
   return result;
 }

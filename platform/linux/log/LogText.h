@@ -1,4 +1,4 @@
-// What a log line shows of a text that nobody vouches for.
+// What a log line or a terminal shows of a text that nobody vouches for.
 #pragma once
 
 #include <cstddef>
@@ -12,8 +12,10 @@ inline constexpr std::size_t kLongestLogText = 3840;
 
 // The text with everything visible that could start a line, steer a terminal or reorder what is shown: control characters, line and
 // paragraph separators and bytes that are no UTF-8 as "\n", "\x1b", "\u{202e}"; bidirectional controls too. All else, backslashes
-// included, stays. A text whose result is longer than kLongestLogText is cut between two characters and says how many of its bytes are
-// missing.
+// included, stays. The result is well-formed UTF-8.
+[[nodiscard]] std::string visibleText(std::string_view text);
+
+// The same, but when it is longer than kLongestLogText it is cut between two characters and says how many of the text's bytes are missing.
 [[nodiscard]] std::string visibleLogText(std::string_view text);
 
 }  // namespace docuvend::linux_platform
