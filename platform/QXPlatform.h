@@ -12,6 +12,7 @@
 #include "platform/queue.h"
 #include "platform/rpc.h"
 #include "platform/sandbox.h"
+#include "platform/status.h"
 
 namespace docuvend {
 
@@ -27,6 +28,7 @@ struct QXPlatform {
   QXNotificationCenter& notificationCenter;
   QXFileSystem& fileSystem;
   QXPropertyLists& propertyLists;
+  QXStatusSource& status;
 
   // The services must outlive the process's use of them; a second installation is a defect.
   static void install(const QXPlatform& platform);

@@ -7,12 +7,12 @@
 
 #include <algorithm>
 #include <cerrno>
-#include <map>
 #include <string>
 #include <thread>
 #include <utility>
 #include <vector>
 
+#include "platform/linux/LinuxStatus.h"
 #include "platform/linux/base/Paths.h"
 #include "platform/linux/bundles/InstalledBundles.h"
 #include "platform/linux/coordination/FileCoordinationListenerDelegate.h"
@@ -22,7 +22,6 @@
 #include "platform/linux/files/LinuxFileSystem.h"
 #include "platform/linux/files/LinuxNotificationCenter.h"
 #include "platform/linux/files/LinuxPropertyLists.h"
-#include "platform/linux/identity/KernelFacilities.h"
 #include "platform/linux/identity/LinuxApplicationRegistry.h"
 #include "platform/linux/identity/LinuxPeerDirectory.h"
 #include "platform/linux/log/LinuxLog.h"
@@ -40,15 +39,18 @@ namespace {
 
 constexpr const char* kProgramName = "docuvendd";
 constexpr const char* kClientServiceName = "com.orvane.Docuvend";
+constexpr const char* kAdministrationServiceName = "com.orvane.Administration";
 // A thread that serves a request may wait for a disk; one more at least is left for the others.
 constexpr unsigned kFewestReactorThreads = 4;
 
-std::map<std::string, std::string> publicSocketPaths(const Paths& paths) {
-  std::map<std::string, std::string> sockets;
+// Confined processes see the public directory and nothing beside it. That the administration is not for them does not rest on this.
+NamedServices namedServices(const Paths& paths) {
+  NamedServices services;
   for (const char* name : {kClientServiceName, kSandboxServiceName, kFileCoordinationServiceName}) {
-    sockets.emplace(name, paths.publicSockets + "/" + name);
+    services.emplace(name, NamedService{paths.publicSockets + "/" + name, Audience::everyone});
   }
-  return sockets;
+  services.emplace(kAdministrationServiceName, NamedService{paths.runtime + "/" + kAdministrationServiceName, Audience::unconfinedPeers});
+  return services;
 }
 
 // Held for the life of the process: the sockets, the list and the token key have one owner.
@@ -68,7 +70,7 @@ struct LinuxPlatform::Services {
   Services(Paths found, UniqueDescriptor lock)
       : paths(std::move(found)),
         platformLock(std::move(lock)),
-        rpc(reactor, peers, log.defaultLog(), publicSocketPaths(paths), std::move(activatedSockets)) {}
+        rpc(reactor, peers, log.defaultLog(), namedServices(paths), std::move(activatedSockets)) {}
 
   // In the order in which they lean on each other.
   const Paths paths;
@@ -85,6 +87,7 @@ struct LinuxPlatform::Services {
   LinuxPeerDirectory peers{bundles, log.defaultLog()};
   LinuxApplicationRegistry applicationRegistry{bundles, peers};
   LinuxRpcService rpc;
+  LinuxStatus status{rpc};
   LinuxExtensionHost extensionHost{bundles, paths, reactor, log.defaultLog()};
   LinuxFileCoordinator fileCoordinator{fileSystem};
 
@@ -104,10 +107,7 @@ struct LinuxPlatform::Services {
   }
 
   void logProtections() {
-    const ProtectionLevels levels = protectionLevels(KernelFacilities::probe());
-    for (const std::string* sentence : {&levels.peers, &levels.namespaces, &levels.tokens, &levels.confinement}) {
-      log.defaultLog().write(QXLogType::defaultType, "[NOTICE] " + *sentence);
-    }
+    for (const std::string& sentence : status.protections()) log.defaultLog().write(QXLogType::defaultType, "[NOTICE] " + sentence);
   }
 
  private:
@@ -156,7 +156,8 @@ QXPlatform LinuxPlatform::seam() {
           all.deviceLock,
           all.notificationCenter,
           all.fileSystem,
-          all.propertyLists};
+          all.propertyLists,
+          all.status};
 }
 
 }  // namespace docuvend::linux_platform

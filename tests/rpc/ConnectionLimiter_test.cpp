@@ -45,5 +45,15 @@ TEST_F(ConnectionLimiterTest, APlaceThatIsGivenBackAdmitsAgainAndTheNextRefusalI
   EXPECT_EQ(limiter->admit("one").verdict, Verdict::refused);
 }
 
+TEST_F(ConnectionLimiterTest, OpenConnectionsAreThoseOfAllPeersTogether) {
+  EXPECT_EQ(limiter->openConnections(), 0U);
+  fill("one");
+  const auto admission = limiter->admit("two");
+  EXPECT_EQ(limiter->admit("one").verdict, Verdict::refused);
+  EXPECT_EQ(limiter->openConnections(), kMaximumConnectionsPerPeer + 1);
+  places.clear();
+  EXPECT_EQ(limiter->openConnections(), 1U);
+}
+
 }  // namespace
 }  // namespace docuvend::linux_platform

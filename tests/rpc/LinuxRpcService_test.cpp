@@ -120,7 +120,8 @@ struct Publishing {
 };
 
 // What becomes of a process that publishes `name` while `path` is the service's. Forked: no other thread may be running.
-Publishing publish(const std::string& path, const std::string& name) {
+enum class PassedSocket { none, ofThatName };
+Publishing publish(const std::string& path, const std::string& name, PassedSocket passed = PassedSocket::none) {
   std::array<int, 2> ends{-1, -1};
   if (::pipe2(ends.data(), O_CLOEXEC) != 0) return {};
   const UniqueDescriptor out(ends[0]);
@@ -132,7 +133,9 @@ Publishing publish(const std::string& path, const std::string& name) {
     StandardErrorLog log;
     tests::TestPeerDirectory peers;
     Reactor reactor(1);
-    LinuxRpcService service(reactor, peers, log, {{kServiceName, path}});
+    std::vector<ActivatedSocket> sockets;
+    if (passed == PassedSocket::ofThatName) sockets.push_back({name, "", UniqueDescriptor(::socket(AF_UNIX, SOCK_STREAM, 0))});
+    LinuxRpcService service(reactor, peers, log, {{kServiceName, {path}}}, std::move(sockets));
     const auto listener = service.listenerForService(name);
     ::_exit(0);
   }
@@ -177,7 +180,7 @@ TEST_F(LinuxRpcServiceTest, APathMayBeLongerThanASocketAddress) {
   while (deep.size() <= 2 * sizeof(sockaddr_un::sun_path)) deep += "/" + std::string(50, 'd');
   std::filesystem::create_directories(deep);
   const std::string path = deep + "/" + kServiceName;
-  LinuxRpcService service(driver.reactor, driver.peers, driver.log.defaultLog(), {{kServiceName, path}});
+  LinuxRpcService service(driver.reactor, driver.peers, driver.log.defaultLog(), {{kServiceName, {path}}});
   listener = service.listenerForService(kServiceName);
   listener->setDelegate(delegate);
   listener->resume();
@@ -341,7 +344,7 @@ TEST_F(LinuxRpcServiceTest, APassedSocketServesItsName) {
     ASSERT_EQ(::listen(passed.get(), 5), 0);
     std::vector<ActivatedSocket> sockets;
     sockets.push_back({byName ? kServiceName : "docuvend.socket", byName ? "" : path, std::move(passed)});
-    LinuxRpcService service(driver.reactor, driver.peers, driver.log.defaultLog(), {}, std::move(sockets));
+    LinuxRpcService service(driver.reactor, driver.peers, driver.log.defaultLog(), {{kServiceName, {path}}}, std::move(sockets));
     listener = service.listenerForService(kServiceName);
     listener->setDelegate(delegate);
     auto client = driver.connect();
@@ -351,6 +354,121 @@ TEST_F(LinuxRpcServiceTest, APassedSocketServesItsName) {
     EXPECT_TRUE(std::filesystem::exists(path)) << "its file belongs to the service manager";
     std::filesystem::remove(path);
   }
+}
+
+// --- A service for unconfined peers alone
+
+class UnconfinedServiceTest : public LinuxRpcServiceTest {
+ protected:
+  void serveUnconfined(std::vector<ActivatedSocket> passedSockets = {}) {
+    service.emplace(driver.reactor, driver.peers, driver.log.defaultLog(),
+                    NamedServices{{kServiceName, {driver.socketPath, Audience::unconfinedPeers}}}, std::move(passedSockets));
+    listener = service->listenerForService(kServiceName);
+    listener->setDelegate(delegate);
+    listener->resume();
+  }
+  // Of a connection that ends with it.
+  std::optional<QXError> refusal() {
+    const auto client = driver.connect({}, [this](const QXError& reason) { closed.put(reason); });
+    return closed.take();
+  }
+  static std::string line(const std::string& peer) {
+    return "[NOTICE] Refusing a connection of PID " + std::to_string(::getpid()) + ": com.example.Service is not for " + peer + ".";
+  }
+
+  std::optional<LinuxRpcService> service;
+};
+
+TEST_F(UnconfinedServiceTest, ServesUnconfinedPeers) {
+  driver.peers.setNextPeer(Standing::unconfined, std::nullopt, {});
+  serveUnconfined();
+  EXPECT_TRUE(roundTrip(driver.connect()));
+  EXPECT_THAT(driver.log.texts(), testing::IsEmpty());
+}
+
+TEST_F(UnconfinedServiceTest, ServesAnUnconfinedPeerThatActsForABundle) {
+  driver.peers.setNextPeer(Standing::unconfined, std::nullopt, {});
+  driver.peers.install("com.example.App", {});
+  serveUnconfined();
+  Hello hello;
+  hello.declaredBundle = "com.example.App";
+  EXPECT_TRUE(roundTrip(driver.connect(hello)));
+}
+
+TEST_F(UnconfinedServiceTest, AConfinedPeerIsRefusedWithAReasonAndNoDelegateHears) {
+  driver.peers.setNextPeer(Standing::confined, "com.example.App", {{"right", QXValue(true)}});
+  serveUnconfined();
+  const auto reason = refusal();
+  ASSERT_THAT(reason, IsRpcError(QXRpcErrorCode::refused));
+  EXPECT_EQ(reason->texts.at("description"), "com.example.Service is for unconfined processes alone");
+  EXPECT_THAT(driver.log.entries(), testing::ElementsAre(fake_platform::FakeLogEntry{QXLogType::defaultType, line("com.example.App")}));
+  driver.peers.setNextPeer(Standing::unconfined, std::nullopt, {});
+  EXPECT_TRUE(roundTrip(driver.connect()));
+  EXPECT_TRUE(delegate->connections.take());
+  EXPECT_EQ(delegate->connections.count(), 0U) << "the refused one came to the delegate";
+}
+
+TEST_F(UnconfinedServiceTest, ARequestOfARefusedPeerFailsWithTheSameReason) {
+  driver.peers.setNextPeer(Standing::confined, "com.example.App", {});
+  serveUnconfined();
+  const auto client = driver.connect();
+  Mailbox<QXError> errors;
+  QXRemote<TestProtocol>(client.proxy([&errors](const QXError& error) { errors.put(error); })).call<&TestProtocol::ping>([] {
+    ADD_FAILURE() << "answered";
+  });
+  EXPECT_THAT(errors.take(), IsRpcError(QXRpcErrorCode::refused));
+}
+
+TEST_F(UnconfinedServiceTest, NobodyIsRefused) {
+  driver.peers.setNextPeer(Standing::nobody, std::nullopt, {});
+  serveUnconfined();
+  EXPECT_THAT(refusal(), IsRpcError(QXRpcErrorCode::refused));
+  EXPECT_THAT(driver.log.texts(), testing::ElementsAre(line("a process without an identity")));
+}
+
+TEST_F(UnconfinedServiceTest, ADeclarationIsNoWayInForAConfinedPeer) {
+  driver.peers.setNextPeer(Standing::confined, "com.example.Other", {});
+  driver.peers.install("com.example.App", {});
+  serveUnconfined();
+  Hello hello;
+  hello.declaredBundle = "com.example.App";
+  const auto client = driver.connect(hello, [this](const QXError& reason) { closed.put(reason); });
+  EXPECT_THAT(closed.take(), IsRpcError(QXRpcErrorCode::refused));
+}
+
+TEST_F(UnconfinedServiceTest, AFloodOfRefusalsIsOneLineForEachPeerAndTakesNobodysPlace) {
+  serveUnconfined();
+  driver.peers.setNextPeer(Standing::confined, "com.example.App", {});
+  for (std::size_t i = 0; i < 2 * kMaximumConnectionsPerPeer; ++i) ASSERT_THAT(refusal(), IsRpcError(QXRpcErrorCode::refused));
+  EXPECT_EQ(service->connectionCount(), 0U);
+  driver.peers.setNextPeer(Standing::confined, "com.example.Other", {});
+  ASSERT_THAT(refusal(), IsRpcError(QXRpcErrorCode::refused));
+  EXPECT_THAT(driver.log.texts(), testing::ElementsAre(line("com.example.App"), line("com.example.Other")));
+  driver.peers.setNextPeer(Standing::unconfined, std::nullopt, {});
+  const auto served = driver.connect();
+  EXPECT_TRUE(roundTrip(served));
+  EXPECT_EQ(service->connectionCount(), 1U);
+}
+
+TEST_F(UnconfinedServiceTest, APassedSocketIsForTheSameAudience) {
+  auto found = SocketAddress::forPath(driver.socketPath);
+  const auto& address = std::get<SocketAddress>(found);
+  UniqueDescriptor passed(::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0));
+  ASSERT_EQ(::bind(passed.get(), address.address(), address.length()), 0);
+  ASSERT_EQ(::listen(passed.get(), 5), 0);
+  std::vector<ActivatedSocket> sockets;
+  sockets.push_back({kServiceName, "", std::move(passed)});
+  serveUnconfined(std::move(sockets));
+  driver.peers.setNextPeer(Standing::confined, "com.example.App", {});
+  EXPECT_THAT(refusal(), IsRpcError(QXRpcErrorCode::refused));
+  driver.peers.setNextPeer(Standing::unconfined, std::nullopt, {});
+  EXPECT_TRUE(roundTrip(driver.connect()));
+}
+
+TEST(LinuxRpcServicePublishingTest, APassedSocketDoesNotMakeItsNameAService) {
+  const tests::TemporaryDirectory directory;
+  EXPECT_THAT(publish(directory.path() + "/" + kServiceName, "com.example.Other", PassedSocket::ofThatName),
+              EndedWith("no socket is known for it"));
 }
 
 TEST_F(LinuxRpcServiceTest, TheListenersEndClosesItsConnections) {

@@ -103,7 +103,7 @@ class LinuxDriver {
   fake_platform::FakeLog log;
   TestPeerDirectory peers;
   linux_platform::Reactor reactor{3};
-  linux_platform::LinuxRpcService service{reactor, peers, log.defaultLog(), {{kServiceName, socketPath}}};
+  linux_platform::LinuxRpcService service{reactor, peers, log.defaultLog(), {{kServiceName, {socketPath}}}};
 };
 
 }  // namespace docuvend::tests

@@ -22,6 +22,7 @@
 #include "platform/fake/FakeQueues.h"
 #include "platform/fake/FakeRpc.h"
 #include "platform/fake/FakeSandbox.h"
+#include "platform/fake/FakeStatus.h"
 
 namespace docuvend::fake_platform {
 
@@ -30,7 +31,7 @@ class FakePlatformOver {
  public:
   FakePlatformOver() {
     QXPlatform::install({queues, log, rpc, applicationRegistry, sandbox, extensionHost, fileCoordinator, deviceLock, notificationCenter,
-                         fileSystem, propertyLists});
+                         fileSystem, propertyLists, status});
   }
   // Conversations that the test left open own their extension, and are owned by it.
   ~FakePlatformOver() {
@@ -82,6 +83,7 @@ class FakePlatformOver {
   FakeNotificationCenter notificationCenter{queues.mainRunLoop()};
   FakeFileSystem fileSystem;
   FakePropertyLists propertyLists{fileSystem};
+  FakeStatus status;
 
  private:
   std::vector<std::shared_ptr<FakeVendor>> vendors_;

@@ -16,6 +16,13 @@ ConnectionLimiter::Admission ConnectionLimiter::admit(const std::string& peer) {
   return {Verdict::admitted, std::make_unique<Place>(shared_from_this(), peer)};
 }
 
+std::size_t ConnectionLimiter::openConnections() const {
+  const std::lock_guard lock(mutex_);
+  std::size_t open = 0;
+  for (const auto& [peer, count] : counts_) open += count.open;
+  return open;
+}
+
 void ConnectionLimiter::giveBack(const std::string& peer) {
   const std::lock_guard lock(mutex_);
   const auto found = counts_.find(peer);

@@ -39,6 +39,9 @@ class ConnectionLimiter : public std::enable_shared_from_this<ConnectionLimiter>
   // `peer` is what connections are counted by.
   [[nodiscard]] Admission admit(const std::string& peer);
 
+  // Of all peers together.
+  [[nodiscard]] std::size_t openConnections() const;
+
  private:
   struct Count {
     std::size_t open = 0;
@@ -46,7 +49,7 @@ class ConnectionLimiter : public std::enable_shared_from_this<ConnectionLimiter>
   };
   void giveBack(const std::string& peer);
 
-  std::mutex mutex_;
+  mutable std::mutex mutex_;
   std::map<std::string, Count> counts_;  // of peers with open connections
 };
 

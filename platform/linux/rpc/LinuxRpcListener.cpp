@@ -31,11 +31,16 @@ std::string countedAs(const PeerIdentity& peer) {
 
 }  // namespace
 
-LinuxRpcListener::LinuxRpcListener(Surroundings surroundings, std::unique_ptr<BoundSocket> socket)
-    : surroundings_(std::move(surroundings)), ownSocket_(std::move(socket)), socket_(ownSocket_->descriptor()), spare_(spareDescriptor()) {}
-
-LinuxRpcListener::LinuxRpcListener(Surroundings surroundings, UniqueDescriptor passedSocket)
+LinuxRpcListener::LinuxRpcListener(Surroundings surroundings, Service service, std::unique_ptr<BoundSocket> socket)
     : surroundings_(std::move(surroundings)),
+      service_(std::move(service)),
+      ownSocket_(std::move(socket)),
+      socket_(ownSocket_->descriptor()),
+      spare_(spareDescriptor()) {}
+
+LinuxRpcListener::LinuxRpcListener(Surroundings surroundings, Service service, UniqueDescriptor passedSocket)
+    : surroundings_(std::move(surroundings)),
+      service_(std::move(service)),
       passedSocket_(std::move(passedSocket)),
       socket_(passedSocket_.get()),
       spare_(spareDescriptor()) {}
@@ -103,6 +108,10 @@ void LinuxRpcListener::acceptAndDrop(int errnoValue) {
 
 void LinuxRpcListener::admit(UniqueDescriptor socket) {
   auto peer = surroundings_.peers.identify(socket.get());
+  if (!isFor(*peer)) {
+    refuseOutsider(*peer, std::move(socket));
+    return;
+  }
   const std::string counted = countedAs(*peer);
   const int process = peer->pid;
   auto [verdict, place] = surroundings_.limiter->admit(counted);
@@ -111,7 +120,7 @@ void LinuxRpcListener::admit(UniqueDescriptor socket) {
       surroundings_.log.write(QXLogType::defaultType, "[NOTICE] Refusing a connection of PID " + std::to_string(process) + ": " + counted +
                                                           " may not open more than " + std::to_string(kMaximumConnectionsPerPeer) + ".");
     }
-    Endpoint::create(surroundings_.reactor, std::move(socket), Hello{}, {})->close(refusal("too many connections"));
+    refuse(std::move(socket), "too many connections");
     return;
   }
   const std::uint64_t number = nextNumber_++;
@@ -124,6 +133,24 @@ void LinuxRpcListener::admit(UniqueDescriptor socket) {
     accepted_.emplace(number, Accepted{connection, std::move(place)});
   }
   offer(connection);
+}
+
+// A declared bundle changes nothing here: it comes later, and only from an unconfined process.
+bool LinuxRpcListener::isFor(const PeerIdentity& peer) const {
+  return service_.audience == Audience::everyone || peer.standing == Standing::unconfined;
+}
+
+void LinuxRpcListener::refuseOutsider(const PeerIdentity& peer, UniqueDescriptor socket) {
+  const std::string counted = countedAs(peer);
+  if (outsiders_.isDue(counted, std::chrono::steady_clock::now())) {
+    surroundings_.log.write(QXLogType::defaultType, "[NOTICE] Refusing a connection of PID " + std::to_string(peer.pid) + ": " +
+                                                        service_.name + " is not for " + counted + ".");
+  }
+  refuse(std::move(socket), service_.name + " is for unconfined processes alone");
+}
+
+void LinuxRpcListener::refuse(UniqueDescriptor socket, std::string reason) const {
+  Endpoint::create(surroundings_.reactor, std::move(socket), Hello{}, {})->close(refusal(std::move(reason)));
 }
 
 void LinuxRpcListener::offer(const std::shared_ptr<LinuxRpcConnection>& connection) {

@@ -1,7 +1,8 @@
 // Accepts the clients of one named service.
 //
 // The socket listens from creation on, so clients connect and wait; they are accepted from `resume` on, on threads of the reactor, one
-// after another. The listener keeps its connections alive until they end; when it goes they are closed.
+// after another. A peer that the service is not for is refused before the delegate hears of it. The listener keeps its connections alive
+// until they end; when it goes they are closed.
 #pragma once
 
 #include <map>
@@ -14,6 +15,8 @@
 #include "platform/linux/rpc/BoundSocket.h"
 #include "platform/linux/rpc/ConnectionLimiter.h"
 #include "platform/linux/rpc/LinuxRpcConnection.h"
+#include "platform/linux/rpc/NamedService.h"
+#include "platform/linux/rpc/RefusalLines.h"
 #include "platform/linux/wire/Reactor.h"
 #include "platform/log.h"
 #include "platform/rpc.h"
@@ -30,9 +33,14 @@ class LinuxRpcListener final : public QXRpcListener, public std::enable_shared_f
     std::shared_ptr<ConnectionLimiter> limiter;
   };
 
+  struct Service {
+    std::string name;
+    Audience audience;
+  };
+
   // A socket of our own, or one that was passed to us; both listen already.
-  LinuxRpcListener(Surroundings surroundings, std::unique_ptr<BoundSocket> socket);
-  LinuxRpcListener(Surroundings surroundings, UniqueDescriptor passedSocket);
+  LinuxRpcListener(Surroundings surroundings, Service service, std::unique_ptr<BoundSocket> socket);
+  LinuxRpcListener(Surroundings surroundings, Service service, UniqueDescriptor passedSocket);
   ~LinuxRpcListener() override;
 
   void setDelegate(std::weak_ptr<QXRpcListenerDelegate> delegate) override;
@@ -48,11 +56,15 @@ class LinuxRpcListener final : public QXRpcListener, public std::enable_shared_f
   [[nodiscard]] bool acceptOne();
   void acceptAndDrop(int errnoValue);
   void admit(UniqueDescriptor socket);
+  [[nodiscard]] bool isFor(const PeerIdentity& peer) const;
+  void refuseOutsider(const PeerIdentity& peer, UniqueDescriptor socket);
+  void refuse(UniqueDescriptor socket, std::string reason) const;
   void offer(const std::shared_ptr<LinuxRpcConnection>& connection);
   void forget(std::uint64_t number);
 
   // Constant after construction.
   const Surroundings surroundings_;
+  const Service service_;
   const std::unique_ptr<BoundSocket> ownSocket_;
   const UniqueDescriptor passedSocket_;
   const int socket_;
@@ -60,6 +72,7 @@ class LinuxRpcListener final : public QXRpcListener, public std::enable_shared_f
   // Only in the listening socket's handler.
   UniqueDescriptor spare_;
   bool isStarved_ = false;  // logged once until a client is accepted again
+  RefusalLines outsiders_;
   std::uint64_t nextNumber_ = 0;
 
   std::mutex mutex_;  // guards the rest

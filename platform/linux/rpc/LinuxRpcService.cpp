@@ -13,9 +13,9 @@
 
 namespace docuvend::linux_platform {
 
-LinuxRpcService::LinuxRpcService(Reactor& reactor, PeerDirectory& peers, QXLogHandle& log, std::map<std::string, std::string> socketPaths,
+LinuxRpcService::LinuxRpcService(Reactor& reactor, PeerDirectory& peers, QXLogHandle& log, NamedServices services,
                                  std::vector<ActivatedSocket> passedSockets)
-    : reactor_(reactor), peers_(peers), log_(log), socketPaths_(std::move(socketPaths)), passedSockets_(std::move(passedSockets)) {}
+    : reactor_(reactor), peers_(peers), log_(log), services_(std::move(services)), passedSockets_(std::move(passedSockets)) {}
 
 UniqueDescriptor LinuxRpcService::takePassedSocket(const std::string& name) {
   const std::lock_guard lock(mutex_);
@@ -34,17 +34,20 @@ void LinuxRpcService::giveUp(const std::string& name, const QXError& error) cons
 }
 
 std::shared_ptr<QXRpcListener> LinuxRpcService::listenerForService(const std::string& name) {
+  const auto found = services_.find(name);
+  if (found == services_.end()) giveUp(name, QXError::system(ENOENT, "no socket is known for it"));
+  const auto& [socketPath, audience] = found->second;
   LinuxRpcListener::Surroundings surroundings{reactor_, peers_, log_, limiter_};
+  LinuxRpcListener::Service service{name, audience};
   if (auto passed = takePassedSocket(name)) {
     const int flags = ::fcntl(passed.get(), F_GETFL);
     if (flags < 0 || ::fcntl(passed.get(), F_SETFL, flags | O_NONBLOCK) != 0) giveUp(name, QXError::system(errno, "the passed socket"));
-    return std::make_shared<LinuxRpcListener>(std::move(surroundings), std::move(passed));
+    return std::make_shared<LinuxRpcListener>(std::move(surroundings), std::move(service), std::move(passed));
   }
-  const auto path = socketPaths_.find(name);
-  if (path == socketPaths_.end()) giveUp(name, QXError::system(ENOENT, "no socket is known for it"));
-  auto bound = BoundSocket::create(path->second);
+  auto bound = BoundSocket::create(socketPath);
   if (const auto* error = std::get_if<QXError>(&bound)) giveUp(name, *error);
-  return std::make_shared<LinuxRpcListener>(std::move(surroundings), std::get<std::unique_ptr<BoundSocket>>(std::move(bound)));
+  return std::make_shared<LinuxRpcListener>(std::move(surroundings), std::move(service),
+                                            std::get<std::unique_ptr<BoundSocket>>(std::move(bound)));
 }
 
 }  // namespace docuvend::linux_platform

@@ -1,7 +1,6 @@
 // Named services at Unix sockets.
 #pragma once
 
-#include <map>
 #include <memory>
 #include <mutex>
 #include <string>
@@ -10,6 +9,7 @@
 #include "platform/linux/identity/PeerIdentity.h"
 #include "platform/linux/rpc/ActivatedSockets.h"
 #include "platform/linux/rpc/ConnectionLimiter.h"
+#include "platform/linux/rpc/NamedService.h"
 #include "platform/linux/wire/Reactor.h"
 #include "platform/log.h"
 #include "platform/rpc.h"
@@ -18,14 +18,16 @@ namespace docuvend::linux_platform {
 
 class LinuxRpcService final : public QXRpcService {
  public:
-  // `socketPaths` gives each name its socket's absolute path, in a directory that is there. A passed socket serves the name that the
-  // service manager calls it by or that ends its path; nothing is bound then. The reactor, the directory and the log outlive the service
-  // and its listeners.
-  LinuxRpcService(Reactor& reactor, PeerDirectory& peers, QXLogHandle& log, std::map<std::string, std::string> socketPaths,
+  // A passed socket serves the name that the service manager calls it by or that ends its path; nothing is bound then. The reactor, the
+  // directory and the log outlive the service and its listeners.
+  LinuxRpcService(Reactor& reactor, PeerDirectory& peers, QXLogHandle& log, NamedServices services,
                   std::vector<ActivatedSocket> passedSockets = {});
 
-  // The caller owns the listener. A name without a path or whose socket cannot be bound ends the process, with one log line.
+  // The caller owns the listener. A name that is none of the services' or whose socket cannot be bound ends the process, with one log line.
   [[nodiscard]] std::shared_ptr<QXRpcListener> listenerForService(const std::string& name) override;
+
+  // The connections that are open now, to all services together.
+  [[nodiscard]] std::size_t connectionCount() const { return limiter_->openConnections(); }
 
  private:
   [[nodiscard]] UniqueDescriptor takePassedSocket(const std::string& name);
@@ -34,7 +36,7 @@ class LinuxRpcService final : public QXRpcService {
   Reactor& reactor_;
   PeerDirectory& peers_;
   QXLogHandle& log_;
-  const std::map<std::string, std::string> socketPaths_;
+  const NamedServices services_;
   const std::shared_ptr<ConnectionLimiter> limiter_ = std::make_shared<ConnectionLimiter>();
 
   std::mutex mutex_;
