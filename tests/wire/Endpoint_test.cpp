@@ -4,6 +4,7 @@
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
 #include <sys/stat.h>
+#include <sys/un.h>
 
 #include <atomic>
 #include <cerrno>
@@ -426,6 +427,50 @@ TEST_F(EndpointTest, AMessageOnAnEndedConnectionFailsOnAnotherThread) {
   EXPECT_NE(*thread, std::this_thread::get_id());
 }
 
+TEST_F(EndpointTest, AFailedMessageSaysHowFarItCame) {
+  auto raw = connectRaw(nullptr);
+  raw.sayHello();
+  ASSERT_TRUE(server.hellos->take());
+  Mailbox<MessageFate> fates;
+  const auto remote = server.endpoint->remoteObjectProxy([&fates](const QXError&, MessageFate fate) { fates.put(fate); });
+
+  // This end would not send it.
+  remote->send({"text:", {QXValueKind::string}, {}}, {QXValue(std::string(kMaximumTextBytes + 1, 'x'))}, intoReplies());
+  EXPECT_EQ(fates.take(), MessageFate::refused);
+  // The peer would not run it.
+  remote->send(kList, {}, intoReplies());
+  ASSERT_TRUE(raw.read<Hello>());
+  const auto request = raw.read<RequestFrame>();
+  ASSERT_TRUE(request);
+  raw.write(tests::bytesOf(FailureFrame{request->callID, QXError::make("Test", 1, "no")}));
+  EXPECT_EQ(fates.take(), MessageFate::refused);
+
+  // One that the socket took whole, then more than any socket takes.
+  remote->send(kList, {}, intoReplies());
+  const QXRpcOperation operation{"data:", {QXValueKind::data}, {}};
+  const QXValue block(QXData{std::vector<std::uint8_t>(kMaximumFrameBytes / 2)});
+  for (int i = 0; i < 4; ++i) remote->send(operation, {block}, intoReplies());
+  server.endpoint->close(QXError::system(ECONNABORTED, "enough"));
+  EXPECT_EQ(fates.take(), MessageFate::unanswered);
+  ASSERT_TRUE(server.closed->take());
+  ASSERT_EQ(fates.count(), 4U);
+  for (int i = 0; i < 3; ++i) fates.take();
+  EXPECT_EQ(fates.take(), MessageFate::unsent);
+
+  remote->send(kList, {}, intoReplies());
+  EXPECT_EQ(fates.take(), MessageFate::unsent) << "the connection is over";
+}
+
+TEST_F(EndpointTest, AMessageToAPeerThatHasLeftIsUnsentAlsoBeforeItsLeavingIsSeen) {
+  auto [one, two] = socketPair();
+  server = makeSide(std::move(one));
+  two.reset();
+  Mailbox<MessageFate> fates;
+  server.endpoint->remoteObjectProxy([&fates](const QXError&, MessageFate fate) { fates.put(fate); })->send(kList, {}, intoReplies());
+  server.endpoint->resume();
+  EXPECT_EQ(fates.take(), MessageFate::unsent);
+}
+
 TEST_F(EndpointTest, CloseTellsThePeerWhy) {
   connect(recorder);
   const QXError reason = QXError::make("Some domain", 7, "because");
@@ -517,7 +562,7 @@ TEST_F(EndpointTest, WhatTheSocketDoesNotTakeAtOnceIsWrittenWhenThePeerReads) {
   Mailbox<int> idle;
   reactor->post([&idle] { idle.put(1); });
   ASSERT_TRUE(idle.take());
-  const auto remote = server.endpoint->remoteObjectProxy({});
+  const auto remote = server.endpoint->remoteObjectProxy(QXErrorHandler());
   const QXRpcOperation operation{"data:", {QXValueKind::data}, {}};
   constexpr std::size_t kBlocks = 6;
   const QXValue block(QXData{std::vector<std::uint8_t>(kMaximumFrameBytes / 2, 7)});
@@ -609,6 +654,31 @@ TEST(ConnectToSocketTest, SaysWhyThereIsNoConnection) {
   const auto result = connectToSocket("/nonexistent/socket");
   ASSERT_TRUE(std::holds_alternative<QXError>(result));
   EXPECT_EQ(std::get<QXError>(result).code, ENOENT);
+}
+
+TEST(ConnectToSocketTest, WaitsForAFullQueueNoLongerThanItIsTold) {
+  std::string pattern = (std::filesystem::temp_directory_path() / "dvXXXXXX").string();
+  ASSERT_NE(::mkdtemp(pattern.data()), nullptr);
+  const std::string path = pattern + "/s";
+  UniqueDescriptor service(::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0));
+  sockaddr_un address{};
+  address.sun_family = AF_UNIX;
+  path.copy(address.sun_path, sizeof(address.sun_path) - 1);
+  ASSERT_EQ(::bind(service.get(), reinterpret_cast<const sockaddr*>(&address), sizeof(address)), 0);
+  ASSERT_EQ(::listen(service.get(), 0), 0);
+  std::vector<UniqueDescriptor> clients;
+  std::optional<QXError> failure;
+  for (int i = 0; i < 3 && !failure; ++i) {
+    auto connected = connectToSocket(path, std::chrono::milliseconds(1));
+    if (auto* error = std::get_if<QXError>(&connected)) {
+      failure = *error;
+    } else {
+      clients.push_back(std::get<UniqueDescriptor>(std::move(connected)));
+    }
+  }
+  EXPECT_THAT(failure, IsSystemError(EAGAIN));
+  EXPECT_EQ(clients.size(), 1U);
+  std::filesystem::remove_all(pattern);
 }
 
 // What a peer must not send, and the reason that ends the connection.

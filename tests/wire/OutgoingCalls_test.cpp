@@ -13,7 +13,7 @@ class OutgoingCallsTest : public testing::Test {
     const std::uint64_t number = calls.nextID();
     QXRpcReply reply;
     if (wantsReply) reply = [](QXArray) {};
-    calls.add({{}, std::move(reply), std::make_shared<const QXErrorHandler>()}, forgotten);
+    calls.add({{}, std::move(reply), std::make_shared<const FailureHandler>()}, forgotten);
     return number;
   }
 
@@ -60,7 +60,11 @@ TEST_F(OutgoingCallsTest, TheEndSettlesWhatWantsAReplyAndWhatWasNotWritten) {
   add(false);
   add(false);
   add(true);
-  EXPECT_EQ(calls.settleAll({3}, forgotten).size(), 3U);
+  const auto lost = calls.settleAll({3, 4}, forgotten);
+  ASSERT_EQ(lost.size(), 3U);
+  EXPECT_EQ(lost[0].fate, MessageFate::unanswered);
+  EXPECT_EQ(lost[1].fate, MessageFate::unsent);
+  EXPECT_EQ(lost[2].fate, MessageFate::unsent);
   EXPECT_EQ(forgotten.size(), 1U);
   EXPECT_FALSE(calls.settle(4, forgotten));
 }

@@ -2,7 +2,9 @@
 
 #include <sys/epoll.h>
 #include <sys/socket.h>
+#include <sys/time.h>
 
+#include <algorithm>
 #include <cerrno>
 #include <cstdint>
 #include <mutex>
@@ -33,6 +35,8 @@
 namespace docuvend::linux_platform {
 namespace {
 
+constexpr std::int64_t kMicrosecondsPerSecond = 1'000'000;
+
 constexpr std::uint32_t kReadable = EPOLLIN;
 constexpr std::uint32_t kWritable = EPOLLOUT;
 
@@ -55,7 +59,7 @@ class Endpoint::State final : public AnswerSink, public std::enable_shared_from_
 
   void sendHello(Hello hello);
   void resume();
-  void send(const QXRpcOperation& operation, QXArray arguments, QXRpcReply reply, std::shared_ptr<const QXErrorHandler> errorHandler);
+  void send(const QXRpcOperation& operation, QXArray arguments, QXRpcReply reply, std::shared_ptr<const FailureHandler> failureHandler);
   void sendReply(ReplyFrame reply) override;
   void sendFailure(FailureFrame failure) override;
   void close(const QXError& reason, Farewell farewell, Cause cause = Cause::ordinary);
@@ -84,7 +88,7 @@ class Endpoint::State final : public AnswerSink, public std::enable_shared_from_
   void write(const Frame& frame);
   void dropSlowPeer();
   std::shared_ptr<const UniqueDescriptor> openSocket();
-  void postFailure(std::shared_ptr<const QXErrorHandler> errorHandler, QXError error) const;
+  void postFailure(std::shared_ptr<const FailureHandler> failureHandler, QXError error, MessageFate fate) const;
 
   Reactor& reactor_;  // used in `resume` alone: it may be gone later
   const Reactor::Poster post_;
@@ -106,16 +110,16 @@ class Endpoint::State final : public AnswerSink, public std::enable_shared_from_
 
 class Endpoint::Proxy final : public QXRpcProxy {
  public:
-  Proxy(std::shared_ptr<Endpoint> endpoint, QXErrorHandler errorHandler)
-      : endpoint_(std::move(endpoint)), errorHandler_(std::make_shared<const QXErrorHandler>(std::move(errorHandler))) {}
+  Proxy(std::shared_ptr<Endpoint> endpoint, FailureHandler failureHandler)
+      : endpoint_(std::move(endpoint)), failureHandler_(std::make_shared<const FailureHandler>(std::move(failureHandler))) {}
 
   void send(const QXRpcOperation& operation, QXArray arguments, QXRpcReply reply) override {
-    endpoint_->state_->send(operation, std::move(arguments), std::move(reply), errorHandler_);
+    endpoint_->state_->send(operation, std::move(arguments), std::move(reply), failureHandler_);
   }
 
  private:
   const std::shared_ptr<Endpoint> endpoint_;
-  const std::shared_ptr<const QXErrorHandler> errorHandler_;
+  const std::shared_ptr<const FailureHandler> failureHandler_;
 };
 
 void Endpoint::State::sendHello(Hello hello) {
@@ -228,7 +232,7 @@ void Endpoint::State::run(ReplyFrame reply) {
   const auto call = settle(reply.callID);
   if (!call || !call->reply) return;
   if (const auto mismatch = qxMismatch(call->replies, reply.values)) {
-    if (*call->errorHandler) (*call->errorHandler)(failure(QXRpcErrorCode::invalidReply, *mismatch));
+    if (*call->failureHandler) (*call->failureHandler)(failure(QXRpcErrorCode::invalidReply, *mismatch), MessageFate::refused);
   } else {
     call->reply(std::move(reply.values));
   }
@@ -236,7 +240,7 @@ void Endpoint::State::run(ReplyFrame reply) {
 
 void Endpoint::State::run(FailureFrame failure) {
   const auto call = settle(failure.callID);
-  if (call && *call->errorHandler) (*call->errorHandler)(failure.error);
+  if (call && *call->failureHandler) (*call->failureHandler)(failure.error, MessageFate::refused);
 }
 
 void Endpoint::State::closeMalformed(const Malformed& malformed) {
@@ -244,16 +248,18 @@ void Endpoint::State::closeMalformed(const Malformed& malformed) {
 }
 
 void Endpoint::State::send(const QXRpcOperation& operation, QXArray arguments, QXRpcReply reply,
-                           std::shared_ptr<const QXErrorHandler> errorHandler) {
+                           std::shared_ptr<const FailureHandler> failureHandler) {
   const bool wantsReply = static_cast<bool>(reply);
   RequestFrame request{0, wantsReply, operation.name, std::move(arguments)};
   OutgoingCalls::Forgotten forgotten;
   std::optional<QXError> problem;
+  MessageFate fate = MessageFate::refused;
   Delivery delivery = Delivery::underway;
   {
     const std::lock_guard lock(mutex_);
     if (closed_) {
       problem = closed_;
+      fate = MessageFate::unsent;
     } else if (wantsReply && outgoing_.isFull()) {
       problem = failure(QXRpcErrorCode::tooManyCalls, "too many messages wait for their answers");
     } else {
@@ -262,13 +268,13 @@ void Endpoint::State::send(const QXRpcOperation& operation, QXArray arguments, Q
       if (const auto* malformed = std::get_if<Malformed>(&encoded)) {
         problem = failure(QXRpcErrorCode::notTransmissible, malformed->reason);
       } else {
-        writer_.add(std::get<EncodedFrame>(std::move(encoded)), wantsReply ? 0 : outgoing_.nextID());
-        outgoing_.add({operation.replies, std::move(reply), errorHandler}, forgotten);
+        writer_.add(std::get<EncodedFrame>(std::move(encoded)), outgoing_.nextID());
+        outgoing_.add({operation.replies, std::move(reply), failureHandler}, forgotten);
         delivery = write();
       }
     }
   }
-  if (problem) postFailure(std::move(errorHandler), *std::move(problem));
+  if (problem) postFailure(std::move(failureHandler), *std::move(problem), fate);
   if (delivery == Delivery::overBound) dropSlowPeer();
 }
 
@@ -322,15 +328,15 @@ void Endpoint::State::dropSlowPeer() {
   close(failure(QXRpcErrorCode::peerDoesNotRead, "the peer does not read what is sent to it"), Farewell::silent, Cause::misbehaviour);
 }
 
-void Endpoint::State::postFailure(std::shared_ptr<const QXErrorHandler> errorHandler, QXError error) const {
-  if (!*errorHandler) return;
-  post_([errorHandler = std::move(errorHandler), error = std::move(error)] { (*errorHandler)(error); });
+void Endpoint::State::postFailure(std::shared_ptr<const FailureHandler> failureHandler, QXError error, MessageFate fate) const {
+  if (!*failureHandler) return;
+  post_([failureHandler = std::move(failureHandler), error = std::move(error), fate] { (*failureHandler)(error, fate); });
 }
 
 void Endpoint::State::close(const QXError& reason, Farewell farewell, Cause cause) {
   std::shared_ptr<Reactor::Registration> registration;
   std::shared_ptr<const UniqueDescriptor> socket;
-  std::vector<OutgoingCalls::Call> failed;
+  std::vector<OutgoingCalls::Lost> failed;
   OutgoingCalls::Forgotten forgotten;
   {
     const std::lock_guard lock(mutex_);
@@ -354,8 +360,8 @@ void Endpoint::State::close(const QXError& reason, Farewell farewell, Cause caus
   post_([failed = std::move(failed), blame = cause == Cause::misbehaviour ? handlers_.onMisbehaviour : nullptr, onClose = handlers_.onClose,
          reason] {
     if (blame) blame(reason);
-    for (const auto& call : failed) {
-      if (*call.errorHandler) (*call.errorHandler)(reason);
+    for (const auto& [call, fate] : failed) {
+      if (*call.failureHandler) (*call.failureHandler)(reason, fate);
     }
     if (onClose) onClose(reason);
   });
@@ -379,17 +385,31 @@ void Endpoint::setExportedObject(std::shared_ptr<QXRpcExportedObject> object) { 
 void Endpoint::resume() { state_->resume(); }
 
 std::shared_ptr<QXRpcProxy> Endpoint::remoteObjectProxy(QXErrorHandler errorHandler) {
-  return std::make_shared<Proxy>(shared_from_this(), std::move(errorHandler));
+  FailureHandler failureHandler;
+  if (errorHandler) failureHandler = [errorHandler = std::move(errorHandler)](const QXError& error, MessageFate) { errorHandler(error); };
+  return remoteObjectProxy(std::move(failureHandler));
+}
+
+std::shared_ptr<QXRpcProxy> Endpoint::remoteObjectProxy(FailureHandler failureHandler) {
+  return std::make_shared<Proxy>(shared_from_this(), std::move(failureHandler));
 }
 
 void Endpoint::close(const QXError& reason) { state_->close(reason, Farewell::tellPeer); }
 
-std::variant<UniqueDescriptor, QXError> connectToSocket(const std::string& path) {
+std::variant<UniqueDescriptor, QXError> connectToSocket(const std::string& path, std::optional<std::chrono::milliseconds> patience) {
   auto found = SocketAddress::forPath(path);
   if (auto* error = std::get_if<QXError>(&found)) return std::move(*error);
   const auto& address = std::get<SocketAddress>(found);
   UniqueDescriptor socket(::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0));
   if (!socket) return QXError::system(errno, "cannot create a socket");
+  if (patience) {
+    // Bounds connecting alone: an endpoint's writing never waits. A zero would be no bound.
+    const auto microseconds = std::max<std::int64_t>(1, std::chrono::microseconds(*patience).count());
+    const timeval bound{microseconds / kMicrosecondsPerSecond, microseconds % kMicrosecondsPerSecond};
+    if (::setsockopt(socket.get(), SOL_SOCKET, SO_SNDTIMEO, &bound, sizeof(bound)) != 0) {
+      return QXError::system(errno, "cannot bound the wait for a connection");
+    }
+  }
   int result = 0;
   do {
     result = ::connect(socket.get(), address.address(), address.length());

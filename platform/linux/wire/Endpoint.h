@@ -6,6 +6,7 @@
 // frame ends the connection.
 #pragma once
 
+#include <chrono>
 #include <functional>
 #include <memory>
 #include <optional>
@@ -14,6 +15,7 @@
 
 #include "platform/linux/base/UniqueDescriptor.h"
 #include "platform/linux/wire/Frame.h"
+#include "platform/linux/wire/OutgoingCalls.h"
 #include "platform/linux/wire/Reactor.h"
 #include "platform/rpc.h"
 #include "platform/rpc_errors.h"
@@ -48,6 +50,8 @@ class Endpoint : public std::enable_shared_from_this<Endpoint> {
 
   // Each failed message calls the handler once. Keeps the endpoint alive.
   [[nodiscard]] std::shared_ptr<QXRpcProxy> remoteObjectProxy(QXErrorHandler errorHandler);
+  // The same, for those whom it concerns how far a failed message came.
+  [[nodiscard]] std::shared_ptr<QXRpcProxy> remoteObjectProxy(FailureHandler failureHandler);
 
   // Ends the connection and tells the peer why; messages that wait for an answer fail. Waits for nothing and calls no handler itself.
   void close(const QXError& reason);
@@ -60,7 +64,9 @@ class Endpoint : public std::enable_shared_from_this<Endpoint> {
   const std::shared_ptr<State> state_;
 };
 
-// Connects to a named service's socket. Waits while the service has more clients waiting than it can queue.
-[[nodiscard]] std::variant<UniqueDescriptor, QXError> connectToSocket(const std::string& path);
+// Connects to a named service's socket. Waits while the service has more clients waiting than it can queue; with EAGAIN no longer than
+// that.
+[[nodiscard]] std::variant<UniqueDescriptor, QXError> connectToSocket(const std::string& path,
+                                                                      std::optional<std::chrono::milliseconds> patience = std::nullopt);
 
 }  // namespace docuvend::linux_platform

@@ -1,6 +1,7 @@
 #include "platform/linux/wire/OutgoingCalls.h"
 
 #include <iterator>
+#include <set>
 
 #include "platform/linux/wire/Limits.h"
 
@@ -36,13 +37,16 @@ std::optional<OutgoingCalls::Call> OutgoingCalls::settle(std::uint64_t callID, F
   return settled;
 }
 
-std::vector<OutgoingCalls::Call> OutgoingCalls::settleAll(const std::vector<std::uint64_t>& unwritten, Forgotten& forgotten) {
-  for (const std::uint64_t callID : unwritten) {
+std::vector<OutgoingCalls::Lost> OutgoingCalls::settleAll(const std::vector<std::uint64_t>& unwritten, Forgotten& forgotten) {
+  const std::set<std::uint64_t> unsent(unwritten.begin(), unwritten.end());
+  for (const std::uint64_t callID : unsent) {
     if (auto node = unconfirmed_.extract(callID)) waiting_.insert(std::move(node));
   }
   forgetUnconfirmedBefore(unconfirmed_.end(), forgotten);
-  std::vector<Call> calls;
-  for (auto& [callID, call] : waiting_) calls.push_back(std::move(call));
+  std::vector<Lost> calls;
+  for (auto& [callID, call] : waiting_) {
+    calls.push_back({std::move(call), unsent.contains(callID) ? MessageFate::unsent : MessageFate::unanswered});
+  }
   waiting_.clear();
   return calls;
 }

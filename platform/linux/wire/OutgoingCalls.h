@@ -16,12 +16,24 @@
 
 namespace docuvend::linux_platform {
 
+// How far a message came that failed.
+enum class MessageFate {
+  refused,     // this end would not send it, or the peer would not run it; the connection goes on
+  unsent,      // the connection ended before it had left whole: the peer has not run it
+  unanswered,  // the connection ended after it had left: the peer may have run it
+};
+using FailureHandler = std::function<void(const QXError&, MessageFate)>;
+
 class OutgoingCalls {
  public:
   struct Call {
     std::vector<QXValueKind> replies;
     QXRpcReply reply;  // empty: none wanted
-    std::shared_ptr<const QXErrorHandler> errorHandler;
+    std::shared_ptr<const FailureHandler> failureHandler;
+  };
+  struct Lost {
+    Call call;
+    MessageFate fate;
   };
   using Forgotten = std::vector<Call>;  // to be destroyed where nothing is locked
 
@@ -36,7 +48,7 @@ class OutgoingCalls {
   // calls before this one that want no reply have been taken.
   [[nodiscard]] std::optional<Call> settle(std::uint64_t callID, Forgotten& forgotten);
   // What fails when the connection ends: the calls that want a reply, and those in `unwritten`. In the order of sending.
-  [[nodiscard]] std::vector<Call> settleAll(const std::vector<std::uint64_t>& unwritten, Forgotten& forgotten);
+  [[nodiscard]] std::vector<Lost> settleAll(const std::vector<std::uint64_t>& unwritten, Forgotten& forgotten);
 
  private:
   void forgetUnconfirmedBefore(std::map<std::uint64_t, Call>::iterator end, Forgotten& forgotten);
