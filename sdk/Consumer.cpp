@@ -7,6 +7,7 @@
 #include <utility>
 
 #include "common/DVErrorCodes.h"
+#include "platform/linux/base/confinement.h"
 #include "platform/linux/wire/FileCoordinationProtocol.h"
 #include "platform/linux/wire/SandboxProtocol.h"
 #include "sdk/ServiceConnections.h"
@@ -16,11 +17,9 @@ namespace docuvend {
 
 namespace {
 
-constexpr const char* kDescriptionPath = "/.docuvend-info";
-
 // The name in the description that the launcher put at the root of a confined process's file system.
 std::optional<ConsumerID> launchedAs() {
-  std::ifstream description(kDescriptionPath);
+  std::ifstream description(linux_platform::kDescriptionPath);
   static constexpr std::string_view kName = "name=";
   for (std::string line; std::getline(description, line);) {
     if (line.starts_with(kName)) return ConsumerID{line.substr(kName.size())};

@@ -13,6 +13,7 @@
 #include <utility>
 
 #include "platform/linux/base/UniqueDescriptor.h"
+#include "platform/linux/base/confinement.h"
 #include "platform/linux/wire/Endpoint.h"
 #include "platform/linux/wire/Reactor.h"
 #include "platform/rpc_protocol.h"
@@ -22,8 +23,6 @@
 namespace docuvend {
 namespace {
 
-// The number under which the connection is inherited.
-constexpr int kSocketNumber = 3;
 constexpr unsigned kReactorThreads = 1;
 constexpr std::chrono::milliseconds kLastOperations{1'000};
 constexpr int kUsageStatus = 64;
@@ -138,11 +137,11 @@ bool isInheritedSocket(int number) {
 }  // namespace
 
 int runProvider(Provider& provider) {
-  if (!isInheritedSocket(kSocketNumber)) {
+  if (!isInheritedSocket(linux_platform::kExtensionSocketNumber)) {
     std::fputs("This is a provider extension: Docuvend starts it, with a connection as descriptor 3.\n", stderr);
     return kUsageStatus;
   }
-  linux_platform::UniqueDescriptor socket(kSocketNumber);
+  linux_platform::UniqueDescriptor socket(linux_platform::kExtensionSocketNumber);
 
   auto work = std::make_unique<ProviderWork>();
   const auto end = std::make_shared<ConnectionEnd>();

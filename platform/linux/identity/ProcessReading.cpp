@@ -20,6 +20,7 @@
 #include <string_view>
 #include <system_error>
 
+#include "platform/linux/base/confinement.h"
 #include "platform/linux/base/kernel.h"
 
 namespace docuvend::linux_platform {

@@ -12,6 +12,7 @@
 #include <memory>
 #include <string_view>
 
+#include "platform/linux/base/confinement.h"
 #include "platform/linux/launch/HostLayout.h"
 #include "platform/linux/launch/LaunchArguments.h"
 #include "platform/linux/launch/LaunchDescription.h"

@@ -23,11 +23,6 @@ enum class LaunchKind {
   extension,    // sees no socket but the one that it inherits
 };
 
-// Where the description lies inside the confinement.
-inline constexpr const char* kDescriptionPath = "/.docuvend-info";
-// The number under which an extension finds its connection to the daemon.
-inline constexpr int kExtensionSocketNumber = 3;
-
 // Ready to execute: a program, its arguments and the descriptors that it must inherit under exactly these numbers.
 struct LaunchPlan {
   std::vector<std::string> arguments;    // [0] is the absolute path of the program to execute

@@ -10,6 +10,7 @@
 #include <algorithm>
 #include <array>
 
+#include "platform/linux/base/confinement.h"
 #include "platform/linux/launch/policy/Landlock.h"
 
 namespace docuvend::linux_platform {
