@@ -1,0 +1,157 @@
+// Of the copies of one identifier that the user's directory may hold, put there by other means, the registry takes the first by name. That
+// one is exchanged or removed; the others go too, or one of them would come to light. They go first when a bundle is removed, and last
+// when it is updated, so that whoever looks in between never sees an older copy than the one that counted.
+#include "platform/linux/bundles/BundleInstaller.h"
+
+#include <fcntl.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include <algorithm>
+#include <cerrno>
+#include <filesystem>
+#include <system_error>
+#include <utility>
+#include <vector>
+
+#include "platform/linux/bundles/BundleCopy.h"
+#include "platform/linux/bundles/BundleErrors.h"
+#include "platform/linux/bundles/BundleParser.h"
+#include "platform/linux/bundles/BundleScan.h"
+#include "platform/linux/bundles/UserBundleDirectory.h"
+
+namespace docuvend::linux_platform {
+namespace {
+
+namespace fs = std::filesystem;
+using Identified = std::variant<std::string, QXError>;
+
+std::string nameOf(const std::string& path) { return fs::path(path).filename().string(); }
+
+// The identifier of the bundle that lies there.
+Identified identify(const std::string& directory, const std::string& shownAs, QXPropertyLists& propertyLists) {
+  auto parsed = parseBundle(directory, propertyLists);
+  if (const auto* problem = std::get_if<BundleProblem>(&parsed)) {
+    return bundleError(BundleErrorCode::noBundle, shownAs + " is no bundle: " + problem->text + ".");
+  }
+  return std::get<ParsedBundle>(std::move(parsed)).bundle.identifier;
+}
+
+// The names of the directories of `root` that hold a bundle of that identifier, the one that counts first.
+std::vector<std::string> copiesOf(const std::string& identifier, const std::string& root, QXPropertyLists& propertyLists) {
+  std::vector<std::string> result;
+  for (const std::string& directory : bundleDirectories(root)) {
+    const auto parsed = parseBundle(directory, propertyLists);
+    const auto* bundle = std::get_if<ParsedBundle>(&parsed);
+    if (bundle != nullptr && bundle->bundle.identifier == identifier) result.push_back(nameOf(directory));
+  }
+  return result;
+}
+
+std::optional<QXError> refuseTheSystems(const std::string& identifier, const Paths& paths, QXPropertyLists& propertyLists) {
+  if (copiesOf(identifier, paths.systemBundles, propertyLists).empty()) return std::nullopt;
+  return bundleError(BundleErrorCode::notPermitted, "The bundle " + identifier + " is the system's; only the system changes it.");
+}
+
+// A bundle's copy under a hidden name, and whatever else has taken that name; gone with the object.
+class HiddenCopy {
+ public:
+  HiddenCopy(const UserBundleDirectory& place, std::string name) : place_(place), name_(std::move(name)) {}
+  HiddenCopy(const HiddenCopy&) = delete;
+  HiddenCopy& operator=(const HiddenCopy&) = delete;
+  ~HiddenCopy() { place_.removeHidden(name_); }
+
+  [[nodiscard]] const std::string& name() const { return name_; }
+
+  [[nodiscard]] std::optional<QXError> fill(const std::string& source) const {
+    const UniqueDescriptor from(::open(source.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC));
+    if (!from) return QXError::system(errno, "cannot open " + source);
+    if (::mkdirat(place_.descriptor(), name_.c_str(), S_IRWXU) != 0) return QXError::system(errno, "cannot write into " + place_.path());
+    const UniqueDescriptor to(::openat(place_.descriptor(), name_.c_str(), O_RDONLY | O_DIRECTORY | O_NOFOLLOW | O_CLOEXEC));
+    if (!to) return QXError::system(errno, "cannot write into " + place_.path());
+    return copyBundle(from, to);
+  }
+
+ private:
+  const UserBundleDirectory& place_;
+  const std::string name_;
+};
+
+// Moves a directory out of sight and removes it.
+std::optional<QXError> removeCopy(const UserBundleDirectory& place, const std::string& name) {
+  auto hidden = place.hiddenName();
+  if (auto* error = std::get_if<QXError>(&hidden)) return std::move(*error);
+  const HiddenCopy out(place, std::get<std::string>(std::move(hidden)));
+  return place.rename(name, out.name());
+}
+
+enum class Occupant { none, brokenBundle };
+
+// What lies at the bundle's own name without being one of its copies, put there by other means. A broken bundle is replaced, anything that
+// means something stays.
+std::variant<Occupant, QXError> occupantOf(const std::string& path, QXPropertyLists& propertyLists) {
+  std::error_code error;
+  const auto type = fs::symlink_status(path, error).type();
+  if (type == fs::file_type::not_found) return Occupant::none;
+  if (type == fs::file_type::directory && std::holds_alternative<BundleProblem>(parseBundle(path, propertyLists))) {
+    return Occupant::brokenBundle;
+  }
+  return bundleError(BundleErrorCode::inTheWay, path + " is in the way.");
+}
+
+}  // namespace
+
+std::variant<InstalledBundle, QXError> installBundle(const std::string& directory, const Paths& paths, QXPropertyLists& propertyLists) {
+  std::error_code error;
+  const fs::path source = fs::canonical(directory, error);
+  if (error) return bundleError(BundleErrorCode::noBundle, directory + " cannot be opened: " + error.message() + ".");
+  // What can be refused at once is not copied first. What counts is the copy.
+  auto identified = identify(source.string(), directory, propertyLists);
+  if (auto* refusal = std::get_if<QXError>(&identified)) return std::move(*refusal);
+
+  auto opened = UserBundleDirectory::open(paths, UserBundleDirectory::Absence::isMended);
+  if (auto* failure = std::get_if<QXError>(&opened)) return std::move(*failure);
+  const auto& place = std::get<UserBundleDirectory>(opened);
+  auto hidden = place.hiddenName();
+  if (auto* failure = std::get_if<QXError>(&hidden)) return std::move(*failure);
+  const HiddenCopy copy(place, std::get<std::string>(std::move(hidden)));
+  if (auto failure = copy.fill(source.string())) return *std::move(failure);
+  identified = identify(place.path() + "/" + copy.name(), directory, propertyLists);
+  if (auto* refusal = std::get_if<QXError>(&identified)) return std::move(*refusal);
+
+  const auto& identifier = std::get<std::string>(identified);
+  if (auto refusal = refuseTheSystems(identifier, paths, propertyLists)) return *std::move(refusal);
+  const auto older = copiesOf(identifier, place.path(), propertyLists);
+  if (older.empty()) {
+    const auto occupant = occupantOf(place.path() + "/" + identifier, propertyLists);
+    if (const auto* refusal = std::get_if<QXError>(&occupant)) return *refusal;
+    const bool isFree = std::get<Occupant>(occupant) == Occupant::none;
+    auto failure = isFree ? place.rename(copy.name(), identifier) : place.exchange(copy.name(), identifier);
+    if (failure) return *std::move(failure);
+    return InstalledBundle{identifier, place.path() + "/" + identifier, InstalledBundle::Outcome::installed};
+  }
+  if (auto failure = place.exchange(copy.name(), older.front())) return *std::move(failure);
+  for (std::size_t i = 1; i < older.size(); ++i) {
+    if (auto failure = removeCopy(place, older[i])) return *std::move(failure);
+  }
+  return InstalledBundle{identifier, place.path() + "/" + older.front(), InstalledBundle::Outcome::updated};
+}
+
+std::optional<QXError> uninstallBundle(const std::string& identifier, const Paths& paths, QXPropertyLists& propertyLists) {
+  if (auto refusal = refuseTheSystems(identifier, paths, propertyLists)) return refusal;
+  const QXError unknown = bundleError(BundleErrorCode::notFound, "No bundle " + identifier + " is installed.");
+  std::error_code error;
+  if (!fs::exists(paths.userBundles, error)) return unknown;
+  auto opened = UserBundleDirectory::open(paths, UserBundleDirectory::Absence::isAnError);
+  if (auto* failure = std::get_if<QXError>(&opened)) return std::move(*failure);
+  const auto& place = std::get<UserBundleDirectory>(opened);
+  auto copies = copiesOf(identifier, place.path(), propertyLists);
+  if (copies.empty()) return unknown;
+  std::reverse(copies.begin(), copies.end());
+  for (const std::string& name : copies) {
+    if (auto failure = removeCopy(place, name)) return failure;
+  }
+  return std::nullopt;
+}
+
+}  // namespace docuvend::linux_platform
