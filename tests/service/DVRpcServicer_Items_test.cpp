@@ -1,125 +1,138 @@
-#include "tests/service/ServicerFixture.h"
+// What a placeholder, the start and the end of providing have in common.
+#include "tests/service/ItemsFixture.h"
 
 namespace docuvend {
 namespace {
 
-using fake_platform::FakePlatform;
+using fake_platform::FakeLogSwitch;
 
-constexpr const char* kServing = "[DEBUG] Serving: startProvidingItemAtURL:fromProviderID:forConsumerID:completionHandler:";
-constexpr const char* kStartMessage = "_startProvidingItemAtURL:completion:";
+class DVRpcServicerItemsTest : public ItemsFixtureOverRows {};
 
-class DVRpcServicerItemsTest : public ServicerFixture {
- protected:
-  void SetUp() override {
-    registerProviders();
-    entitle(kDVReadEntitlement);
-    answerItemID(*cellar_, /*error=*/std::nullopt, kItem.value);
-    answerStart(/*error=*/std::nullopt);
-  }
-
-  void answerStart(std::optional<QXError> error) {
-    cellar_->vendor().respond(kStartMessage, [error](const QXArray&) { return QXArray{error ? QXValue(*error) : QXValue()}; });
-  }
-  void start(std::optional<QXURL> url, std::optional<ProviderID> provider, std::optional<ConsumerID> consumer) {
-    servicer_->startProvidingItemAtURL(std::move(url), std::move(provider), std::move(consumer), errorReply());
-  }
-  [[nodiscard]] bool wasStarted() const {
-    const auto names = cellar_->vendor().operationNames();
-    return std::ranges::find(names, kStartMessage) != names.end();
-  }
-};
+INSTANTIATE_TEST_SUITE_P(Each, DVRpcServicerItemsTest, testing::Values(kPlaceholder, kStart, kStop), titleOf);
 
 // --- The whole way
 
-TEST_F(DVRpcServicerItemsTest, AGrantedItemIsStartedAndTheProvidersAnswerIsTheReply) {
-  grant(kCellar, kItem, kEditor);
-  platform_.log.clear();
-  start(kReport, kCellar, kEditor);
-  EXPECT_EQ(lateAnswer().error, std::nullopt);
-  const auto& messages = cellar_->vendor().messages();
-  ASSERT_EQ(messages.size(), 3U);
-  EXPECT_EQ(messages[1].operation.name, "_identifierForItemAtURL:completion:");
-  EXPECT_EQ(messages[1].arguments, QXArray{kReport});
-  EXPECT_EQ(messages[2].operation.name, kStartMessage);
-  EXPECT_EQ(messages[2].arguments, QXArray{kReport});
-  EXPECT_EQ(logged(), (Entries{{QXLogType::debug, kServing}}));
+TEST_P(DVRpcServicerItemsTest, IsForwardedToTheProviderWithTheURLAndLogsOnlyThatItIsServed) {
+  grantAndAsk();
+  ASSERT_EQ(answers_.size(), 1U);
+  const auto& message = cellar_->vendor().messages().back();
+  EXPECT_EQ(message.operation.name, operation_.message);
+  EXPECT_EQ(message.arguments, QXArray{kReport});
+  EXPECT_EQ(logged(), (Entries{{QXLogType::debug, operation_.serving}}));
+  EXPECT_EQ(attic_->vendor().messages().size(), 1U) << "no other provider is asked";
 }
 
-TEST_F(DVRpcServicerItemsTest, TheReplyWaitsForTheProvider) {
-  grant(kCellar, kItem, kEditor);
-  cellar_->vendor().respond(kStartMessage, [](const QXArray&) { return std::nullopt; });
-  start(kReport, kCellar, kEditor);
+TEST_P(DVRpcServicerItemsTest, TheReplyWaitsForTheProvider) {
+  hold(operation_.message);
+  grantAndAsk();
   platform_.queues.runAll();
   EXPECT_TRUE(answers_.empty());
-  cellar_->vendor().answerLast({QXValue()});
-  EXPECT_EQ(lateAnswer().error, std::nullopt);
+  cellar_->vendor().answerLast(operation_.answer(/*error=*/std::nullopt));
+  (void)lateAnswer();
 }
 
-TEST_F(DVRpcServicerItemsTest, AProviderThatCannotStartGivesItsErrorToTheConsumer) {
+TEST_P(DVRpcServicerItemsTest, TwoRequestsAtOnceAreAnsweredEachByItsOwn) {
+  hold(operation_.message);
   grant(kCellar, kItem, kEditor);
-  answerStart(kExtensionError);
-  platform_.log.clear();
-  start(kReport, kCellar, kEditor);
-  EXPECT_EQ(lateAnswer().error, DVPluginOperationFailedError(kExtensionError));
-  EXPECT_EQ(logged(), (Entries{{QXLogType::debug, kServing}}));
-}
-
-TEST_F(DVRpcServicerItemsTest, AFailureAfterTheAnswerIsTolerated) {
-  grant(kCellar, kItem, kEditor);
-  start(kReport, kCellar, kEditor);
-  cellar_->vendor().failLastDelivery(kExtensionError);
+  ask(kReport, kCellar, kEditor);
+  const std::size_t first = cellar_->vendor().messages().size() - 1;
+  ask(kReport, kCellar, kEditor);
+  cellar_->vendor().answerLast(operation_.answer(kExtensionError));
+  ASSERT_EQ(answers_.size(), 1U);
+  cellar_->vendor().answer(first, operation_.answer(/*error=*/std::nullopt));
   ASSERT_EQ(answers_.size(), 2U);
-  EXPECT_EQ(answers_[0].error, std::nullopt);
-  EXPECT_EQ(answers_[1].error, DVPluginOperationFailedError(kExtensionError));
+  EXPECT_NE(answers_[0].error, answers_[1].error);
 }
 
-TEST_F(DVRpcServicerItemsTest, ChangesNothingInTheAccessControlList) {
+TEST_P(DVRpcServicerItemsTest, AProviderThatCannotBeReachedFailsTheRequest) {
+  cellar_->failBegins(kExtensionError);
+  grantAndAsk();
+  EXPECT_EQ(lateAnswer().error, DVPluginOperationFailedError(DVPluginOperationFailedError(kExtensionError)));
+}
+
+TEST_P(DVRpcServicerItemsTest, ChangesNothingInTheAccessControlList) {
+  answerItemID(*attic_, /*error=*/std::nullopt, kItem.value);
   grant(kCellar, kItem, kEditor);
-  start(kReport, kCellar, kEditor);
-  start(kReport, kCellar, kStranger);
-  start(kReport, kAttic, kEditor);
+  ask(kReport, kCellar, kEditor);
+  ask(kReport, kCellar, kStranger);
+  ask(kReport, kAttic, kEditor);
+  ask(std::nullopt, kCellar, kEditor);
+  platform_.queues.runAll();
+  EXPECT_EQ(answers_.size(), 4U);
   EXPECT_EQ(platform_.propertyLists.writes().size(), 1U);
+}
+
+TEST_P(DVRpcServicerItemsTest, WithoutDebugAndInfoLoggingNothingIsWrittenOnSuccess) {
+  grant(kCellar, kItem, kEditor);
+  platform_.log.setEnabled(QXLogType::debug, FakeLogSwitch::off);
+  platform_.log.setEnabled(QXLogType::info, FakeLogSwitch::off);
+  const auto before = platform_.log.writes();
+  ask(kReport, kCellar, kEditor);
+  EXPECT_EQ(answers_.size(), 1U);
+  EXPECT_EQ(platform_.log.writes(), before);
 }
 
 // --- The caller
 
-TEST_F(DVRpcServicerItemsTest, WritersMayStartToo) {
-  connection_->setEntitlement(std::string(kDVReadEntitlement), false);
-  entitle(kDVWriteEntitlement);
-  grant(kCellar, kItem, kEditor);
-  start(kReport, kCellar, kEditor);
-  EXPECT_EQ(lateAnswer().error, std::nullopt);
+TEST_P(DVRpcServicerItemsTest, ReadersMayAsk) {
+  grantAndAsk();
+  EXPECT_TRUE(wasForwarded());
 }
 
-TEST_F(DVRpcServicerItemsTest, AClientWithNeitherEntitlementIsRefusedAndOnlyTheCheckLogs) {
+TEST_P(DVRpcServicerItemsTest, WritersMayAskToo) {
   connection_->setEntitlement(std::string(kDVReadEntitlement), false);
-  grant(kCellar, kItem, kEditor);
-  platform_.log.clear();
-  start(kReport, kCellar, kEditor);
+  entitle(kDVWriteEntitlement);
+  grantAndAsk();
+  EXPECT_TRUE(wasForwarded());
+}
+
+TEST_P(DVRpcServicerItemsTest, AClientWithNeitherEntitlementIsRefusedAndOnlyTheCheckLogs) {
+  connection_->setEntitlement(std::string(kDVReadEntitlement), false);
+  grantAndAsk();
   EXPECT_EQ(earlyAnswer().error, DVClientLacksEntitlement());
-  EXPECT_EQ(logged(), (Entries{{QXLogType::debug, kServing},
+  EXPECT_EQ(logged(), (Entries{{QXLogType::debug, operation_.serving},
                                {QXLogType::fault,
                                 "[ERROR] Rejecting request from PID 4711 because it does not have any of these entitlements: "
                                 "(\"com.orvane.docuvend.acl-read\", \"com.orvane.docuvend.acl-write\")"}}));
-  EXPECT_EQ(cellar_->vendor().messages().size(), 1U);
+  EXPECT_TRUE(asked().empty());
 }
 
-TEST_F(DVRpcServicerItemsTest, ARefusedClientThatWantsNoReplyCausesNoTask) {
+TEST_P(DVRpcServicerItemsTest, TheEntitlementIsCheckedBeforeTheArguments) {
   connection_->setEntitlement(std::string(kDVReadEntitlement), false);
-  servicer_->startProvidingItemAtURL(kReport, kCellar, kEditor, /*completionHandler=*/{});
-  EXPECT_EQ(platform_.queues.pending(), 0U);
+  ask(std::nullopt, std::nullopt, std::nullopt);
+  EXPECT_EQ(earlyAnswer().error, DVClientLacksEntitlement());
 }
 
-TEST_F(DVRpcServicerItemsTest, TheConsumerIsTheOneThatIsNamedNotTheCaller) {
+TEST_P(DVRpcServicerItemsTest, ARefusedClientThatWantsNoReplyCausesNoTask) {
+  connection_->setEntitlement(std::string(kDVReadEntitlement), false);
+  askWithoutReply(kReport);
+  EXPECT_EQ(platform_.queues.pending(), 0U);
+  EXPECT_TRUE(asked().empty());
+}
+
+TEST_P(DVRpcServicerItemsTest, AClientWhoseConnectionHasGoneHoldsNothing) {
+  letConnectionGo();
+  grantAndAsk();
+  EXPECT_EQ(earlyAnswer().error, DVClientLacksEntitlement());
+  EXPECT_TRUE(logged().back().text.starts_with("[ERROR] Rejecting request from PID 0 ")) << logged().back().text;
+  EXPECT_TRUE(asked().empty());
+}
+
+TEST_P(DVRpcServicerItemsTest, TheConsumerIsTheOneThatIsNamedNotTheCaller) {
   grant(kCellar, kItem, kStranger);
-  start(kReport, kCellar, kStranger);
-  EXPECT_EQ(lateAnswer().error, std::nullopt);
+  ask(kReport, kCellar, kStranger);
+  EXPECT_TRUE(wasForwarded());
   EXPECT_EQ(platform_.applicationRegistry.tokenQueryCount(), 0);
 }
 
-// --- Arguments and provider
+TEST_P(DVRpcServicerItemsTest, WhetherTheCallerCouldWriteTheFileIsNotAsked) {
+  grantAndAsk();
+  EXPECT_TRUE(platform_.sandbox.checks().empty());
+}
 
-TEST_F(DVRpcServicerItemsTest, TheFirstMissingArgumentIsNamedBeneathNotFound) {
+// --- Arguments
+
+TEST_P(DVRpcServicerItemsTest, TheFirstMissingArgumentIsNamed) {
   struct Case {
     std::optional<QXURL> url;
     std::optional<ProviderID> provider;
@@ -131,141 +144,75 @@ TEST_F(DVRpcServicerItemsTest, TheFirstMissingArgumentIsNamedBeneathNotFound) {
   const std::vector<Case> cases = {
       {std::nullopt, std::nullopt, std::nullopt, "URL", "URL (null) from provider ID (null) to consumer ID (null)"},
       {std::nullopt, std::nullopt, kEditor, "URL", "URL (null) from provider ID (null) to consumer ID com.example.editor"},
+      {std::nullopt, kCellar, std::nullopt, "URL", "URL (null) from provider ID com.orvane.cellar to consumer ID (null)"},
+      {std::nullopt, kCellar, kEditor, "URL", "URL (null) from provider ID com.orvane.cellar to consumer ID com.example.editor"},
       {kReport, std::nullopt, std::nullopt, "providerID", "URL " + report + " from provider ID (null) to consumer ID (null)"},
+      {kReport, std::nullopt, kEditor, "providerID", "URL " + report + " from provider ID (null) to consumer ID com.example.editor"},
       {kReport, kCellar, std::nullopt, "consumerID", "URL " + report + " from provider ID com.orvane.cellar to consumer ID (null)"},
   };
   for (const Case& c : cases) {
+    SCOPED_TRACE(c.inLog);
     answers_.clear();
     platform_.log.clear();
-    start(c.url, c.provider, c.consumer);
+    ask(c.url, c.provider, c.consumer);
     const QXError error = DVInvalidParameterError(c.name, /*value=*/std::nullopt);
-    EXPECT_EQ(earlyAnswer().error, DVNotFoundError(error)) << c.name;
-    EXPECT_EQ(logged(), (Entries{{QXLogType::debug, kServing},
-                                 {QXLogType::fault, "[ERROR] Cannot provide item at " + c.inLog + ". Error: " + error.description()}}));
+    EXPECT_EQ(earlyAnswer().error, operation_.refused(error));
+    EXPECT_EQ(logged(), refusalLines(c.inLog, error));
   }
-  EXPECT_EQ(cellar_->vendor().messages().size(), 1U);
+  EXPECT_TRUE(asked().empty());
 }
 
-TEST_F(DVRpcServicerItemsTest, AURLOfNobodyIsNotFoundTwiceOver) {
-  start(kElsewhere, kCellar, kEditor);
-  const QXError error = DVNotFoundError(kCellar);
-  EXPECT_EQ(earlyAnswer().error, DVNotFoundError(error));
-  EXPECT_EQ(logged(),
-            (Entries{{QXLogType::debug, kServing},
-                     {QXLogType::fault,
-                      "[ERROR] Cannot provide item at URL file:///tmp/elsewhere.txt from provider ID com.orvane.cellar to consumer "
-                      "ID com.example.editor. Error: " +
-                          error.description()}}));
+TEST_P(DVRpcServicerItemsTest, TheArgumentsAreCheckedBeforeTheProvider) {
+  ask(kElsewhere, kNobody, std::nullopt);
+  EXPECT_EQ(earlyAnswer().error, operation_.refused(DVInvalidParameterError("consumerID", /*value=*/std::nullopt)));
 }
 
-TEST_F(DVRpcServicerItemsTest, AURLOfAnotherProviderThanTheNamedOneIsAnInvalidParameterBeneathNotFound) {
-  start(kReport, kAttic, kEditor);
-  const QXError error = DVInvalidParameterError("providerID", kAttic.value);
-  EXPECT_EQ(earlyAnswer().error, DVNotFoundError(error));
-  EXPECT_EQ(logged(), (Entries{{QXLogType::debug, kServing},
-                               {QXLogType::fault, "[ERROR] Cannot provide item at URL " + kReport.absoluteString() +
-                                                      " from provider ID com.orvane.attic to consumer ID com.example.editor. Error: " +
-                                                      error.description()}}));
-  EXPECT_EQ(cellar_->vendor().messages().size(), 1U);
-  EXPECT_EQ(attic_->vendor().messages().size(), 1U);
+TEST_P(DVRpcServicerItemsTest, AURLAndAProviderOfNobodyAreNotFound) {
+  ask(kElsewhere, kNobody, kEditor);
+  const QXError error = DVNotFoundError(kNobody);
+  EXPECT_EQ(earlyAnswer().error, operation_.refused(error));
+  EXPECT_EQ(logged(), refusalLines(requestText(kElsewhere, kNobody), error));
 }
 
-TEST_F(DVRpcServicerItemsTest, TheURLDecidesEvenWhenNobodyHasTheNamedIdentifier) {
-  start(kReport, kNobody, kEditor);
-  EXPECT_EQ(earlyAnswer().error, DVNotFoundError(DVInvalidParameterError("providerID", kNobody.value)));
-}
-
-TEST_F(DVRpcServicerItemsTest, TheProvidersDirectoryItselfIsNoItem) {
-  start(FakePlatform::storageURL(kCellar.value), kCellar, kEditor);
-  EXPECT_EQ(earlyAnswer().error, DVNotFoundError(DVNotFoundError(kCellar)));
-}
-
-TEST_F(DVRpcServicerItemsTest, AnEarlyFailureWithoutAReplyHandlerIsLoggedAndHarmless) {
-  servicer_->startProvidingItemAtURL(kElsewhere, kCellar, kEditor, /*completionHandler=*/{});
+TEST_P(DVRpcServicerItemsTest, AnEarlyFailureWithoutAReplyHandlerIsLoggedAndHarmless) {
+  (servicer_.get()->*operation_.ask)(std::nullopt, kCellar, kEditor, /*reply=*/{});
   EXPECT_EQ(platform_.log.texts(QXLogType::fault).size(), 1U);
   platform_.queues.runAll();
 }
 
-// --- The provider's answer and the grant
+// --- Once too often, too late, or for nobody
 
-TEST_F(DVRpcServicerItemsTest, AProviderThatCannotNameTheItemFailsTheRequestWithoutALine) {
-  answerItemID(*cellar_, kExtensionError, /*item=*/std::nullopt);
-  start(kReport, kCellar, kEditor);
-  EXPECT_EQ(lateAnswer().error, DVPluginOperationFailedError(DVPluginOperationFailedError(kExtensionError)));
-  EXPECT_EQ(logged(), (Entries{{QXLogType::debug, kServing}}));
-  EXPECT_FALSE(wasStarted());
+TEST_P(DVRpcServicerItemsTest, AProviderThatAnswersTwiceIsRepeatedToTheConnectionWhichTakesTheFirst) {
+  hold(operation_.message);
+  grantAndAsk();
+  cellar_->vendor().answerLast(operation_.answer(/*error=*/std::nullopt));
+  cellar_->vendor().answerLast(operation_.answer(kExtensionError));
+  EXPECT_EQ(answers_.size(), 2U);
+  EXPECT_EQ(std::ranges::count(asked(), std::string(operation_.message)), 1);
 }
 
-TEST_F(DVRpcServicerItemsTest, WithoutAGrantTheConsumerIsNotPermitted) {
-  start(kReport, kCellar, kStranger);
-  EXPECT_EQ(lateAnswer().error, DVNotPermittedError());
-  EXPECT_EQ(logged(), (Entries{{QXLogType::debug, kServing},
-                               {QXLogType::fault,
-                                "[ERROR] Consumer ID com.example.stranger is not allowed to access item ID “item 7” from provider ID "
-                                "com.orvane.cellar."}}));
-  EXPECT_FALSE(wasStarted());
-}
-
-TEST_F(DVRpcServicerItemsTest, AGrantForAnotherItemConsumerOrProviderDoesNotCount) {
-  grant(kCellar, ItemID{"item 8"}, kEditor);
-  grant(kCellar, kItem, kStranger);
-  grant(kAttic, kItem, kEditor);
-  start(kReport, kCellar, kEditor);
-  EXPECT_EQ(lateAnswer().error, DVNotPermittedError());
-  EXPECT_FALSE(wasStarted());
-}
-
-TEST_F(DVRpcServicerItemsTest, AnEmptyItemIdentifierIsLookedUp) {
-  answerItemID(*cellar_, /*error=*/std::nullopt, "");
-  grant(kCellar, ItemID{}, kEditor);
-  start(kReport, kCellar, kEditor);
-  EXPECT_EQ(lateAnswer().error, std::nullopt);
-  EXPECT_TRUE(wasStarted());
-}
-
-TEST_F(DVRpcServicerItemsTest, AnAnswerWithNeitherErrorNorItemIsNotPermitted) {
-  answerItemID(*cellar_, /*error=*/std::nullopt, /*item=*/std::nullopt);
-  start(kReport, kCellar, kEditor);
-  EXPECT_EQ(lateAnswer().error, DVNotPermittedError());
-  EXPECT_EQ(logged().back().text,
-            "[ERROR] Consumer ID com.example.editor is not allowed to access item ID “(null)” from provider ID com.orvane.cellar.");
-}
-
-TEST_F(DVRpcServicerItemsTest, WithoutAServerOrItsStoreNobodyIsPermitted) {
+TEST_P(DVRpcServicerItemsTest, WithoutAReplyHandlerTheProviderIsAskedAllTheSame) {
   grant(kCellar, kItem, kEditor);
-  source_->store.reset();
-  start(kReport, kCellar, kEditor);
-  source_.reset();
-  start(kReport, kCellar, kEditor);
-  ASSERT_EQ(answers_.size(), 2U);
-  EXPECT_EQ(answers_[0].error, DVNotPermittedError());
-  EXPECT_EQ(answers_[1].error, DVNotPermittedError());
-  EXPECT_FALSE(wasStarted());
+  askWithoutReply(kReport);
+  EXPECT_TRUE(wasForwarded());
+  answerOperation(kExtensionError);
+  askWithoutReply(kReport);
 }
 
-// --- Without a reply handler
-
-TEST_F(DVRpcServicerItemsTest, WithoutAReplyHandlerTheItemIsStartedAllTheSame) {
-  grant(kCellar, kItem, kEditor);
-  servicer_->startProvidingItemAtURL(kReport, kCellar, kEditor, /*completionHandler=*/{});
-  EXPECT_TRUE(wasStarted());
+TEST_P(DVRpcServicerItemsTest, WithoutAReplyHandlerAProviderThatCannotBeReachedIsHarmless) {
+  cellar_->failBegins(kExtensionError);
+  askWithoutReply(kReport);
+  EXPECT_EQ(platform_.queues.pending(), 0U);
 }
 
-TEST_F(DVRpcServicerItemsTest, WithoutAReplyHandlerLateFailuresAreHarmless) {
-  servicer_->startProvidingItemAtURL(kReport, kCellar, kEditor, /*completionHandler=*/{});
-  EXPECT_EQ(platform_.log.texts(QXLogType::fault).size(), 1U);
-  answerItemID(*cellar_, kExtensionError, /*item=*/std::nullopt);
-  servicer_->startProvidingItemAtURL(kReport, kCellar, kEditor, /*completionHandler=*/{});
-}
-
-TEST_F(DVRpcServicerItemsTest, ARequestUnderWayOutlivesItsClient) {
-  grant(kCellar, kItem, kEditor);
-  cellar_->vendor().respond("_identifierForItemAtURL:completion:", [](const QXArray&) { return std::nullopt; });
-  start(kReport, kCellar, kEditor);
+TEST_P(DVRpcServicerItemsTest, ARequestUnderWayOutlivesItsClient) {
+  hold(operation_.message);
+  grantAndAsk();
   servicer_.reset();
   letConnectionGo();
-  cellar_->vendor().answerLast({QXValue(), kItem.value});
-  EXPECT_TRUE(wasStarted());
+  source_.reset();
+  cellar_->vendor().answerLast(operation_.answer(/*error=*/std::nullopt));
+  (void)lateAnswer();
 }
 
 }  // namespace
