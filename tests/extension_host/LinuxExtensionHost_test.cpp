@@ -14,8 +14,8 @@
 #include <thread>
 
 #include "platform/linux/base/UniqueDescriptor.h"
-#include "platform/linux/extension_host/ExtensionErrors.h"
 #include "platform/linux/base/pidfd.h"
+#include "platform/linux/extension_host/ExtensionErrors.h"
 #include "tests/extension_host/support/RealExtensions.h"
 
 namespace docuvend::linux_platform {
@@ -398,6 +398,88 @@ TEST_F(LinuxExtensionHostTest, WhenTheHostGoesMessagesThatWaitFail) {
   const auto failed = await(std::move(waiting));
   ASSERT_TRUE(failed);
   EXPECT_TRUE(isOfKind(failed->error, ExtensionHostErrorCode::stopped));
+}
+
+TEST_F(LinuxExtensionHostTest, TheStatusOfARunningExtensionNamesItsProcessAndCountsItsRequests) {
+  RealExtensions real;
+  const auto extension = real.extension();
+  EXPECT_EQ(real.status(), (QXDictionary{{"state", "not running"}, {"openRequests", 0}, {"badLivesInARow", 0}}));
+  const Conversation first(extension);
+  ASSERT_FALSE(first.error());
+  const int process = first.connection()->processIdentifier();
+  {
+    const Conversation second(extension);
+    EXPECT_EQ(real.status(),
+              (QXDictionary{{"state", "running"}, {"openRequests", 2}, {"badLivesInARow", 0}, {"processIdentifier", process}}));
+  }
+  EXPECT_EQ(real.status(),
+            (QXDictionary{{"state", "running"}, {"openRequests", 1}, {"badLivesInARow", 0}, {"processIdentifier", process}}));
+}
+
+TEST_F(LinuxExtensionHostTest, ARequestThatWaitsForAProcessCountsAsOpen) {
+  RealExtensions real;
+  std::promise<QXDictionary> during;
+  std::atomic<bool> isBegun = false;
+  // The first request's completion holds up the thread that starts processes, so the second one's process cannot be there yet.
+  const auto set = real.extensions({real.makeBundle("com.orvane.a"), real.makeBundle("com.orvane.b")});
+  ASSERT_EQ(set.size(), 2U);
+  set[0]->beginExtensionRequest([&](std::optional<QXUUID>, std::optional<QXError>) {
+    set[1]->beginExtensionRequest([&isBegun](std::optional<QXUUID>, std::optional<QXError>) { isBegun = true; });
+    during.set_value(real.status("com.orvane.b"));
+  });
+  const auto status = await(during.get_future());
+  ASSERT_TRUE(status);
+  EXPECT_EQ(*status, (QXDictionary{{"state", "starting"}, {"openRequests", 1}, {"badLivesInARow", 0}}));
+  real.dropHost();
+  EXPECT_TRUE(isBegun);
+}
+
+TEST_F(LinuxExtensionHostTest, TheStatusOfAnExtensionThatBacksOffSaysForHowLong) {
+  ExtensionTimes slow;
+  slow.quickDeath = std::chrono::minutes(10);
+  slow.firstBackOff = std::chrono::minutes(10);
+  RealExtensions real(slow);
+  const auto extension = real.extension();
+  for (int i = 0; i < 2; ++i) ASSERT_TRUE(await(Conversation(extension).start("crash")));
+  ASSERT_TRUE(Conversation(extension).error());
+  QXDictionary status = real.status();
+  const auto* left = qxFind<std::int64_t>(status, "refusedForMilliseconds");
+  ASSERT_NE(left, nullptr);
+  EXPECT_GT(*left, 0);
+  EXPECT_LE(*left, milliseconds(slow.firstBackOff).count());
+  status.erase("refusedForMilliseconds");
+  EXPECT_EQ(status, (QXDictionary{{"state", "backing off"}, {"openRequests", 0}, {"badLivesInARow", 2}}));
+}
+
+TEST_F(LinuxExtensionHostTest, ARemovedExtensionHasAStatusAsLongAsItHasRequests) {
+  RealExtensions real;
+  const auto extension = real.extension();
+  {
+    const Conversation conversation(extension);
+    ASSERT_FALSE(conversation.error());
+    Reports later;
+    real.install({});
+    const auto match = real.match(later);  // looked at in the same pass or in a later one
+    ASSERT_TRUE(later.await(0));
+    EXPECT_FALSE(real.status().empty());
+  }
+  const auto deadline = std::chrono::steady_clock::now() + kPatience;
+  while (!real.host().status().empty() && std::chrono::steady_clock::now() < deadline) std::this_thread::yield();
+  EXPECT_EQ(real.host().status(), QXDictionary{});
+}
+
+TEST_F(LinuxExtensionHostTest, AnUpdatedExtensionsStatusIsThatOfTheNewOne) {
+  RealExtensions real;
+  const auto old = real.extension();
+  const Conversation conversation(old);
+  ASSERT_FALSE(conversation.error());
+  Bundle bundle = real.makeBundle("com.orvane.test");
+  bundle.version = "2";
+  real.install({bundle});
+  Reports later;
+  const auto match = real.match(later);
+  ASSERT_TRUE(later.await(0));
+  EXPECT_EQ(real.status(), (QXDictionary{{"state", "not running"}, {"openRequests", 0}, {"badLivesInARow", 0}}));
 }
 
 TEST_F(LinuxExtensionHostTest, AConnectionAnswersForTheBundle) {

@@ -37,6 +37,20 @@ QXError notStarted(const std::string& identifier, QXError underlying) {
   return error;
 }
 
+const char* describe(ProcessLifetime::Phase phase) {
+  switch (phase) {
+    case ProcessLifetime::Phase::none:
+      return "not running";
+    case ProcessLifetime::Phase::starting:
+      return "starting";
+    case ProcessLifetime::Phase::running:
+      return "running";
+    case ProcessLifetime::Phase::ending:
+      return "ending";
+  }
+  return "";
+}
+
 QXError hostIsStopping() { return extensionHostError(ExtensionHostErrorCode::stopped, "The extension host is stopping."); }
 
 }  // namespace
@@ -252,10 +266,29 @@ void LinuxExtension::endWhenIdleForLong() {
   if (idle) idle->end();
 }
 
-QXError LinuxExtension::backingOffError() const {
+std::optional<QXDictionary> LinuxExtension::status() const {
+  const std::lock_guard lock(mutex_);
+  const ProcessLifetime::Phase phase = lifetime_.phase();
+  if (lifetime_.isRetired() && phase == ProcessLifetime::Phase::none && lifetime_.requests() == 0) return std::nullopt;
+  QXDictionary result{{"state", describe(phase)},
+                      {"openRequests", static_cast<std::int64_t>(lifetime_.requests())},
+                      {"badLivesInARow", std::int64_t{lifetime_.badLivesInARow()}}};
+  if (phase == ProcessLifetime::Phase::running && process_) {
+    result.insert_or_assign("processIdentifier", std::int64_t{process_->number()});
+  } else if (const auto left = backOffLeft(); left.count() > 0) {
+    result.insert_or_assign("state", "backing off");
+    result.insert_or_assign("refusedForMilliseconds", std::int64_t{left.count()});
+  }
+  return result;
+}
+
+std::chrono::milliseconds LinuxExtension::backOffLeft() const {
   const auto now = Clock::now();
-  const auto left = lifetime_.refusedUntil(now).value_or(now) - now;
-  const auto milliseconds = std::chrono::duration_cast<std::chrono::milliseconds>(left).count();
+  return std::chrono::ceil<std::chrono::milliseconds>(lifetime_.refusedUntil(now).value_or(now) - now);
+}
+
+QXError LinuxExtension::backingOffError() const {
+  const auto milliseconds = backOffLeft().count();
   return extensionHostError(ExtensionHostErrorCode::backingOff,
                             "The process of " + bundle_.identifier + " ended too soon " + std::to_string(lifetime_.badLivesInARow()) +
                                 " times in a row; it can be started again in " + std::to_string(milliseconds) + " ms.");

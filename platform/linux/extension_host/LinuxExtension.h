@@ -4,6 +4,7 @@
 // inside the call that asks for it; a request that must wait for a process begins on the spawner's thread.
 #pragma once
 
+#include <chrono>
 #include <memory>
 #include <mutex>
 #include <optional>
@@ -12,6 +13,7 @@
 #include <variant>
 #include <vector>
 
+#include "platform/QXValue.h"
 #include "platform/extension_host.h"
 #include "platform/linux/base/Paths.h"
 #include "platform/linux/bundles/Bundle.h"
@@ -57,6 +59,8 @@ class LinuxExtension : public QXExtension, public std::enable_shared_from_this<L
 
   // The bundle was updated or removed: requests are served as before, but the process does not linger.
   void retire();
+  // What LinuxExtensionHost::status says of it; nothing once it is retired and has neither a process nor requests.
+  [[nodiscard]] std::optional<QXDictionary> status() const;
   // The host goes: ends the process at once; requests fail from now on.
   void stop();
 
@@ -77,6 +81,7 @@ class LinuxExtension : public QXExtension, public std::enable_shared_from_this<L
   void processIsLost(ProcessLifetime::Cause cause);
   void processIsGone();
   void endWhenIdleForLong();
+  [[nodiscard]] std::chrono::milliseconds backOffLeft() const;
   [[nodiscard]] QXError backingOffError() const;
 
   // Constant after construction.

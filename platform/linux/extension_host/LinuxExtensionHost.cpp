@@ -47,9 +47,12 @@ struct LinuxExtensionHost::State {
   BundleRegistry& bundles;
   const std::shared_ptr<ExtensionServices> services;
 
-  std::vector<std::weak_ptr<LinuxExtension>> extensions;  // made so far; only on the matching thread, and when that is over
+  void keep(const std::shared_ptr<LinuxExtension>& extension);
+  // Those that were kept and are not gone, in this order.
+  Extensions extensions();
 
-  std::mutex mutex;  // guards the three below
+  std::mutex mutex;  // guards the four below
+  std::vector<std::weak_ptr<LinuxExtension>> made;
   bool mustLook = false;
   bool isStopped = false;
   std::vector<std::weak_ptr<MatchState>> matches;
@@ -82,8 +85,22 @@ void LinuxExtensionHost::State::run() {
   }
 }
 
+void LinuxExtensionHost::State::keep(const std::shared_ptr<LinuxExtension>& extension) {
+  const std::lock_guard lock(mutex);
+  std::erase_if(made, [](const std::weak_ptr<LinuxExtension>& other) { return other.expired(); });
+  made.emplace_back(extension);
+}
+
+Extensions LinuxExtensionHost::State::extensions() {
+  const std::lock_guard lock(mutex);
+  Extensions result;
+  for (const auto& weak : made) {
+    if (auto extension = weak.lock()) result.push_back(std::move(extension));
+  }
+  return result;
+}
+
 void LinuxExtensionHost::State::update(MatchState& match) {
-  std::erase_if(extensions, [](const std::weak_ptr<LinuxExtension>& extension) { return extension.expired(); });
   Extensions leftovers = match.reported.value_or(Extensions{});
   Extensions present;
   bool isChanged = !match.reported;
@@ -94,7 +111,7 @@ void LinuxExtensionHost::State::update(MatchState& match) {
     });
     if (same == leftovers.end()) {
       present.push_back(LinuxExtension::create(std::move(bundle), match.contextClass, services));
-      extensions.emplace_back(present.back());
+      keep(present.back());
       isChanged = true;
     } else {
       present.push_back(std::move(*same));
@@ -124,9 +141,7 @@ LinuxExtensionHost::~LinuxExtensionHost() {
   }
   state_->changed.notify_one();
   state_->thread.join();
-  for (const auto& weak : state_->extensions) {
-    if (const auto extension = weak.lock()) extension->stop();
-  }
+  for (const auto& extension : state_->extensions()) extension->stop();
   // Last, because processes die with its thread, and then nobody hears why.
   state_->services->spawner.stop();
 }
@@ -140,6 +155,14 @@ std::unique_ptr<QXExtensionMatch> LinuxExtensionHost::beginMatching(Attributes a
   }
   state_->look();
   return std::make_unique<Match>(std::move(match));
+}
+
+QXDictionary LinuxExtensionHost::status() const {
+  QXDictionary result;
+  for (const auto& extension : state_->extensions()) {
+    if (auto status = extension->status()) result.insert_or_assign(extension->bundle().identifier, *std::move(status));
+  }
+  return result;
 }
 
 }  // namespace docuvend::linux_platform

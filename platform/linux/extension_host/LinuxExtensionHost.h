@@ -6,6 +6,7 @@
 
 #include <memory>
 
+#include "platform/QXValue.h"
 #include "platform/extension_host.h"
 #include "platform/linux/base/Paths.h"
 #include "platform/linux/bundles/Bundle.h"
@@ -26,6 +27,15 @@ class LinuxExtensionHost : public QXExtensionHost {
   // The interfaces of the context class outlive the host. Two matches of the same bundle have a process each.
   [[nodiscard]] std::unique_ptr<QXExtensionMatch> beginMatching(Attributes attributes, QXExtensionContextClass contextClass,
                                                                 MatchHandler handler) override;
+
+  // How each extension's process fares: a dictionary for each identifier, with
+  //   "state"                   "not running", "starting", "running", "ending" or "backing off"
+  //   "processIdentifier"       while it runs
+  //   "openRequests"            those that wait for the process included
+  //   "badLivesInARow"          how often in a row it died quickly or had to be ended
+  //   "refusedForMilliseconds"  while it backs off: how long requests fail at once
+  // A removed extension is told of while it has a process or requests; an updated one is the new one. May be called from any thread.
+  [[nodiscard]] QXDictionary status() const;
 
  private:
   struct State;

@@ -8,6 +8,7 @@
 #pragma once
 
 #include <chrono>
+#include <cstddef>
 #include <optional>
 #include <set>
 
@@ -27,6 +28,7 @@ class ProcessLifetime {
   };
   enum class Cause { died, notAnswering };
   enum class Next { nothing, start };
+  enum class Phase { none, starting, running, ending };
 
   explicit ProcessLifetime(const ExtensionTimes& times) : times_(times) {}
 
@@ -50,12 +52,14 @@ class ProcessLifetime {
   // The end of the present back-off, if it lies ahead.
   [[nodiscard]] std::optional<Time> refusedUntil(Time now) const;
   [[nodiscard]] int badLivesInARow() const { return badLives_; }
+  [[nodiscard]] Phase phase() const { return phase_; }
+  // Open ones, and those that wait for a process.
+  [[nodiscard]] std::size_t requests() const { return open_.size() + waiting_.size(); }
   // The installation that this process belongs to was replaced or removed: idle processes are not kept any more.
   void retire() { retired_ = true; }
+  [[nodiscard]] bool isRetired() const { return retired_; }
 
  private:
-  enum class Phase { none, starting, running, ending };
-
   void countBadLife(Time now);
 
   ExtensionTimes times_;

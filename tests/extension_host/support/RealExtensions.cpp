@@ -118,6 +118,12 @@ std::shared_ptr<QXExtension> RealExtensions::extension(const std::string& identi
   return set.empty() ? nullptr : set.front();
 }
 
+QXDictionary RealExtensions::status(const std::string& identifier) const {
+  const QXDictionary all = host_->status();
+  const auto* found = qxFind<QXDictionary>(all, identifier);
+  return found != nullptr ? *found : QXDictionary{};
+}
+
 bool RealExtensions::awaitLog(const std::string& text) {
   const auto deadline = std::chrono::steady_clock::now() + kPatience;
   while (std::chrono::steady_clock::now() < deadline) {

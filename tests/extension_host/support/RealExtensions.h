@@ -94,6 +94,8 @@ class RealExtensions {
 
   [[nodiscard]] LinuxExtensionHost& host() { return *host_; }
   void dropHost() { host_.reset(); }
+  // Of that extension; empty when the host tells nothing of it.
+  [[nodiscard]] QXDictionary status(const std::string& identifier = "com.orvane.test") const;
   [[nodiscard]] std::unique_ptr<QXExtensionMatch> match(Reports& reports);
   // Installs these alone and gives their extensions, in order of identifier.
   [[nodiscard]] Reports::Set extensions(std::vector<Bundle> bundles);
