@@ -87,6 +87,14 @@ bool DVAccessControlStore::isProviderIdentifier(const std::optional<ProviderID>&
   return isProviderWithIdentifier(provider, allowedToProvideItemID, toConsumerWithIdentifier);
 }
 
+std::vector<DVGrant> DVAccessControlStore::grants() const {
+  return qxSync(*syncQueue_, [&] { return syncQueueAccessControlDict_->grants(); });
+}
+
+bool DVAccessControlStore::hasUnwrittenChanges() const {
+  return qxSync(*syncQueue_, [&] { return syncQueueHasUnwrittenChanges_; });
+}
+
 void DVAccessControlStore::allowProviderWithIdentifier(const ProviderID& provider, const ItemID& toProvideItemID,
                                                        const ConsumerID& toConsumerWithIdentifier) {
   syncQueue_->sync([&] {
@@ -122,6 +130,7 @@ void DVAccessControlStore::syncQueueReadAccessControl() {
       auto [tree, error, isMisshapen] = interpreted(propertyLists.read(*stream));
       syncQueueAccessControlDict_ = std::move(tree);
       syncQueueFileIsMisshapen_ = isMisshapen;
+      syncQueueHasUnwrittenChanges_ = false;
       if (error) {
         dvLog("[ERROR] Cannot read access control from disk. Error: %@", *error);
       } else {
@@ -140,9 +149,9 @@ void DVAccessControlStore::syncQueueCommitAccessControl() {
   if (syncQueueFileIsMisshapen_ && (!QXPlatform::current().fileSystem.exists(path) || propertyLists.keepBeside(path))) {
     syncQueueFileIsMisshapen_ = false;
   }
-  if (syncQueueFileIsMisshapen_ || !propertyLists.writeXMLAtomically(syncQueueAccessControlDict_->dictionary(), path)) {
-    dvLog("[ERROR] Could not write to %@", path);
-  }
+  syncQueueHasUnwrittenChanges_ =
+      syncQueueFileIsMisshapen_ || !propertyLists.writeXMLAtomically(syncQueueAccessControlDict_->dictionary(), path);
+  if (syncQueueHasUnwrittenChanges_) dvLog("[ERROR] Could not write to %@", path);
 }
 
 }  // namespace docuvend

@@ -9,6 +9,7 @@
 
 #include <memory>
 #include <optional>
+#include <vector>
 
 #include "acl/DVAccessControl.h"
 #include "acl/DVGrantTree.h"
@@ -37,6 +38,11 @@ class DVAccessControlStore final : public DVAccessControl, public std::enable_sh
   [[nodiscard]] bool isProviderIdentifier(const std::optional<ProviderID>& provider, const std::optional<ItemID>& allowedToProvideItemID,
                                           const std::optional<ConsumerID>& toConsumerWithIdentifier) const;
 
+  // The whole list at one moment.
+  [[nodiscard]] std::vector<DVGrant> grants() const;
+  // The file says less or more than the list: the latest change could not be written.
+  [[nodiscard]] bool hasUnwrittenChanges() const;
+
   void allowProviderWithIdentifier(const ProviderID& provider, const ItemID& toProvideItemID, const ConsumerID& toConsumerWithIdentifier);
   void disallowProviderWithIdentifier(const ProviderID& provider, const ItemID& fromProvidingItemWithID,
                                       const ConsumerID& toConsumerWithIdentifier);
@@ -56,6 +62,7 @@ class DVAccessControlStore final : public DVAccessControl, public std::enable_sh
   // The file is a property list that is no access control list, and there is no copy of it yet: somebody's edit went wrong, and it is
   // not overwritten without one.
   bool syncQueueFileIsMisshapen_ = false;
+  bool syncQueueHasUnwrittenChanges_ = false;
 };
 
 }  // namespace docuvend

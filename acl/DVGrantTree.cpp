@@ -59,6 +59,18 @@ std::variant<DVGrantTree, QXError> DVGrantTree::fromPropertyList(QXValue propert
   return DVGrantTree(std::move(*providers));
 }
 
+std::vector<DVGrant> DVGrantTree::grants() const {
+  std::vector<DVGrant> grants;
+  for (const auto& [provider, consumers] : dictionary_) {
+    for (const auto& [consumer, entries] : *consumers.as<QXDictionary>()) {
+      const auto* items = qxFind<QXArray>(*entries.as<QXDictionary>(), kAllowedItemIDs);
+      if (items == nullptr) continue;
+      for (const QXValue& item : *items) grants.push_back({ProviderID{provider}, ConsumerID{consumer}, ItemID{*item.as<std::string>()}});
+    }
+  }
+  return grants;
+}
+
 bool DVGrantTree::allows(const ProviderID& provider, const ItemID& item, const ConsumerID& consumer) const {
   const auto* consumers = qxFind<QXDictionary>(dictionary_, provider.value);
   if (consumers == nullptr) return false;

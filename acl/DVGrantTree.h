@@ -7,6 +7,7 @@
 
 #include <cstdint>
 #include <variant>
+#include <vector>
 
 #include "platform/QXError.h"
 #include "platform/QXValue.h"
@@ -18,6 +19,14 @@ namespace docuvend {
 inline constexpr const char* kDVGrantTreeErrorDomain = "DVGrantTreeErrorDomain";
 inline constexpr std::int64_t kDVGrantTreeMisshapen = 1;
 
+struct DVGrant {
+  ProviderID provider;
+  ConsumerID consumer;
+  ItemID item;
+
+  friend bool operator==(const DVGrant&, const DVGrant&) = default;
+};
+
 class DVGrantTree {
  public:
   // A tree without grants.
@@ -27,6 +36,9 @@ class DVGrantTree {
   [[nodiscard]] static std::variant<DVGrantTree, QXError> fromPropertyList(QXValue propertyList);
 
   [[nodiscard]] const QXDictionary& dictionary() const { return dictionary_; }
+
+  // By provider and consumer, items in the order in which they were granted.
+  [[nodiscard]] std::vector<DVGrant> grants() const;
 
   // Three look-ups and one linear search; identifiers are compared as exact strings.
   [[nodiscard]] bool allows(const ProviderID& provider, const ItemID& item, const ConsumerID& consumer) const;

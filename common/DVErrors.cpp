@@ -9,6 +9,12 @@ QXError make(DVErrorCode code, std::string description) {
   return QXError::make(kDVErrorDomain, static_cast<std::int64_t>(code), std::move(description));
 }
 
+QXError notFound(const std::string& identifier) {
+  QXError error = make(DVErrorCode::notFound, "There is nothing with the identifier " + identifier + ".");
+  error.texts.emplace("identifier", identifier);
+  return error;
+}
+
 }  // namespace
 
 QXError DVClientLacksEntitlement() {
@@ -29,11 +35,8 @@ QXError DVInvalidParameterError(std::string_view parameter, const std::optional<
   return error;
 }
 
-QXError DVNotFoundError(const ProviderID& identifier) {
-  QXError error = make(DVErrorCode::notFound, "There is nothing with the identifier " + identifier.value + ".");
-  error.texts.emplace("identifier", identifier.value);
-  return error;
-}
+QXError DVNotFoundError(const ProviderID& identifier) { return notFound(identifier.value); }
+QXError DVNotFoundError(const ItemID& identifier) { return notFound(identifier.value); }
 
 QXError DVNotFoundError(const QXError& underlying) {
   QXError error = make(DVErrorCode::notFound, "The item could not be found.");

@@ -20,6 +20,7 @@ namespace docuvend {
 [[nodiscard]] QXError DVInvalidParameterError(std::string_view parameter, const std::optional<std::string>& value);
 // Text "identifier" carries what was not found.
 [[nodiscard]] QXError DVNotFoundError(const ProviderID& identifier);
+[[nodiscard]] QXError DVNotFoundError(const ItemID& identifier);
 [[nodiscard]] QXError DVNotFoundError(const QXError& underlying);
 [[nodiscard]] QXError DVNotFoundErrorURL(const QXURL& url);
 [[nodiscard]] QXError DVPluginOperationFailedError(const std::optional<QXError>& underlying);

@@ -1,5 +1,7 @@
 #include "platform/fake/FakeSandbox.h"
 
+#include <utility>
+
 namespace docuvend::fake_platform {
 
 void FakeSandbox::refuseIssuing(const std::string& path) {
@@ -20,6 +22,11 @@ void FakeSandbox::setAnswer(const std::string& path, int code) {
 void FakeSandbox::setInvalidationError(std::optional<QXError> error) {
   const std::lock_guard lock(mutex_);
   invalidationError_ = std::move(error);
+}
+
+void FakeSandbox::onInvalidation(std::function<void()> callback) {
+  const std::lock_guard lock(mutex_);
+  onInvalidation_ = std::move(callback);
 }
 
 std::vector<std::string> FakeSandbox::issueCalls() const {
@@ -45,8 +52,14 @@ std::optional<std::string> FakeSandbox::issueReadWriteExtension(const std::strin
 }
 
 std::optional<QXError> FakeSandbox::invalidateReadWriteExtensions(const std::optional<std::string>& directory) {
+  std::function<void()> callback;
+  {
+    const std::lock_guard lock(mutex_);
+    invalidations_.push_back(directory);
+    callback = onInvalidation_;
+  }
+  if (callback) callback();
   const std::lock_guard lock(mutex_);
-  invalidations_.push_back(directory);
   return invalidationError_;
 }
 

@@ -5,6 +5,7 @@
 // and changes nothing: nobody redeems them here. May be used from any thread.
 #pragma once
 
+#include <functional>
 #include <map>
 #include <mutex>
 #include <optional>
@@ -37,6 +38,8 @@ class FakeSandbox final : public QXSandbox {
 
   // What taking back answers from now on.
   void setInvalidationError(std::optional<QXError> error);
+  // Called each time that extensions are taken back, inside the call.
+  void onInvalidation(std::function<void()> callback);
 
   // The paths that tokens were asked for, in order, refused ones included.
   [[nodiscard]] std::vector<std::string> issueCalls() const;
@@ -59,6 +62,7 @@ class FakeSandbox final : public QXSandbox {
   std::vector<Check> checks_;
   std::vector<std::optional<std::string>> invalidations_;
   std::optional<QXError> invalidationError_;
+  std::function<void()> onInvalidation_;
 };
 
 }  // namespace docuvend::fake_platform

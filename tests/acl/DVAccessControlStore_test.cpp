@@ -335,6 +335,57 @@ TEST_F(DVAccessControlStoreTest, ARevocationThatCannotBeWrittenHoldsInMemory) {
   EXPECT_EQ(platform_.propertyLists.value(kFile), QXValue(listOf(kCellar, kEditor, {"report"})));
 }
 
+// --- What the administration asks
+
+TEST_F(DVAccessControlStoreTest, TheWholeListIsACopy) {
+  grant(kReport);
+  store().allowProviderWithIdentifier(kAttic, kLetter, kEditor);
+  const auto listed = store().grants();
+  store().disallowProviderWithIdentifier(kCellar, kReport, kEditor);
+  EXPECT_EQ(listed, (std::vector<DVGrant>{{kAttic, kEditor, kLetter}, {kCellar, kEditor, kReport}}));
+  EXPECT_EQ(store().grants(), (std::vector<DVGrant>{{kAttic, kEditor, kLetter}}));
+  EXPECT_EQ(platform_.queues.pending(), 0U);
+}
+
+TEST_F(DVAccessControlStoreTest, ListingLogsNothingAndTouchesNoFile) {
+  grant(kReport);
+  platform_.log.clear();
+  platform_.fileSystem.forgetCalls();
+  EXPECT_EQ(store().grants().size(), 1U);
+  EXPECT_FALSE(store().hasUnwrittenChanges());
+  EXPECT_TRUE(platform_.log.entries().empty());
+  EXPECT_TRUE(platform_.fileSystem.calls().empty());
+}
+
+TEST_F(DVAccessControlStoreTest, AChangeThatCouldNotBeWrittenIsUnwrittenUntilALaterOneIs) {
+  EXPECT_FALSE(store().hasUnwrittenChanges());
+  platform_.propertyLists.failWrite(1, FakeWriteFailure::once);
+  grant(kReport);
+  EXPECT_TRUE(store().hasUnwrittenChanges());
+  grant(kReport);
+  EXPECT_TRUE(store().hasUnwrittenChanges()) << "nothing was written";
+  grant(kLetter);
+  EXPECT_FALSE(store().hasUnwrittenChanges());
+}
+
+TEST_F(DVAccessControlStoreTest, ARereadThatTakesTheFilesListLeavesNothingUnwritten) {
+  grant(kReport);
+  platform_.propertyLists.failWrite(2, FakeWriteFailure::once);
+  grant(kLetter);
+  EXPECT_TRUE(store().hasUnwrittenChanges());
+  store().rereadAccessControl();
+  platform_.queues.runAll();
+  EXPECT_FALSE(store().hasUnwrittenChanges());
+}
+
+TEST_F(DVAccessControlStoreTest, ARereadOfAMissingFileLeavesTheChangesUnwritten) {
+  platform_.propertyLists.failWrite(1, FakeWriteFailure::once);
+  grant(kReport);
+  store().rereadAccessControl();
+  platform_.queues.runAll();
+  EXPECT_TRUE(store().hasUnwrittenChanges());
+}
+
 // --- Asking
 
 TEST_F(DVAccessControlStoreTest, AQueryLogsNothingAndTouchesNoFile) {
@@ -502,8 +553,9 @@ TEST(DVAccessControlStore, HasItsQueueAndObservesTheFirstUnlockBeforeItReads) {
   fake_platform::FakeNotificationCenter notificationCenter{queues.mainRunLoop()};
   WatchingFileSystem fileSystem{notificationCenter, queues};
   fake_platform::FakePropertyLists propertyLists{fileSystem};
+  fake_platform::FakeStatus status;
   QXPlatform::install({queues, log, rpc, applicationRegistry, sandbox, extensionHost, fileCoordinator, deviceLock, notificationCenter,
-                       fileSystem, propertyLists});
+                       fileSystem, propertyLists, status});
   (void)DVAccessControlStore::sharedStore();
   EXPECT_EQ(fileSystem.observersAtFirstLook, 1U);
   EXPECT_EQ(fileSystem.queuesAtFirstLook, 1U);

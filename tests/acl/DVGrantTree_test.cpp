@@ -50,6 +50,26 @@ TEST(DVGrantTree, KeepsItemsInTheOrderOfTheirGrants) {
   EXPECT_EQ(tree.dictionary(), (QXDictionary{{kCellar.value, QXDictionary{{kEditor.value, consumerWith({"z", "a", "m"})}}}}));
 }
 
+TEST(DVGrantTree, ListsItsGrantsByProviderAndConsumerAndItemsInTheOrderOfTheirGrants) {
+  DVGrantTree tree;
+  EXPECT_TRUE(tree.allow(kCellar, ItemID{"z"}, kPicker));
+  EXPECT_TRUE(tree.allow(kCellar, ItemID{"z"}, kEditor));
+  EXPECT_TRUE(tree.allow(kCellar, ItemID{"a"}, kEditor));
+  EXPECT_TRUE(tree.allow(kAttic, ItemID{"m"}, kPicker));
+  EXPECT_EQ(tree.grants(), (std::vector<DVGrant>{{kAttic, kPicker, ItemID{"m"}},
+                                                 {kCellar, kEditor, ItemID{"z"}},
+                                                 {kCellar, kEditor, ItemID{"a"}},
+                                                 {kCellar, kPicker, ItemID{"z"}}}));
+}
+
+TEST(DVGrantTree, ListsNothingForWhatHoldsNoGrant) {
+  EXPECT_TRUE(DVGrantTree().grants().empty());
+  const DVGrantTree tree =
+      treeOf({{kAttic.value, QXDictionary()},
+              {kCellar.value, QXDictionary{{kEditor.value, QXDictionary{{"Further", "key"}}}, {kPicker.value, consumerWith({})}}}});
+  EXPECT_TRUE(tree.grants().empty());
+}
+
 TEST(DVGrantTree, GrantingTwiceChangesNothing) {
   DVGrantTree tree;
   EXPECT_TRUE(tree.allow(kCellar, ItemID{"1"}, kEditor));

@@ -28,7 +28,7 @@ class StoreOverFiles : public testing::Test {
  protected:
   StoreOverFiles() {
     QXPlatform::install({queues_, log_, rpc_, applicationRegistry_, sandbox_, extensionHost_, fileCoordinator_, deviceLock_,
-                         notificationCenter_, fileSystem_, propertyLists_});
+                         notificationCenter_, fileSystem_, propertyLists_, status_});
   }
 
   // Reads the file anew, as the next process would.
@@ -47,6 +47,7 @@ class StoreOverFiles : public testing::Test {
   fake_platform::FakeNotificationCenter notificationCenter_{queues_.mainRunLoop()};
   linux_platform::LinuxFileSystem fileSystem_{pathsIn(home_)};
   linux_platform::LinuxPropertyLists propertyLists_;
+  fake_platform::FakeStatus status_;
 };
 
 TEST_F(StoreOverFiles, WhatOneStoreWroteTheNextOneReads) {

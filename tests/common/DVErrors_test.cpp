@@ -37,6 +37,7 @@ TEST(DVErrors, EachConstructorMakesItsOneError) {
       {"invalid parameter with an empty value", DVInvalidParameterError("url", ""), 4, {{"parameter", "url"}, {"value", ""}}, {}, {}},
       {"invalid parameter without a value", DVInvalidParameterError("url", std::nullopt), 4, {{"parameter", "url"}}, {}, {}},
       {"not found", DVNotFoundError(ProviderID{"com.example"}), 5, {{"identifier", "com.example"}}, {}, {}},
+      {"item not found", DVNotFoundError(ItemID{"item 7"}), 5, {{"identifier", "item 7"}}, {}, {}},
       {"not found because", DVNotFoundError(kCause), 5, {}, {}, kCause},
       {"not found URL", DVNotFoundErrorURL(kURL), 6, {}, kURL, {}},
       {"plug-in failed", DVPluginOperationFailedError(std::nullopt), 7, {}, {}, {}},
