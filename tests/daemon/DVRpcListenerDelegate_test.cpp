@@ -184,14 +184,28 @@ TEST_F(DVRpcListenerDelegateClientTest, AProviderThatAnswersTwiceIsHeardOnce) {
   EXPECT_TRUE(failures_.empty());
 }
 
+TEST_F(DVRpcListenerDelegateClientTest, TheEndOfProvidingIsHeardOnceTooAndSuccessIsAnError) {
+  connection_->setEntitlement("com.orvane.docuvend.acl-read", true);
+  std::vector<std::optional<QXError>> answers;
+  client().call<&DVDaemon::stopProvidingItemAtURL>(kReport, ProviderID{"com.orvane.cellar"}, ConsumerID{"com.example.editor"},
+                                                   [&answers](std::optional<QXError> error) { answers.push_back(error); });
+  cellar_->vendor().answerLast({QXValue()});
+  cellar_->vendor().answerLast({QXError::make("CellarErrorDomain", 5, "the cellar is flooded")});
+  EXPECT_EQ(answers, (std::vector<std::optional<QXError>>{DVPluginOperationFailedError(std::nullopt)}));
+  EXPECT_TRUE(failures_.empty());
+}
+
 TEST_F(DVRpcListenerDelegateClientTest, AClientThatWantsNoReplyIsServed) {
   connection_->setEntitlement("com.orvane.docuvend.acl-write", true);
   connection_->invoke("wakeUpCompletion:", {}, /*reply=*/{});
   connection_->invoke("providersCompletionHandler:", {}, /*reply=*/{});
   connection_->invoke("documentURLFromBookmarkableString:completion:", {"nonsense"}, /*reply=*/{});
   connection_->invoke("bookmarkableStringFromDocumentURL:completion:", {kReport}, /*reply=*/{});
-  connection_->invoke("startProvidingItemAtURL:fromProviderID:forConsumerID:completionHandler:", {QXValue(), QXValue(), QXValue()},
-                      /*reply=*/{});
+  for (const char* operation : {"providePlaceholderForItemAtURL:", "startProvidingItemAtURL:", "stopProvidingItemAtURL:"}) {
+    connection_->invoke(std::string(operation).append("fromProviderID:forConsumerID:completionHandler:"), {QXValue(), QXValue(), QXValue()},
+                        /*reply=*/{});
+  }
+  connection_->invoke("extendBookmarkForFileURL:toConsumerID:completionHandler:", {QXValue(), QXValue()}, /*reply=*/{});
   connection_->invoke("extendSandboxForFileURL:fromProviderID:toConsumerID:completionHandler:",
                       {kReport, "com.orvane.cellar", "com.example.editor"}, /*reply=*/{});
   platform_.queues.runAll();
