@@ -21,6 +21,8 @@ std::vector<Frame> everyFrame() {
       ReplyFrame{5, {QXValue(QXData{{1, 2, 3}}), QXValue(1.5), QXValue(QXUUID{})}},
       FailureFrame{9, error},
       EndFrame{error},
+      PingFrame{},
+      PongFrame{},
   };
 }
 

@@ -66,6 +66,28 @@ TEST_F(ProtocolPageTest, ShowsTheBytesOfTheWorkedExchange) {
   EXPECT_EQ(shown, due);
 }
 
+TEST_F(ProtocolPageTest, GivesEveryFrameItsNumber) {
+  const QXError error = QXError::make("Test", 1, "no");
+  const std::vector<std::pair<linux_platform::Frame, std::string>> frames = {
+      {linux_platform::Hello{linux_platform::kProtocolVersion, std::nullopt}, "hello"},
+      {linux_platform::RequestFrame{1, true, "a", {}}, "request"},
+      {linux_platform::ReplyFrame{1, {}}, "reply"},
+      {linux_platform::FailureFrame{1, error}, "failure"},
+      {linux_platform::EndFrame{error}, "end"},
+      {linux_platform::PingFrame{}, "ping"},
+      {linux_platform::PongFrame{}, "pong"}};
+  ASSERT_EQ(frames.size(), std::variant_size_v<linux_platform::Frame>);
+  for (const auto& [frame, name] : frames) {
+    const std::string row = "| " + std::to_string(bytesOf(frame)[linux_platform::kFrameLengthBytes]) + " | " + name + " | ";
+    EXPECT_TRUE(says("Frames", row)) << row;
+  }
+}
+
+TEST_F(ProtocolPageTest, ShowsTheBytesOfAPingAndAPong) {
+  const std::string shown = "\n\n    " + hexLines(linux_platform::PingFrame{}) + "    " + hexLines(linux_platform::PongFrame{}) + "\n";
+  EXPECT_TRUE(says("Signs of life", shown)) << shown;
+}
+
 TEST_F(ProtocolPageTest, ListsTheOperationsOfTheDaemonInOrder) {
   EXPECT_EQ(rows("Operations: `DVDaemon`"), protocolRows(qxInterfaceOf<DVDaemon>()));
 }

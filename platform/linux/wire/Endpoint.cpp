@@ -5,6 +5,7 @@
 #include <sys/time.h>
 
 #include <algorithm>
+#include <cassert>
 #include <cerrno>
 #include <cstdint>
 #include <mutex>
@@ -62,6 +63,8 @@ class Endpoint::State final : public AnswerSink, public std::enable_shared_from_
   void send(const QXRpcOperation& operation, QXArray arguments, QXRpcReply reply, std::shared_ptr<const FailureHandler> failureHandler);
   void sendReply(ReplyFrame reply) override;
   void sendFailure(FailureFrame failure) override;
+  void ping(std::function<void()> onPong);
+  [[nodiscard]] bool awaitsAnswers();
   void close(const QXError& reason, Farewell farewell, Cause cause = Cause::ordinary);
 
   IncomingCalls incoming;
@@ -78,6 +81,8 @@ class Endpoint::State final : public AnswerSink, public std::enable_shared_from_
   void run(ReplyFrame reply);
   void run(FailureFrame failure);
   void run(EndFrame end) { close(end.error, Farewell::silent); }
+  void run(PingFrame ping);
+  void run(PongFrame pong);
   // The message that an answer is for, taken out. None when it has been answered before, or was never sent: then the connection ends.
   std::optional<OutgoingCalls::Call> settle(std::uint64_t callID);
   void closeMalformed(const Malformed& malformed);
@@ -105,6 +110,8 @@ class Endpoint::State final : public AnswerSink, public std::enable_shared_from_
   FrameWriter writer_;
   bool writingIsOver_ = false;
   OutgoingCalls outgoing_;
+  std::function<void()> onPong_;    // empty: none is awaited
+  std::uint64_t lastPongsEnd_ = 0;  // in the writer's stream
   std::optional<QXError> closed_;
 };
 
@@ -243,6 +250,54 @@ void Endpoint::State::run(FailureFrame failure) {
   if (call && *call->failureHandler) (*call->failureHandler)(failure.error, MessageFate::refused);
 }
 
+// A pong that has not left yet is all that a peer may make this end keep: one that takes them may ask as often as it likes.
+void Endpoint::State::run(PingFrame) {
+  const auto pong = std::get<EncodedFrame>(encodeFrame(PongFrame{}));
+  Delivery delivery = Delivery::underway;
+  bool isTooEarly = false;
+  {
+    const std::lock_guard lock(mutex_);
+    if (closed_) return;
+    isTooEarly = !writer_.isTaken(lastPongsEnd_);
+    if (!isTooEarly) {
+      writer_.add(pong);
+      lastPongsEnd_ = writer_.position();
+      delivery = write();
+    }
+  }
+  if (isTooEarly) closeMalformed({"a ping before the last one's answer was taken"});
+  if (delivery == Delivery::overBound) dropSlowPeer();
+}
+
+void Endpoint::State::run(PongFrame) {
+  std::function<void()> onPong;
+  {
+    const std::lock_guard lock(mutex_);
+    onPong.swap(onPong_);
+  }
+  if (onPong) {
+    onPong();
+  } else {
+    closeMalformed({"an answer to a ping that was not sent"});
+  }
+}
+
+void Endpoint::State::ping(std::function<void()> onPong) {
+  assert(onPong);
+  {
+    const std::lock_guard lock(mutex_);
+    if (closed_) return;
+    assert(!onPong_);
+    onPong_ = std::move(onPong);
+  }
+  write(Frame(PingFrame{}));
+}
+
+bool Endpoint::State::awaitsAnswers() {
+  const std::lock_guard lock(mutex_);
+  return outgoing_.awaitsReplies();
+}
+
 void Endpoint::State::closeMalformed(const Malformed& malformed) {
   close(failure(QXRpcErrorCode::malformedFrame, malformed.reason), Farewell::tellPeer, Cause::misbehaviour);
 }
@@ -338,10 +393,12 @@ void Endpoint::State::close(const QXError& reason, Farewell farewell, Cause caus
   std::shared_ptr<const UniqueDescriptor> socket;
   std::vector<OutgoingCalls::Lost> failed;
   OutgoingCalls::Forgotten forgotten;
+  std::function<void()> unheardPong;
   {
     const std::lock_guard lock(mutex_);
     if (closed_) return;
     closed_ = reason;
+    unheardPong.swap(onPong_);
     failed = outgoing_.settleAll(writer_.unwritten(), forgotten);
     if (farewell == Farewell::tellPeer && !writingIsOver_) {
       auto encoded = encodeFrame(EndFrame{reason});
@@ -357,6 +414,7 @@ void Endpoint::State::close(const QXError& reason, Farewell farewell, Cause caus
   }
   registration.reset();  // while the socket is still held: its number must not be another's
   incoming.release();
+  unheardPong = nullptr;
   post_([failed = std::move(failed), blame = cause == Cause::misbehaviour ? handlers_.onMisbehaviour : nullptr, onClose = handlers_.onClose,
          reason] {
     if (blame) blame(reason);
@@ -393,6 +451,10 @@ std::shared_ptr<QXRpcProxy> Endpoint::remoteObjectProxy(QXErrorHandler errorHand
 std::shared_ptr<QXRpcProxy> Endpoint::remoteObjectProxy(FailureHandler failureHandler) {
   return std::make_shared<Proxy>(shared_from_this(), std::move(failureHandler));
 }
+
+void Endpoint::ping(std::function<void()> onPong) { state_->ping(std::move(onPong)); }
+
+bool Endpoint::awaitsAnswers() const { return state_->awaitsAnswers(); }
 
 void Endpoint::close(const QXError& reason) { state_->close(reason, Farewell::tellPeer); }
 

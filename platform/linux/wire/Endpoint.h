@@ -3,7 +3,7 @@
 // The thread of the reactor that reads a request runs it; one connection's requests run one after another. While a request or a reply
 // handler runs, nothing else is read from that connection: a handler must not wait for an answer that comes over its own connection.
 // Writing never waits. The process at the other end is not trusted: everything that it controls is bounded (Limits.h), and a malformed
-// frame ends the connection.
+// frame ends the connection. A ping is answered here, without reaching any object.
 #pragma once
 
 #include <chrono>
@@ -52,6 +52,12 @@ class Endpoint : public std::enable_shared_from_this<Endpoint> {
   [[nodiscard]] std::shared_ptr<QXRpcProxy> remoteObjectProxy(QXErrorHandler errorHandler);
   // The same, for those whom it concerns how far a failed message came.
   [[nodiscard]] std::shared_ptr<QXRpcProxy> remoteObjectProxy(FailureHandler failureHandler);
+
+  // Asks the other end for a sign of life, which its reading thread gives between two requests, whatever became of those before. The
+  // handler runs when it comes; it is dropped when the connection ends first. Not while an earlier one is awaited.
+  void ping(std::function<void()> onPong);
+  // True while a message waits for its answer.
+  [[nodiscard]] bool awaitsAnswers() const;
 
   // Ends the connection and tells the peer why; messages that wait for an answer fail. Waits for nothing and calls no handler itself.
   void close(const QXError& reason);

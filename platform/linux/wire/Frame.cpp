@@ -10,7 +10,7 @@ namespace {
 
 constexpr std::size_t kDescriptorCountPosition = 5;
 
-enum class FrameType : std::uint8_t { hello = 1, request = 2, reply = 3, failure = 4, end = 5 };
+enum class FrameType : std::uint8_t { hello = 1, request = 2, reply = 3, failure = 4, end = 5, ping = 6, pong = 7 };
 
 struct BodyWriter {
   ByteWriter& bytes;
@@ -43,6 +43,8 @@ struct BodyWriter {
     values.error(end.error);
     return FrameType::end;
   }
+  FrameType operator()(const PingFrame&) const { return FrameType::ping; }
+  FrameType operator()(const PongFrame&) const { return FrameType::pong; }
 };
 
 std::optional<Frame> readBody(std::uint8_t type, ByteReader& bytes, ValueReader& values) {
@@ -74,6 +76,10 @@ std::optional<Frame> readBody(std::uint8_t type, ByteReader& bytes, ValueReader&
     }
     case static_cast<std::uint8_t>(FrameType::end):
       return EndFrame{values.error()};
+    case static_cast<std::uint8_t>(FrameType::ping):
+      return PingFrame{};
+    case static_cast<std::uint8_t>(FrameType::pong):
+      return PongFrame{};
     default:
       bytes.fail("a frame of unknown type " + std::to_string(type));
       return std::nullopt;

@@ -43,7 +43,13 @@ struct EndFrame {
   QXError error;
 };
 
-using Frame = std::variant<Hello, RequestFrame, ReplyFrame, FailureFrame, EndFrame>;
+// Asks whether the other end still reads.
+struct PingFrame {};
+
+// The answer to a ping.
+struct PongFrame {};
+
+using Frame = std::variant<Hello, RequestFrame, ReplyFrame, FailureFrame, EndFrame, PingFrame, PongFrame>;
 
 inline constexpr std::size_t kFrameLengthBytes = 4;
 inline constexpr std::size_t kFrameHeaderBytes = 6;  // length, type, number of descriptors

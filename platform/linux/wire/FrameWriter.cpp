@@ -13,7 +13,7 @@
 namespace docuvend::linux_platform {
 
 void FrameWriter::add(EncodedFrame frame, std::uint64_t tag) {
-  pendingBytes_ += frame.bytes.size();
+  added_ += frame.bytes.size();
   queue_.push_back({std::move(frame), tag});
 }
 
@@ -50,7 +50,7 @@ FrameWriter::Progress FrameWriter::write(int socket) {
     const long count = writePart(socket, first);
     if (count < 0) return errno == EAGAIN || errno == EWOULDBLOCK ? Progress::blocked : Progress::broken;
     first.written += static_cast<std::size_t>(count);
-    pendingBytes_ -= static_cast<std::size_t>(count);
+    taken_ += static_cast<std::uint64_t>(count);
     if (first.written == first.frame.bytes.size()) queue_.pop_front();
   }
   return Progress::drained;

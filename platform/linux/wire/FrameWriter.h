@@ -24,7 +24,10 @@ class FrameWriter {
   [[nodiscard]] Progress write(int socket);
 
   // Bytes that the socket has not taken.
-  [[nodiscard]] std::size_t pendingBytes() const { return pendingBytes_; }
+  [[nodiscard]] std::size_t pendingBytes() const { return static_cast<std::size_t>(added_ - taken_); }
+  // The stream's position behind the last frame that was added, and whether the socket has taken all before a position.
+  [[nodiscard]] std::uint64_t position() const { return added_; }
+  [[nodiscard]] bool isTaken(std::uint64_t position) const { return position <= taken_; }
   // The tags, other than 0, of the frames that the socket has not taken whole.
   [[nodiscard]] std::vector<std::uint64_t> unwritten() const;
 
@@ -37,7 +40,8 @@ class FrameWriter {
   [[nodiscard]] static long writePart(int socket, const Waiting& waiting);
 
   std::deque<Waiting> queue_;
-  std::size_t pendingBytes_ = 0;
+  std::uint64_t added_ = 0;  // bytes, since the beginning
+  std::uint64_t taken_ = 0;
 };
 
 }  // namespace docuvend::linux_platform

@@ -38,6 +38,8 @@ class OutgoingCalls {
   using Forgotten = std::vector<Call>;  // to be destroyed where nothing is locked
 
   [[nodiscard]] bool isFull() const;
+  // True while a call that wants a reply has none.
+  [[nodiscard]] bool awaitsReplies() const { return !waiting_.empty(); }
   [[nodiscard]] std::uint64_t nextID() const { return nextID_; }
   // Takes `nextID` for the call.
   void add(Call call, Forgotten& forgotten);
