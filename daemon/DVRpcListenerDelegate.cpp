@@ -21,10 +21,8 @@ QXRpcInterface daemonInterface() {
 }  // namespace
 
 bool DVRpcListenerDelegate::listener(QXRpcListener&, const std::shared_ptr<QXRpcConnection>& shouldAcceptNewConnection) {
-  shouldAcceptNewConnection->setExportedInterface(daemonInterface());
-  auto servicer = std::make_shared<DVRpcServicer>(server(), shouldAcceptNewConnection);
-  shouldAcceptNewConnection->setExportedObject(std::make_shared<QXRpcExport<DVDaemon>>(std::move(servicer)));
-  shouldAcceptNewConnection->resume();
+  const auto servicer = std::make_shared<DVRpcServicer>(server(), shouldAcceptNewConnection);
+  qxServe<DVDaemon>(*shouldAcceptNewConnection, servicer, daemonInterface());
   dvLog("[INFO] New connection accepted.");
   return true;
 }

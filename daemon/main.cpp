@@ -6,6 +6,7 @@
 
 #include "acl/DVAccessControlStore.h"
 #include "common/DVLog.h"
+#include "daemon/DVAdministrationService.h"
 #include "daemon/DVServer.h"
 #include "platform/QXPlatform.h"
 #include "platform/linux/LinuxPlatform.h"
@@ -26,6 +27,8 @@ int main(int, char** arguments) {
   const auto server = std::make_shared<DVServer>();
   server->setAccessControlStore(DVAccessControlStore::sharedStore());
   server->startCompletion(/*completion=*/{});
+  const auto administration = std::make_shared<DVAdministrationService>();
+  administration->start();
   QXPlatform::current().queues.mainRunLoop().run();
   return EXIT_SUCCESS;
 }

@@ -211,6 +211,14 @@ class QXRpcExport final : public QXRpcExportedObject {
   std::shared_ptr<Protocol> object_;
 };
 
+// Gives the connection's peer that object to talk to, kept alive by the connection, and lets its requests come.
+template <class Protocol>
+void qxServe(QXRpcConnection& connection, std::shared_ptr<Protocol> object, QXRpcInterface interface = qxInterfaceOf<Protocol>()) {
+  connection.setExportedInterface(std::move(interface));
+  connection.setExportedObject(std::make_shared<QXRpcExport<Protocol>>(std::move(object)));
+  connection.resume();
+}
+
 // Sends a protocol's operations through a proxy: remote.call<&P::openItem>(url, completion).
 template <class Protocol>
 class QXRemote {

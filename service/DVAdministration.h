@@ -22,7 +22,7 @@ inline constexpr const char* kDVAdministrationServiceName = "com.orvane.Administ
 class DVAdministration {
  public:
   using ErrorReply = std::function<void(std::optional<QXError>)>;
-  // Strings, numbers, arrays and dictionaries, for a person to read: keys may come and go.
+  // How the daemon is, for a person to read: booleans, numbers, strings, URLs, arrays and dictionaries. Keys may come and go.
   using StatusReply = std::function<void(std::optional<QXError>, std::optional<QXDictionary> status)>;
   // Dictionaries with the strings "providerIdentifier", "consumerIdentifier" and "itemIdentifier"; `next` is absent on the last page.
   using GrantsReply = std::function<void(std::optional<QXError>, std::optional<QXArray> grants, std::optional<std::int64_t> next)>;
@@ -35,17 +35,19 @@ class DVAdministration {
   virtual void statusCompletionHandler(StatusReply completionHandler) = 0;
 
   // A page of the access control list, of one provider or one consumer where these are given: ordered by provider and consumer, items in
-  // the order in which they were granted. The first page (absent or 0) is the list as it is then; the pages that follow on the same
-  // connection are of that same list.
+  // the order in which they were granted. The first page (absent or 0) is of the list as it is then; the pages that follow on the same
+  // connection are of that same list. DVInvalidParameterError for a start that is no position in it. A page is as long as a message allows.
   virtual void grantsOfProviderID(std::optional<ProviderID> providerID, std::optional<ConsumerID> toConsumerID,
                                   std::optional<std::int64_t> startingAt, GrantsReply completionHandler) = 0;
 
   // Takes the grant from the list, which is on disk before the answer, and makes the sandbox tokens worthless that were issued for files of
-  // that provider, to whomever: who still has a grant gets new ones. DVNotFoundError when there is no such grant.
+  // that provider, to whomever: who still has a grant gets new ones. DVInvalidParameterError for the first argument that is absent,
+  // DVNotFoundError when there is no such grant. An error of the system says that the list or the tokens' end could not be written: both
+  // hold all the same while this daemon runs.
   virtual void revokeItemID(std::optional<ItemID> itemID, std::optional<ProviderID> fromProviderID, std::optional<ConsumerID> toConsumerID,
                             ErrorReply completionHandler) = 0;
 
-  // Posts the system-wide notification of the first unlock. Harmless when it has been posted before.
+  // Posts the system-wide notification of the first unlock; what follows from it comes later. Harmless when it has been posted before.
   virtual void announceFirstUnlockCompletionHandler(ErrorReply completionHandler) = 0;
 };
 

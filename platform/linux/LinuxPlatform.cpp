@@ -87,8 +87,8 @@ struct LinuxPlatform::Services {
   LinuxPeerDirectory peers{bundles, log.defaultLog()};
   LinuxApplicationRegistry applicationRegistry{bundles, peers};
   LinuxRpcService rpc;
-  LinuxStatus status{rpc};
   LinuxExtensionHost extensionHost{bundles, paths, reactor, log.defaultLog()};
+  LinuxStatus status{rpc, extensionHost};
   LinuxFileCoordinator fileCoordinator{fileSystem};
 
   std::unique_ptr<LinuxSandbox> sandbox;  // made in `create`, never null after it
@@ -130,7 +130,7 @@ std::variant<std::unique_ptr<LinuxPlatform>, QXError> LinuxPlatform::create() {
   if (auto* error = std::get_if<QXError>(&lock)) return *error;
 
   auto services = std::make_unique<Services>(std::move(paths), std::get<UniqueDescriptor>(std::move(lock)));
-  auto sandbox = LinuxSandbox::create(services->paths, services->bundles, services->peers);
+  auto sandbox = LinuxSandbox::create(services->paths, services->bundles, services->peers, services->log.defaultLog());
   if (auto* error = std::get_if<QXError>(&sandbox)) return *error;
   services->sandbox = std::get<std::unique_ptr<LinuxSandbox>>(std::move(sandbox));
   return std::unique_ptr<LinuxPlatform>(new LinuxPlatform(std::move(services)));

@@ -16,12 +16,14 @@ std::vector<std::string> protectionsOfThisKernel() {
 
 }  // namespace
 
-LinuxStatus::LinuxStatus(const LinuxRpcService& rpc) : rpc_(rpc), protections_(protectionsOfThisKernel()) {}
+LinuxStatus::LinuxStatus(const LinuxRpcService& rpc, const LinuxExtensionHost& extensionHost)
+    : rpc_(rpc), extensionHost_(extensionHost), protections_(protectionsOfThisKernel()) {}
 
 QXDictionary LinuxStatus::platformStatus() {
   return {{"processIdentifier", std::int64_t{::getpid()}},
           {"protections", QXArray(protections_.begin(), protections_.end())},
-          {"connections", static_cast<std::int64_t>(rpc_.connectionCount())}};
+          {"connections", static_cast<std::int64_t>(rpc_.connectionCount())},
+          {"extensions", extensionHost_.status()}};
 }
 
 }  // namespace docuvend::linux_platform

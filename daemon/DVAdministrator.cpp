@@ -1,0 +1,85 @@
+#include "daemon/DVAdministrator.h"
+
+#include <cerrno>
+#include <string>
+#include <utility>
+
+#include "acl/DVAccessControlStore.h"
+#include "common/DVErrors.h"
+#include "common/DVLog.h"
+#include "daemon/DVGrantPage.h"
+#include "platform/QXPlatform.h"
+#include "providers/DVExtensionDocuvend.h"
+
+namespace docuvend {
+namespace {
+
+std::optional<QXError> missingParameter(const std::optional<ItemID>& itemID, const std::optional<ProviderID>& providerID,
+                                        const std::optional<ConsumerID>& consumerID) {
+  if (!itemID) return DVInvalidParameterError("itemID", /*value=*/std::nullopt);
+  if (!providerID) return DVInvalidParameterError("providerID", /*value=*/std::nullopt);
+  if (!consumerID) return DVInvalidParameterError("consumerID", /*value=*/std::nullopt);
+  return std::nullopt;
+}
+
+// None when it is not known: then a token of that provider's may lie anywhere.
+std::optional<std::string> directoryOf(const ProviderID& providerID) {
+  const auto provider = DVExtensionDocuvend::providerWithIdentifier(providerID);
+  const auto directory = provider ? provider->providedItemsURL() : std::nullopt;
+  if (!directory) return std::nullopt;
+  return directory->fileSystemPath();
+}
+
+// The list first: whoever asks for a new token from then on is refused one, and the old ones go after that. When the list could not be
+// written they go all the same, for it holds in memory.
+std::optional<QXError> revoke(const ProviderID& providerID, const ItemID& itemID, const ConsumerID& consumerID) {
+  DVAccessControlStore& store = *DVAccessControlStore::sharedStore();
+  if (!store.isProviderWithIdentifier(providerID, itemID, consumerID)) return DVNotFoundError(itemID);
+  store.disallowProviderWithIdentifier(providerID, itemID, consumerID);
+  const bool isOnDisk = !store.hasUnwrittenChanges();
+  auto tokensError = QXPlatform::current().sandbox.invalidateReadWriteExtensions(directoryOf(providerID));
+  if (!isOnDisk) return QXError::system(EIO, "the access control list could not be written; the grant is back after a restart");
+  return tokensError;
+}
+
+}  // namespace
+
+void DVAdministrator::statusCompletionHandler(StatusReply completionHandler) {
+  const QXPlatform& platform = QXPlatform::current();
+  QXDictionary status = platform.status.platformStatus();
+  status.insert_or_assign("version", DOCUVEND_VERSION);
+  status.insert_or_assign("lockState", platform.deviceLock.lockState());
+  status.insert_or_assign("unlockedSinceBoot", platform.deviceLock.unlockedSinceBoot());
+  status.insert_or_assign("providers", DVExtensionDocuvend::providersInfo());
+  status.insert_or_assign("grants", static_cast<std::int64_t>(DVAccessControlStore::sharedStore()->grants().size()));
+  if (completionHandler) completionHandler(/*error=*/std::nullopt, std::move(status));
+}
+
+void DVAdministrator::grantsOfProviderID(std::optional<ProviderID> providerID, std::optional<ConsumerID> toConsumerID,
+                                         std::optional<std::int64_t> startingAt, GrantsReply completionHandler) {
+  const std::int64_t start = startingAt.value_or(0);
+  if (start == 0) listed_ = DVAccessControlStore::sharedStore()->grants();
+  if (!completionHandler) return;
+  if (start < 0 || start > static_cast<std::int64_t>(listed_.size())) {
+    completionHandler(DVInvalidParameterError("startingAt", std::to_string(start)), /*grants=*/std::nullopt, /*next=*/std::nullopt);
+    return;
+  }
+  auto page = DVGrantPage::of(listed_, {std::move(providerID), std::move(toConsumerID)}, static_cast<std::size_t>(start));
+  completionHandler(/*error=*/std::nullopt, std::move(page.grants), page.next);
+}
+
+void DVAdministrator::revokeItemID(std::optional<ItemID> itemID, std::optional<ProviderID> fromProviderID,
+                                   std::optional<ConsumerID> toConsumerID, ErrorReply completionHandler) {
+  auto error = missingParameter(itemID, fromProviderID, toConsumerID);
+  if (!error) error = revoke(*fromProviderID, *itemID, *toConsumerID);
+  if (completionHandler) completionHandler(std::move(error));
+}
+
+void DVAdministrator::announceFirstUnlockCompletionHandler(ErrorReply completionHandler) {
+  const auto client = connection_.lock();
+  dvLog("[NOTICE] PID %d announces the first unlock.", client ? client->processIdentifier() : 0);
+  QXPlatform::current().notificationCenter.post(kQXFirstUnlockNotification);
+  if (completionHandler) completionHandler(/*error=*/std::nullopt);
+}
+
+}  // namespace docuvend
