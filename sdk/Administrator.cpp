@@ -8,9 +8,17 @@
 #include "service/DVAdministration.h"
 
 namespace docuvend {
+
+using sdk_detail::after;
+using sdk_detail::errorOf;
+using sdk_detail::Repeat;
+using sdk_detail::ServiceConnections;
+using sdk_detail::TimePoint;
+using sdk_detail::valueOf;
+
 namespace {
 
-QXError notUnderstood(const char* what) {
+QXError noAnswer(const char* what) {
   return makeConsumerError(ConsumerErrorCode::noAnswer, std::string("The answer carries neither ") + what + " nor an error.");
 }
 
@@ -24,63 +32,77 @@ std::optional<Grant> grantFrom(const QXValue& value) {
   return Grant{ProviderID{*provider}, ConsumerID{*consumer}, ItemID{*item}};
 }
 
-}  // namespace
-
-Result<std::unique_ptr<Administrator>> Administrator::connect(Options options) {
-  auto runtime = sdk_detail::ServiceConnections::runtimeDirectory();
-  if (auto* error = std::get_if<QXError>(&runtime)) return *error;
-  auto services = std::make_shared<sdk_detail::ServiceConnections>(std::get<std::string>(std::move(runtime)), std::nullopt);
-  if (auto failure = services->reach(kDVAdministrationServiceName)) return *std::move(failure);
-  return std::unique_ptr<Administrator>(new Administrator(std::move(services), options));
-}
-
-Administrator::Administrator(std::shared_ptr<sdk_detail::ServiceConnections> services, Options options)
-    : services_(std::move(services)), options_(options) {}
-Administrator::~Administrator() = default;
-
-Result<QXDictionary> Administrator::status() {
-  auto answer =
-      services_->ask<DVAdministration, &DVAdministration::statusCompletionHandler>(kDVAdministrationServiceName, options_.deadline);
-  if (auto* error = std::get_if<QXError>(&answer)) return *error;
-  auto& [error, status] = std::get<0>(answer);
-  if (error) return *error;
-  if (!status) return notUnderstood("a status");
-  return *std::move(status);
-}
-
-Result<std::vector<Grant>> Administrator::grants(const std::optional<ProviderID>& provider, const std::optional<ConsumerID>& consumer) {
+// All pages. Those of one walk come over one connection: they are pages of one list then.
+Result<std::vector<Grant>> walk(const sdk_detail::Connection& connection, TimePoint until, const std::optional<ProviderID>& provider,
+                                const std::optional<ConsumerID>& consumer) {
   std::vector<Grant> grants;
-  std::optional<std::int64_t> from;
-  for (;;) {
-    auto answer = services_->ask<DVAdministration, &DVAdministration::grantsOfProviderID>(kDVAdministrationServiceName, options_.deadline,
-                                                                                          provider, consumer, from);
-    if (auto* error = std::get_if<QXError>(&answer)) return *error;
-    auto& [error, page, next] = std::get<0>(answer);
-    if (error) return *error;
-    if (!page) return notUnderstood("grants");
+  for (std::int64_t from = 0;;) {
+    auto answer =
+        ServiceConnections::askOver<&DVAdministration::grantsOfProviderID>(connection, {until}, provider, consumer, std::optional(from));
+    if (auto error = errorOf(answer)) return *std::move(error);
+    const auto& [error, page, next] = std::get<0>(answer);
+    if (!page) return noAnswer("grants");
     for (const QXValue& entry : *page) {
       auto grant = grantFrom(entry);
-      if (!grant) return notUnderstood("grants");
+      if (!grant) return noAnswer("grants");
       grants.push_back(*std::move(grant));
     }
     if (!next) return grants;
-    if (*next <= from.value_or(0)) return notUnderstood("a next page");
-    from = next;
+    if (*next <= from) return noAnswer("a next page");
+    from = *next;
+  }
+}
+
+bool isLost(const Result<std::vector<Grant>>& grants) {
+  const auto* error = std::get_if<QXError>(&grants);
+  return error != nullptr && error->domain == kConsumerErrorDomain &&
+         error->code == static_cast<std::int64_t>(ConsumerErrorCode::connectionLost);
+}
+
+}  // namespace
+
+Result<std::unique_ptr<Administrator>> Administrator::connect(Options options) {
+  auto runtime = ServiceConnections::runtimeDirectory();
+  if (auto* error = std::get_if<QXError>(&runtime)) return std::move(*error);
+  auto services = std::make_shared<ServiceConnections>(std::get<std::string>(std::move(runtime)), std::nullopt, options.restartPatience);
+  if (auto failure = services->connect(kDVAdministrationServiceName, after(options.deadline))) return *std::move(failure);
+  return std::unique_ptr<Administrator>(new Administrator(std::move(services), options));
+}
+
+Administrator::Administrator(std::shared_ptr<ServiceConnections> services, Options options)
+    : services_(std::move(services)), options_(options) {}
+Administrator::~Administrator() = default;
+
+Administrator Administrator::within(std::chrono::milliseconds deadline) const {
+  Options options = options_;
+  options.deadline = deadline;
+  return Administrator(services_, options);
+}
+
+Result<QXDictionary> Administrator::status() {
+  return valueOf<QXDictionary>(services_->ask<&DVAdministration::statusCompletionHandler>(kDVAdministrationServiceName,
+                                                                                          {after(options_.deadline)}, Repeat::harmless),
+                               "a status");
+}
+
+Result<std::vector<Grant>> Administrator::grants(const std::optional<ProviderID>& provider, const std::optional<ConsumerID>& consumer) {
+  const TimePoint until = after(options_.deadline);
+  for (bool isRepeated = false;; isRepeated = true) {
+    auto connection = services_->connectAnew(kDVAdministrationServiceName, until);
+    if (auto* error = std::get_if<QXError>(&connection)) return std::move(*error);
+    auto grants = walk(*std::get<0>(connection), until, provider, consumer);
+    if (isRepeated || !isLost(grants)) return grants;
   }
 }
 
 Failure Administrator::revoke(const ProviderID& provider, const ItemID& item, const ConsumerID& consumer) {
-  auto answer = services_->ask<DVAdministration, &DVAdministration::revokeItemID>(kDVAdministrationServiceName, options_.deadline, item,
-                                                                                  provider, consumer);
-  if (auto* error = std::get_if<QXError>(&answer)) return *error;
-  return std::get<0>(std::get<0>(answer));
+  return errorOf(services_->ask<&DVAdministration::revokeItemID>(kDVAdministrationServiceName, {after(options_.deadline)}, Repeat::never,
+                                                                 item, provider, consumer));
 }
 
 Failure Administrator::announceFirstUnlock() {
-  auto answer = services_->ask<DVAdministration, &DVAdministration::announceFirstUnlockCompletionHandler>(kDVAdministrationServiceName,
-                                                                                                          options_.deadline);
-  if (auto* error = std::get_if<QXError>(&answer)) return *error;
-  return std::get<0>(std::get<0>(answer));
+  return errorOf(services_->ask<&DVAdministration::announceFirstUnlockCompletionHandler>(kDVAdministrationServiceName,
+                                                                                         {after(options_.deadline)}, Repeat::harmless));
 }
 
 }  // namespace docuvend

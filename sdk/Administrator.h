@@ -7,8 +7,8 @@
 //     if (auto failure = administrator.revoke(grant.provider, grant.item, grant.consumer)) std::cerr << failure->description() << "\n";
 //   }
 //
-// Every call blocks until its answer, an error, or its deadline; ConsumerErrors.h lists the errors that the library makes. One
-// Administrator may be used from several threads.
+// Threads, deadlines, restarts and errors are as Consumer.h says. Everything but `revoke` is asked again when the daemon ends before it has
+// answered. A caller who is confined, or another user, finds no daemon: `unreachable`, or QXRpcErrorDomain's refused (9).
 #pragma once
 
 #include <chrono>
@@ -40,13 +40,18 @@ class Administrator {
  public:
   struct Options {
     std::chrono::milliseconds deadline{30'000};
+    // How long a call waits for a daemon that is not there.
+    std::chrono::milliseconds restartPatience{5'000};
   };
 
-  // `unreachable` when XDG_RUNTIME_DIR is not set or the daemon cannot be connected to.
+  // `unreachable` at once when XDG_RUNTIME_DIR is not set or no daemon is there.
   [[nodiscard]] static Result<std::unique_ptr<Administrator>> connect(Options options);
   ~Administrator();
   Administrator(const Administrator&) = delete;
   Administrator& operator=(const Administrator&) = delete;
+
+  // The same connections with another deadline, which holds for each call as a whole.
+  [[nodiscard]] Administrator within(std::chrono::milliseconds deadline) const;
 
   // Strings, numbers, arrays and dictionaries, for a person to read: keys may come and go.
   [[nodiscard]] Result<QXDictionary> status();

@@ -1,6 +1,7 @@
 // Turns one asynchronous operation of a protocol into a call that waits.
 #pragma once
 
+#include <algorithm>
 #include <chrono>
 #include <functional>
 #include <future>
@@ -17,36 +18,90 @@
 
 namespace docuvend::sdk_detail {
 
+using TimePoint = std::chrono::steady_clock::time_point;
+
+// That long from now; what is longer than a year is a year.
+[[nodiscard]] inline TimePoint after(std::chrono::milliseconds time) {
+  static constexpr std::chrono::hours kYear{24 * 365};
+  return std::chrono::steady_clock::now() + std::min<std::chrono::milliseconds>(time, kYear);
+}
+
+// How a call waits.
+struct Waiting {
+  TimePoint until;
+  // Run on the calling thread each time `interval` has passed. May be empty.
+  std::function<void()> meanwhile = {};
+  std::chrono::milliseconds interval{0};
+  // Kept until the call is answered or can be answered no more, also when the caller has stopped waiting.
+  std::shared_ptr<const void> held = {};
+};
+
+struct NotDelivered {
+  QXError error;
+  linux_platform::MessageFate fate;
+};
+struct NotInTime {};
+
 template <class Completion>
 struct AnswerOf;
 template <class... Replies>
 struct AnswerOf<std::function<void(std::optional<Replies>...)>> {
   using Values = std::tuple<std::optional<Replies>...>;
-  using Promise = std::promise<Result<Values>>;
+  using Outcome = std::variant<Values, NotDelivered, NotInTime>;
 
-  static std::function<void(std::optional<Replies>...)> fulfil(std::shared_ptr<Promise> promise) {
-    return [promise](std::optional<Replies>... replies) { promise->set_value(Values(std::move(replies)...)); };
+  static std::function<void(std::optional<Replies>...)> fulfil(std::shared_ptr<std::promise<Outcome>> promise,
+                                                               std::shared_ptr<const void> held) {
+    return [promise = std::move(promise), held = std::move(held)](std::optional<Replies>... replies) {
+      promise->set_value(Values(std::move(replies)...));
+    };
   }
 };
 
 // The values of an operation's reply.
 template <auto Method>
 using ReplyValues = typename AnswerOf<typename rpc_detail::Traits<Method>::CompletionType>::Values;
+template <auto Method>
+using Outcome = typename AnswerOf<typename rpc_detail::Traits<Method>::CompletionType>::Outcome;
 
-// Sends `Method` over the endpoint and waits for its reply's values, for the delivery's failure, or for the deadline. The endpoint's
-// reactor must not be waiting for the calling thread.
-template <class Protocol, auto Method, class... Arguments>
-[[nodiscard]] Result<ReplyValues<Method>> callAndWait(linux_platform::Endpoint& endpoint, std::chrono::milliseconds deadline,
-                                                      Arguments&&... arguments) {
-  using Answer = AnswerOf<typename rpc_detail::Traits<Method>::CompletionType>;
-  auto promise = std::make_shared<typename Answer::Promise>();
+// Sends `Method` over the endpoint and waits for its reply's values, for the delivery's failure, or for the deadline. An answer that comes
+// later is dropped. The endpoint's reactor must not be waiting for the calling thread.
+template <auto Method, class... Arguments>
+[[nodiscard]] Outcome<Method> callAndWait(linux_platform::Endpoint& endpoint, const Waiting& waiting, Arguments&&... arguments) {
+  using Traits = rpc_detail::Traits<Method>;
+  auto promise = std::make_shared<std::promise<Outcome<Method>>>();
   auto answer = promise->get_future();
-  const QXRemote<Protocol> remote(endpoint.remoteObjectProxy([promise](const QXError& error) { promise->set_value(error); }));
-  remote.template call<Method>(std::forward<Arguments>(arguments)..., Answer::fulfil(promise));
-  if (answer.wait_for(deadline) != std::future_status::ready) {
-    return makeConsumerError(ConsumerErrorCode::deadlinePassed, "No answer came in time.");
+  const QXRemote<typename Traits::ProtocolType> remote(
+      endpoint.remoteObjectProxy([promise](const QXError& error, linux_platform::MessageFate fate) {
+        promise->set_value(NotDelivered{error, fate});
+      }));
+  remote.template call<Method>(std::forward<Arguments>(arguments)...,
+                               AnswerOf<typename Traits::CompletionType>::fulfil(promise, waiting.held));
+  for (;;) {
+    const TimePoint wakeUp = waiting.meanwhile ? std::min(waiting.until, after(waiting.interval)) : waiting.until;
+    if (answer.wait_until(wakeUp) == std::future_status::ready) return answer.get();
+    if (std::chrono::steady_clock::now() >= waiting.until) return NotInTime{};
+    if (waiting.meanwhile) waiting.meanwhile();
   }
-  return answer.get();
+}
+
+// Why the operation failed, if it did: in its delivery, or as its reply says.
+template <class Values>
+[[nodiscard]] Failure errorOf(const Result<Values>& answer) {
+  if (const auto* undelivered = std::get_if<QXError>(&answer)) return *undelivered;
+  if constexpr (std::tuple_size_v<Values> == 0) {
+    return std::nullopt;
+  } else {
+    return std::get<std::optional<QXError>>(std::get<Values>(answer));
+  }
+}
+
+// The reply's one value of that type. `what` names it for a person who reads of its absence.
+template <class T, class Values>
+[[nodiscard]] Result<T> valueOf(Result<Values> answer, const char* what) {
+  if (auto error = errorOf(answer)) return *std::move(error);
+  auto& value = std::get<std::optional<T>>(std::get<Values>(answer));
+  if (!value) return makeConsumerError(ConsumerErrorCode::noAnswer, std::string("The answer carries neither ") + what + " nor an error.");
+  return *std::move(value);
 }
 
 }  // namespace docuvend::sdk_detail

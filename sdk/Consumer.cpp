@@ -1,19 +1,23 @@
 #include "sdk/Consumer.h"
 
-#include <unistd.h>
+#include <sys/stat.h>
 
-#include <cerrno>
 #include <fstream>
 #include <utility>
 
 #include "common/DVErrorCodes.h"
 #include "platform/linux/base/confinement.h"
-#include "platform/linux/wire/FileCoordinationProtocol.h"
-#include "platform/linux/wire/SandboxProtocol.h"
+#include "sdk/FileProgress.h"
 #include "sdk/ServiceConnections.h"
 #include "service/DVDaemon.h"
 
 namespace docuvend {
+
+using sdk_detail::after;
+using sdk_detail::errorOf;
+using sdk_detail::Repeat;
+using sdk_detail::ServiceConnections;
+using sdk_detail::valueOf;
 
 namespace {
 
@@ -32,27 +36,25 @@ bool isSuccessOfStopping(const QXError& error) {
   return error.domain == kDVErrorDomain && error.code == static_cast<std::int64_t>(DVErrorCode::pluginOperationFailed) && !error.underlying;
 }
 
-// The values of an answer as a document, when it carries no error.
-Result<Document> makeDocument(std::optional<QXError> error, std::optional<QXURL> url, std::optional<QXData> itemToken,
-                              std::optional<QXURL> siblingURL, std::optional<QXData> siblingToken) {
-  if (error) return *std::move(error);
-  if (!url) return makeConsumerError(ConsumerErrorCode::noAnswer, "The answer carries neither a document nor an error.");
-  return Document{*std::move(url), std::move(itemToken), std::move(siblingURL), std::move(siblingToken)};
-}
-
 }  // namespace
 
 Result<std::unique_ptr<Consumer>> Consumer::connect(Options options) {
-  auto runtime = sdk_detail::ServiceConnections::runtimeDirectory();
+  auto runtime = ServiceConnections::runtimeDirectory();
   if (auto* error = std::get_if<QXError>(&runtime)) return *error;
-  auto services = std::make_shared<sdk_detail::ServiceConnections>(std::get<std::string>(runtime) + "/public", options.actAs);
-  if (auto failure = services->reach(kDVServiceName)) return *std::move(failure);
+  auto services = std::make_shared<ServiceConnections>(std::get<std::string>(runtime) + "/public", options.actAs, options.restartPatience);
+  if (auto failure = services->connect(kDVServiceName, after(options.deadline))) return *std::move(failure);
   return std::unique_ptr<Consumer>(new Consumer(std::move(services), std::move(options)));
 }
 
-Consumer::Consumer(std::shared_ptr<sdk_detail::ServiceConnections> services, Options options)
+Consumer::Consumer(std::shared_ptr<ServiceConnections> services, Options options)
     : services_(std::move(services)), options_(std::move(options)) {}
 Consumer::~Consumer() = default;
+
+Consumer Consumer::within(std::chrono::milliseconds deadline) const {
+  Options options = options_;
+  options.deadline = options.materialisingDeadline = deadline;
+  return Consumer(services_, std::move(options));
+}
 
 std::optional<ConsumerID> Consumer::ownIdentifier() const {
   if (options_.actAs) return ConsumerID{*options_.actAs};
@@ -60,122 +62,72 @@ std::optional<ConsumerID> Consumer::ownIdentifier() const {
 }
 
 Failure Consumer::wakeUp() {
-  auto answer = services_->ask<DVDaemon, &DVDaemon::wakeUpCompletion>(kDVServiceName, options_.deadline);
-  if (auto* error = std::get_if<QXError>(&answer)) return *error;
-  return std::nullopt;
+  return errorOf(services_->ask<&DVDaemon::wakeUpCompletion>(kDVServiceName, {after(options_.deadline)}, Repeat::harmless));
 }
 
 Result<Document> Consumer::extendSandbox(const QXURL& url, const ProviderID& fromProvider, const ConsumerID& toConsumer) {
-  auto answer =
-      services_->ask<DVDaemon, &DVDaemon::extendSandboxForFileURL>(kDVServiceName, options_.deadline, url, fromProvider, toConsumer);
-  if (auto* error = std::get_if<QXError>(&answer)) return *error;
+  auto answer = services_->ask<&DVDaemon::extendSandboxForFileURL>(kDVServiceName, {after(options_.deadline)}, Repeat::harmless, url,
+                                                                   fromProvider, toConsumer);
+  if (auto error = errorOf(answer)) return *std::move(error);
   auto& [error, itemToken, siblingURL, siblingToken] = std::get<0>(answer);
-  return makeDocument(std::move(error), url, std::move(itemToken), std::move(siblingURL), std::move(siblingToken));
+  return Document{url, std::move(itemToken), std::move(siblingURL), std::move(siblingToken)};
 }
 
 Failure Consumer::providePlaceholder(const QXURL& url, const ProviderID& fromProvider, const ConsumerID& forConsumer) {
-  auto answer = services_->ask<DVDaemon, &DVDaemon::providePlaceholderForItemAtURL>(kDVServiceName, options_.deadline, url, fromProvider,
-                                                                                    forConsumer);
-  if (auto* error = std::get_if<QXError>(&answer)) return *error;
-  return std::get<0>(std::get<0>(answer));
+  return errorOf(services_->ask<&DVDaemon::providePlaceholderForItemAtURL>(kDVServiceName, {after(options_.deadline)}, Repeat::harmless,
+                                                                           url, fromProvider, forConsumer));
 }
 
-Failure Consumer::startProviding(const QXURL& url, const ProviderID& fromProvider, const ConsumerID& forConsumer) {
-  auto answer = services_->ask<DVDaemon, &DVDaemon::startProvidingItemAtURL>(kDVServiceName, options_.materialisingDeadline, url,
-                                                                             fromProvider, forConsumer);
-  if (auto* error = std::get_if<QXError>(&answer)) return *error;
-  return std::get<0>(std::get<0>(answer));
+Failure Consumer::startProviding(const QXURL& url, const ProviderID& fromProvider, const ConsumerID& forConsumer,
+                                 const ProgressHandler& progress) {
+  std::function<void()> watch;
+  if (progress) {
+    watch = [path = url.fileSystemPath(), &progress] {
+      struct stat status {};
+      if (::stat(path.c_str(), &status) == 0) sdk_detail::report(status, progress);
+    };
+  }
+  return start(url, fromProvider, forConsumer, watch);
+}
+
+Failure Consumer::start(const QXURL& url, const ProviderID& fromProvider, const ConsumerID& forConsumer,
+                        const std::function<void()>& watch) {
+  return errorOf(services_->ask<&DVDaemon::startProvidingItemAtURL>(
+      kDVServiceName, {.until = after(options_.materialisingDeadline), .meanwhile = watch, .interval = sdk_detail::kProgressInterval},
+      Repeat::harmless, url, fromProvider, forConsumer));
 }
 
 Failure Consumer::stopProviding(const QXURL& url, const ProviderID& fromProvider, const ConsumerID& forConsumer) {
-  auto answer =
-      services_->ask<DVDaemon, &DVDaemon::stopProvidingItemAtURL>(kDVServiceName, options_.deadline, url, fromProvider, forConsumer);
-  if (auto* error = std::get_if<QXError>(&answer)) return *error;
-  auto& error = std::get<0>(std::get<0>(answer));
+  auto error = errorOf(services_->ask<&DVDaemon::stopProvidingItemAtURL>(kDVServiceName, {after(options_.deadline)}, Repeat::never, url,
+                                                                         fromProvider, forConsumer));
   if (error && isSuccessOfStopping(*error)) return std::nullopt;
   return error;
 }
 
 Result<QXDictionary> Consumer::providers() {
-  auto answer = services_->ask<DVDaemon, &DVDaemon::providersCompletionHandler>(kDVServiceName, options_.deadline);
-  if (auto* error = std::get_if<QXError>(&answer)) return *error;
-  auto& [error, providers] = std::get<0>(answer);
-  if (error) return *error;
-  if (!providers) return makeConsumerError(ConsumerErrorCode::noAnswer, "The answer carries neither providers nor an error.");
-  return *std::move(providers);
+  return valueOf<QXDictionary>(
+      services_->ask<&DVDaemon::providersCompletionHandler>(kDVServiceName, {after(options_.deadline)}, Repeat::harmless), "providers");
 }
 
 Result<std::string> Consumer::extendBookmark(const QXURL& url, const ConsumerID& toConsumer) {
-  auto answer = services_->ask<DVDaemon, &DVDaemon::extendBookmarkForFileURL>(kDVServiceName, options_.deadline, url, toConsumer);
-  if (auto* error = std::get_if<QXError>(&answer)) return *error;
-  auto& [string, error] = std::get<0>(answer);
-  if (error) return *error;
-  if (!string) return makeConsumerError(ConsumerErrorCode::noAnswer, "The answer carries neither a string nor an error.");
-  return *std::move(string);
+  return valueOf<std::string>(
+      services_->ask<&DVDaemon::extendBookmarkForFileURL>(kDVServiceName, {after(options_.deadline)}, Repeat::harmless, url, toConsumer),
+      "a string");
 }
 
 Result<std::string> Consumer::bookmarkableString(const QXURL& url) {
-  auto answer = services_->ask<DVDaemon, &DVDaemon::bookmarkableStringFromDocumentURL>(kDVServiceName, options_.deadline, url);
-  if (auto* error = std::get_if<QXError>(&answer)) return *error;
-  auto& [string, error] = std::get<0>(answer);
-  if (error) return *error;
-  if (!string) return makeConsumerError(ConsumerErrorCode::noAnswer, "No provider owns " + url.absoluteString() + ".");
-  return *std::move(string);
+  return valueOf<std::string>(
+      services_->ask<&DVDaemon::bookmarkableStringFromDocumentURL>(kDVServiceName, {after(options_.deadline)}, Repeat::harmless, url),
+      "a string (no provider owns the document)");
 }
 
 Result<Document> Consumer::documentURL(const std::string& bookmarkableString) {
-  auto answer =
-      services_->ask<DVDaemon, &DVDaemon::documentURLFromBookmarkableString>(kDVServiceName, options_.deadline, bookmarkableString);
-  if (auto* error = std::get_if<QXError>(&answer)) return *error;
+  auto answer = services_->ask<&DVDaemon::documentURLFromBookmarkableString>(kDVServiceName, {after(options_.deadline)}, Repeat::harmless,
+                                                                             bookmarkableString);
+  if (auto error = errorOf(answer)) return *std::move(error);
   auto& [url, itemToken, siblingURL, siblingToken, error] = std::get<0>(answer);
-  return makeDocument(std::move(error), std::move(url), std::move(itemToken), std::move(siblingURL), std::move(siblingToken));
-}
-
-Result<QXDescriptor> Consumer::redeem(const QXData& token, Access access) {
-  using linux_platform::QXSandboxRedemption;
-  auto answer = services_->ask<QXSandboxRedemption, &QXSandboxRedemption::redeemToken>(
-      linux_platform::kSandboxServiceName, options_.deadline, token, access == Access::readWrite);
-  if (auto* error = std::get_if<QXError>(&answer)) return *error;
-  auto& [error, file] = std::get<0>(answer);
-  if (error) return *error;
-  if (!file) return makeConsumerError(ConsumerErrorCode::noAnswer, "The answer carries neither a file nor an error.");
-  return *std::move(file);
-}
-
-Result<QXDescriptor> Consumer::open(const Document& document, const ProviderID& provider, Access access) {
-  if (!document.itemToken)
-    return makeConsumerError(ConsumerErrorCode::noToken, "There is no token for " + document.url.absoluteString() + ".");
-  const auto self = ownIdentifier();
-  if (!self) return makeConsumerError(ConsumerErrorCode::noToken, "This process acts for no installed bundle.");
-  if (auto failure = startProviding(document.url, provider, *self)) return *failure;
-  return redeem(*document.itemToken, access);
-}
-
-Failure Consumer::replace(const Document& document, const std::function<Failure(const QXDescriptor&)>& write) {
-  if (!document.itemToken || !document.siblingToken) {
-    return makeConsumerError(ConsumerErrorCode::noToken, "There are no tokens to replace " + document.url.absoluteString() + " with.");
-  }
-  auto sibling = redeem(*document.siblingToken, Access::readWrite);
-  if (auto* error = std::get_if<QXError>(&sibling)) return *error;
-  const QXDescriptor& file = std::get<QXDescriptor>(sibling);
-  // It may hold what an earlier attempt left.
-  if (::ftruncate(file.number, 0) != 0) return QXError::system(errno, "cannot empty the hidden sibling");
-  if (auto failure = write(file)) return failure;
-
-  using linux_platform::QXSandboxRedemption;
-  auto replaced = services_->ask<QXSandboxRedemption, &QXSandboxRedemption::replaceItemWithToken>(
-      linux_platform::kSandboxServiceName, options_.deadline, *document.itemToken, *document.siblingToken);
-  if (auto* error = std::get_if<QXError>(&replaced)) return *error;
-  if (auto& error = std::get<0>(std::get<0>(replaced))) return *error;
-  return finishedWriting(document.url);
-}
-
-Failure Consumer::finishedWriting(const QXURL& url) {
-  using linux_platform::QXFileCoordination;
-  auto told = services_->ask<QXFileCoordination, &QXFileCoordination::writerDidFinishWritingForURL>(
-      linux_platform::kFileCoordinationServiceName, options_.deadline, url);
-  if (auto* error = std::get_if<QXError>(&told)) return *error;
-  return std::get<0>(std::get<0>(told));
+  if (!url) return makeConsumerError(ConsumerErrorCode::noAnswer, "The answer carries neither a document nor an error.");
+  return Document{*std::move(url), std::move(itemToken), std::move(siblingURL), std::move(siblingToken), bookmarkableString};
 }
 
 }  // namespace docuvend

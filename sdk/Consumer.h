@@ -1,14 +1,46 @@
 // The consumer library: what an application asks of Docuvend, as plain calls.
 //
-//   auto connected = docuvend::Consumer::connect({});
-//   auto document = consumer.documentURL(bookmark);        // a URL and tokens
-//   auto file = consumer.open(document, Access::read);      // start providing, then redeem: true bytes, never a placeholder's zeros
+//   auto connected = Consumer::connect({});
+//   if (auto* error = std::get_if<QXError>(&connected)) return fail(*error);
+//   Consumer& docuvend = *std::get<std::unique_ptr<Consumer>>(connected);
 //
-// Every call blocks until its answer, an error, or its deadline. One Consumer may be used from several threads. A call whose deadline
-// passed may still take effect.
+//   auto document = docuvend.documentURL(string);                          // kept since somebody granted the document
+//   if (auto* error = std::get_if<QXError>(&document)) return fail(*error);
+//   const Document& letter = std::get<Document>(document);
+//   auto file = docuvend.open(letter, provider, Access::read);             // the true bytes, never a placeholder's zeros
+//   if (auto* error = std::get_if<QXError>(&file)) return fail(*error);
+//   std::string text = readAll(std::get<QXDescriptor>(file).number);       // an ordinary open file
+//   if (auto failure = docuvend.replace(letter, [&text](const QXDescriptor& to) { return writeAll(to.number, text + "PS\n"); }))
+//     return fail(*failure);
+//
+// Who calls. A confined application is known by its launch and needs to say nothing. An unconfined program acts for nobody unless it names
+// an installed bundle (Options::actAs). What a bundle may ask stands in its entitlements: "com.orvane.docuvend.acl-write" to grant, that
+// one or "com.orvane.docuvend.acl-read" for providers and for providing; everything else needs none.
+//
+// Threads. Every call blocks the calling thread until its answer, an error, or its deadline. One Consumer may be used from several threads,
+// all over one connection to each service; it must not go while a call runs. The library has one thread of its own, on which nothing of
+// the caller's runs: handlers run on the thread that made the call, and must not throw.
+//
+// Deadlines. Options has those of all calls; `within` makes the same calls with another:
+//
+//   docuvend.within(2s).documentURL(string)
+//
+// A call whose deadline has passed may still take effect; its late answer is dropped, with the file that may have come in it.
+//
+// Restarts of the daemon. A Consumer outlives them. A call that finds its connection ended, or no daemon, waits for a new one: no longer
+// than Options::restartPatience and its deadline, then it is `unreachable`. If the daemon ends with a request in hand, the library asks
+// once more where that is harmless: wakeUp, extendSandbox, providePlaceholder, startProviding, providers, extendBookmark,
+// bookmarkableString, documentURL, redeem, open, finishedWriting. stopProviding, which might undo what somebody else began meanwhile, and
+// the last step of replace are not repeated: their error is `connectionLost`, and they may have taken effect.
+//
+// Errors. The library's own are in ConsumerErrors.h. All others are answers as they came: DVErrorDomain (common/DVErrorCodes.h) from the
+// daemon, with a provider's own error beneath code 7; QXSandboxErrorDomain (platform/linux/wire/SandboxProtocol.h) when a token opens
+// nothing; QXRpcErrorDomain (platform/rpc_errors.h) when the daemon refuses the connection or a request is too large;
+// QXSystemErrorDomain, with an errno value, from the system. What each call adds stands beside it.
 #pragma once
 
 #include <chrono>
+#include <cstdint>
 #include <functional>
 #include <memory>
 #include <optional>
@@ -27,13 +59,25 @@ class ServiceConnections;
 
 enum class Access { read, readWrite };
 
-// A document, and what opens it.
+// A document, and what opens it. May be kept and copied; the tokens are as good as the file to whoever has them. They last until the
+// session ends or a grant of the same provider is revoked: then opening fails with QXSandboxErrorDomain's badToken (1) and new ones must be
+// asked for, which the library does itself for a document that has its string.
 struct Document {
   QXURL url;
   std::optional<QXData> itemToken;
   std::optional<QXURL> siblingURL;
   std::optional<QXData> siblingToken;
+  // The string that it was asked for by, if it was.
+  std::optional<std::string> bookmarkableString = std::nullopt;
 };
+
+// How much of a document is there while it is being provided. A provider may begin anew: the first number may also fall.
+struct Progress {
+  std::uint64_t bytesPresent;
+  std::uint64_t size;
+};
+// Called on the thread that made the call, now and then while it waits, never afterwards. Not called when nothing can be said.
+using ProgressHandler = std::function<void(const Progress&)>;
 
 class Consumer {
  public:
@@ -41,45 +85,81 @@ class Consumer {
     // For an unconfined program: the installed bundle that it acts for. A confined one is known by its launch.
     std::optional<std::string> actAs;
     std::chrono::milliseconds deadline{30'000};
-    // Materialising a document may take longer than an answer.
+    // Materialising a document may take longer than an answer: for startProviding, and for open as a whole.
     std::chrono::milliseconds materialisingDeadline{600'000};
+    // How long a call waits for a daemon that is not there.
+    std::chrono::milliseconds restartPatience{5'000};
   };
 
-  // Fails when XDG_RUNTIME_DIR is not set or the daemon cannot be connected to.
+  // `unreachable` at once when XDG_RUNTIME_DIR is not set or no daemon is there.
   [[nodiscard]] static Result<std::unique_ptr<Consumer>> connect(Options options);
   ~Consumer();
   Consumer(const Consumer&) = delete;
   Consumer& operator=(const Consumer&) = delete;
 
+  // The same connections with another deadline, which holds for each call as a whole.
+  [[nodiscard]] Consumer within(std::chrono::milliseconds deadline) const;
+
   // The bundle that this process acts for: the one in the options, else the one it was launched as.
   [[nodiscard]] std::optional<ConsumerID> ownIdentifier() const;
 
+  // Makes sure that the daemon runs.
   [[nodiscard]] Failure wakeUp();
+  // Grants the consumer a provider's item, which is on disk when this returns, and asks tokens for it. A token is absent when the platform
+  // issued none.
   [[nodiscard]] Result<Document> extendSandbox(const QXURL& url, const ProviderID& fromProvider, const ConsumerID& toConsumer);
+
+  // These three are for a consumer that has been granted the item, but for the last one, which everybody may ask.
+  //
   // Has the provider make a placeholder for the item: a file of the right size without the contents.
   [[nodiscard]] Failure providePlaceholder(const QXURL& url, const ProviderID& fromProvider, const ConsumerID& forConsumer);
-  [[nodiscard]] Failure startProviding(const QXURL& url, const ProviderID& fromProvider, const ConsumerID& forConsumer);
+  // Has the provider bring the item's contents into its file. Progress is what this process sees at the URL's path: a confined one
+  // sees nothing there, and is told nothing.
+  [[nodiscard]] Failure startProviding(const QXURL& url, const ProviderID& fromProvider, const ConsumerID& forConsumer,
+                                       const ProgressHandler& progress = {});
   // Tells the provider that the consumer needs the item's contents no longer.
   [[nodiscard]] Failure stopProviding(const QXURL& url, const ProviderID& fromProvider, const ConsumerID& forConsumer);
-  // Keyed by provider identifier.
+
+  // Keyed by provider identifier; each value a dictionary with the URL "documentStorageURL" and the string "providerIdentifier", or less.
   [[nodiscard]] Result<QXDictionary> providers();
-  // Grants a document that this application may write to another; the string by which that one finds it.
+  // Grants a document that this application may write to another one; the string by which that one finds it.
   [[nodiscard]] Result<std::string> extendBookmark(const QXURL& url, const ConsumerID& toConsumer);
+  // The string that names the document wherever it will lie. `noAnswer`: no provider owns the URL.
   [[nodiscard]] Result<std::string> bookmarkableString(const QXURL& url);
+  // The way back, for the consumer to whom the document is granted, with tokens. The daemon answers nothing while the provider that the
+  // string names is not there: then it is `deadlinePassed`.
   [[nodiscard]] Result<Document> documentURL(const std::string& bookmarkableString);
 
-  // Redeems the item's token for an open file. Says nothing about the contents: a placeholder reads as zeros.
+  // The open file that the token names, in blocking mode, with its offset at 0. Says nothing about the contents: a placeholder reads as
+  // zeros. While somebody holds the file in a way that would make an open wait, it is tried again; `deadlinePassed` then stands above
+  // the reason.
   [[nodiscard]] Result<QXDescriptor> redeem(const QXData& token, Access access);
-  // Has the provider materialise the document for this application, then redeems.
-  [[nodiscard]] Result<QXDescriptor> open(const Document& document, const ProviderID& provider, Access access);
-  // Saves so that a reader sees the old contents or the new: writes the hidden sibling through `write`, puts it in the item's place, and
-  // tells the provider. `write` returns an error to give up; then nothing has changed.
+  // Has the provider materialise the document for this application, then redeems. `noToken` when the document has none or this process acts
+  // for no bundle; otherwise the errors of startProviding, redeem, and documentURL when tokens must be asked for anew.
+  [[nodiscard]] Result<QXDescriptor> open(const Document& document, const ProviderID& provider, Access access,
+                                          const ProgressHandler& progress = {});
+
+  // Saves so that a reader sees the old contents or the new, also after a power failure: `write` fills an empty file beside the item (its
+  // hidden sibling), which then takes the item's place, and the provider is told. The time that `write` takes does not count. The new file
+  // has mode 600.
+  //
+  // Of several who save one item through this library at once each waits for the one before it, so the last one's contents stay. The
+  // others need not be in this process, but a program that writes the sibling without taking its lock (flock) is not kept out.
+  //
+  // Failures. `noToken`; `deadlinePassed` above the reason while somebody else is saving; an error of redeem, of emptying the sibling, or
+  // what `write` returns to give up: the item is untouched. Then, of putting the sibling in its place: `unreachable` and of
+  // QXSandboxErrorDomain badToken (1), notRegularFile (2), notPermitted (5) and notSiblings (6) leave it untouched; after anything else
+  // it has the old contents or the new. `notTold`: it has the new ones; call finishedWriting again.
   [[nodiscard]] Failure replace(const Document& document, const std::function<Failure(const QXDescriptor&)>& write);
   // Tells file coordination that this process has written the document in place, so that its provider hears of the change.
   [[nodiscard]] Failure finishedWriting(const QXURL& url);
 
  private:
   Consumer(std::shared_ptr<sdk_detail::ServiceConnections> services, Options options);
+
+  // startProviding, with something to be done now and then while it waits.
+  [[nodiscard]] Failure start(const QXURL& url, const ProviderID& fromProvider, const ConsumerID& forConsumer,
+                              const std::function<void()>& watch);
 
   const std::shared_ptr<sdk_detail::ServiceConnections> services_;
   const Options options_;

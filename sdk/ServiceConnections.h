@@ -1,10 +1,11 @@
 // One program's connections to the daemon's services: each is made when it is first needed and again after it has ended.
 //
-// Shared by the libraries' classes; may be used from any thread.
+// Shared by the libraries' classes; may be used from any thread. Must not go while a call runs.
 #pragma once
 
+#include <atomic>
 #include <chrono>
-#include <cstdint>
+#include <cstddef>
 #include <map>
 #include <memory>
 #include <mutex>
@@ -20,46 +21,104 @@
 
 namespace docuvend::sdk_detail {
 
+// Whether a request may be made again when the daemon left between request and answer.
+enum class Repeat { harmless, never };
+
+struct Connection {
+  std::shared_ptr<linux_platform::Endpoint> endpoint;
+  std::atomic<std::size_t> abandonedCalls = 0;
+};
+
+// One call's tries.
+class Attempts {
+ public:
+  Attempts(TimePoint until, std::chrono::milliseconds patience) : until_(until), patience_(patience) {}
+
+  // Waits a little for a daemon that is not there. False: it has been waited for long enough.
+  [[nodiscard]] bool waitForDaemon();
+  // A connection was there but had ended: false when that has gone on for long enough.
+  [[nodiscard]] bool mayTryAnotherConnection() { return ++endedConnections_ == 1 || waitForDaemon(); }
+  // The daemon left with the request in hand.
+  [[nodiscard]] bool mayRepeat();
+
+  [[nodiscard]] TimePoint until() const { return until_; }
+
+ private:
+  const TimePoint until_;
+  const std::chrono::milliseconds patience_;
+  std::optional<TimePoint> waitingUntil_;  // none: the daemon has not been missed since the last request
+  int endedConnections_ = 0;
+  int repeats_ = 0;
+};
+
 class ServiceConnections {
  public:
-  // `actAs`: the bundle that is declared to every service.
-  ServiceConnections(std::string socketDirectory, std::optional<std::string> actAs)
-      : socketDirectory_(std::move(socketDirectory)), actAs_(std::move(actAs)) {}
+  // `actAs`: the bundle that is declared to every service. `patience`: how long a call waits for a daemon that is not there.
+  ServiceConnections(std::string socketDirectory, std::optional<std::string> actAs, std::chrono::milliseconds patience)
+      : socketDirectory_(std::move(socketDirectory)), actAs_(std::move(actAs)), patience_(patience) {}
   ServiceConnections(const ServiceConnections&) = delete;
   ServiceConnections& operator=(const ServiceConnections&) = delete;
 
   // The daemon's run-time directory, of the environment.
   [[nodiscard]] static Result<std::string> runtimeDirectory();
 
-  [[nodiscard]] const std::optional<std::string>& actAs() const { return actAs_; }
+  // Connects to the service unless it is connected already. Does not wait for a daemon that is not there.
+  [[nodiscard]] Failure connect(const std::string& service, TimePoint until);
 
-  // Connects to the service unless it is connected already.
-  [[nodiscard]] Failure reach(const std::string& service);
+  // Asks the service: the values of the operation's reply. Goes to another connection when the one at hand has ended before the request
+  // had left, and once more, if that is harmless, when it ended afterwards.
+  template <auto Method, class... Arguments>
+  [[nodiscard]] Result<ReplyValues<Method>> ask(const char* service, const Waiting& waiting, Repeat repeat, const Arguments&... arguments) {
+    Attempts attempts(waiting.until, patience_);
+    for (;;) {
+      auto reached = reach(service, attempts);
+      if (auto* error = std::get_if<QXError>(&reached)) return std::move(*error);
+      const auto& connection = std::get<std::shared_ptr<Connection>>(reached);
+      auto outcome = callAndWait<Method>(*connection->endpoint, waiting, arguments...);
+      if (auto* values = std::get_if<ReplyValues<Method>>(&outcome)) return std::move(*values);
+      const auto* failure = std::get_if<NotDelivered>(&outcome);
+      if (failure == nullptr) return abandon(service, *connection);
+      if (!mayAskAgain(service, *connection, *failure, repeat, attempts)) return finalError(*failure);
+    }
+  }
 
-  // The values of the operation's reply.
-  template <class Protocol, auto Method, class... Arguments>
-  [[nodiscard]] Result<ReplyValues<Method>> ask(const char* service, std::chrono::milliseconds deadline, Arguments&&... arguments) {
-    auto reached = endpoint(service);
-    if (auto* error = std::get_if<QXError>(&reached)) return *error;
-    return callAndWait<Protocol, Method>(*std::get<std::shared_ptr<linux_platform::Endpoint>>(reached), deadline,
-                                         std::forward<Arguments>(arguments)...);
+  // A connection of the caller's own, for requests that belong together; it waits for a daemon that is not there.
+  [[nodiscard]] Result<std::shared_ptr<Connection>> connectAnew(const std::string& service, TimePoint until);
+  // Asks over that connection and no other.
+  template <auto Method, class... Arguments>
+  [[nodiscard]] static Result<ReplyValues<Method>> askOver(const Connection& connection, const Waiting& waiting,
+                                                           const Arguments&... arguments) {
+    auto outcome = callAndWait<Method>(*connection.endpoint, waiting, arguments...);
+    if (auto* values = std::get_if<ReplyValues<Method>>(&outcome)) return std::move(*values);
+    if (const auto* failure = std::get_if<NotDelivered>(&outcome)) return finalError(*failure);
+    return notInTime();
   }
 
  private:
-  struct Open {
-    std::uint64_t serial;
-    std::shared_ptr<linux_platform::Endpoint> endpoint;
-  };
-  [[nodiscard]] Result<std::shared_ptr<linux_platform::Endpoint>> endpoint(const std::string& service);
-  void drop(const std::string& service, std::uint64_t serial);
+  [[nodiscard]] Result<std::shared_ptr<Connection>> reach(const std::string& service, Attempts& attempts);
+  [[nodiscard]] Result<linux_platform::UniqueDescriptor> connectSocket(const std::string& service, Attempts& attempts) const;
+  // The one that is open; none when it must be made.
+  [[nodiscard]] std::shared_ptr<Connection> open(const std::string& service);
+  // A connection over that socket, or the one that another thread has made meanwhile.
+  [[nodiscard]] std::shared_ptr<Connection> keep(const std::string& service, linux_platform::UniqueDescriptor socket);
+  [[nodiscard]] std::shared_ptr<Connection> make(const std::string& service, linux_platform::UniqueDescriptor socket);
+  // Later calls need another one; those that run over it go on.
+  void drop(const std::string& service, const Connection& connection);
+
+  // A call over the connection has waited long enough.
+  [[nodiscard]] QXError abandon(const std::string& service, Connection& connection);
+  [[nodiscard]] bool mayAskAgain(const std::string& service, const Connection& connection, const NotDelivered& failure, Repeat repeat,
+                                 Attempts& attempts);
+  [[nodiscard]] static QXError finalError(const NotDelivered& failure);
+  [[nodiscard]] static QXError notInTime();
 
   const std::string socketDirectory_;
   const std::optional<std::string> actAs_;
+  const std::chrono::milliseconds patience_;
 
   std::mutex mutex_;
   // Guarded by `mutex_`: the connections that are open now, by service.
-  std::map<std::string, Open> open_;
-  std::uint64_t lastSerial_ = 0;
+  std::map<std::string, std::shared_ptr<Connection>> open_;
 
   // Last, so that its threads have ended before anything that their handlers touch goes.
   linux_platform::Reactor reactor_{1};

@@ -42,6 +42,8 @@ ExitStatus statusOf(const QXError& error) {
         return ExitStatus::deadlinePassed;
       case ConsumerErrorCode::noAnswer:
         return ExitStatus::notFound;
+      case ConsumerErrorCode::notTold:
+        return ExitStatus::providerFailed;
       case ConsumerErrorCode::noToken:
         return ExitStatus::notPermitted;
     }

@@ -24,8 +24,11 @@ class Client {
   // An operation's reply values, or why it was not delivered. An argument may be std::nullopt.
   template <auto Method, class... Arguments>
   auto ask(Arguments&&... arguments) {
-    using Protocol = typename rpc_detail::Traits<Method>::ProtocolType;
-    return sdk_detail::callAndWait<Protocol, Method>(*endpoint_, kPatience, std::forward<Arguments>(arguments)...);
+    auto outcome = sdk_detail::callAndWait<Method>(*endpoint_, {sdk_detail::after(kPatience)}, std::forward<Arguments>(arguments)...);
+    using Answer = Result<sdk_detail::ReplyValues<Method>>;
+    if (auto* values = std::get_if<sdk_detail::ReplyValues<Method>>(&outcome)) return Answer(std::move(*values));
+    const auto* failure = std::get_if<sdk_detail::NotDelivered>(&outcome);
+    return Answer(failure != nullptr ? failure->error : makeConsumerError(ConsumerErrorCode::deadlinePassed, "no answer to a test"));
   }
 
   [[nodiscard]] linux_platform::Endpoint& endpoint() { return *endpoint_; }
@@ -35,11 +38,6 @@ class Client {
   std::shared_ptr<linux_platform::Endpoint> endpoint_;
 };
 
-// The one value of a reply: its error. A delivery that failed counts as its error.
-template <class Values>
-std::optional<QXError> errorOf(const Result<Values>& answer) {
-  if (const auto* undelivered = std::get_if<QXError>(&answer)) return *undelivered;
-  return std::get<std::optional<QXError>>(std::get<Values>(answer));
-}
+using sdk_detail::errorOf;
 
 }  // namespace docuvend::tests
