@@ -134,7 +134,7 @@ class SavedDocument : public testing::SandboxHouse {
   }
   std::string issued(const std::string& path) { return sandbox.issueReadWriteExtension(path).value_or(""); }
 
-  LinuxSandbox sandbox{TokenKey::random(), keyFile, bundles, peers};
+  LinuxSandbox sandbox{loadedSession(), bundles, peers};
   LinuxFileSystem fileSystem{pathsWithHome(home)};
   LinuxFileCoordinator coordinator{fileSystem};
 };

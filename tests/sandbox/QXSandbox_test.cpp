@@ -37,7 +37,7 @@ class Linux : public linux_platform::testing::SandboxHouse {
   std::string refusedPath() { return storage; }
 
  private:
-  linux_platform::LinuxSandbox sandbox_{linux_platform::TokenKey::random(), keyFile, bundles, peers};
+  linux_platform::LinuxSandbox sandbox_{loadedSession(), bundles, peers};
 };
 
 template <class Platform>

@@ -39,6 +39,17 @@ TEST(RedemptionLedger, EntersNothingForAnEmptyInstance) {
   EXPECT_FALSE(ledger.holds("", object(1)));
 }
 
+TEST(RedemptionLedger, ForgetsAllAndGoesOn) {
+  RedemptionLedger ledger;
+  ledger.enter("a", object(1));
+  ledger.enter("b", object(2));
+  ledger.forgetAll();
+  EXPECT_FALSE(ledger.holds("a", object(1)));
+  EXPECT_FALSE(ledger.holds("b", object(2)));
+  ledger.enter("a", object(1));
+  EXPECT_TRUE(ledger.holds("a", object(1)));
+}
+
 TEST(RedemptionLedger, ForgetsTheOldestObjectOfAFullInstance) {
   RedemptionLedger ledger;
   for (std::uint64_t inode = 0; inode < RedemptionLedger::kMaximumObjectsPerInstance; ++inode) ledger.enter("a", object(inode));

@@ -14,9 +14,11 @@
 #include <map>
 #include <memory>
 #include <sstream>
+#include <stdexcept>
 #include <string>
 #include <vector>
 
+#include "platform/fake/FakeLog.h"
 #include "platform/linux/bundles/Bundle.h"
 #include "platform/linux/identity/PeerIdentity.h"
 #include "platform/linux/sandbox/LinuxSandbox.h"
@@ -58,6 +60,14 @@ inline std::string read(const std::string& path) {
   std::ostringstream text;
   text << std::ifstream(path, std::ios::binary).rdbuf();
   return text.str();
+}
+
+// With the files of the tokens' session in the directory.
+inline Paths pathsIn(const std::string& directory) {
+  Paths paths;
+  paths.tokenKey = directory + "/token-key";
+  paths.tokenFloors = directory + "/token-floors";
+  return paths;
 }
 
 class MadeUpBundles final : public BundleRegistry {
@@ -150,6 +160,13 @@ class SandboxHouse : public ::testing::Test {
     return peer;
   }
 
+  // The session of this house, as each start of the daemon finds it.
+  [[nodiscard]] std::unique_ptr<TokenSession> loadedSession() {
+    auto session = TokenSession::load(paths, log.defaultLog());
+    if (auto* loaded = std::get_if<std::unique_ptr<TokenSession>>(&session)) return std::move(*loaded);
+    throw std::runtime_error(std::get<QXError>(session).description());
+  }
+
   const TemporaryDirectory directory;
   const std::string home = directory.path() + "/home";
   const std::string group = home + "/groups/com.example.cellar";
@@ -159,7 +176,8 @@ class SandboxHouse : public ::testing::Test {
   const std::string otherGroup = home + "/groups/com.example.other";
   const std::string editorContainer = home + "/containers/com.example.editor";
   const std::string outside = home + "/outside";
-  const std::string keyFile = directory.path() + "/token-key";
+  const Paths paths = pathsIn(directory.path());
+  fake_platform::FakeLog log;
   MadeUpBundles bundles;
   MadeUpPeers peers;
 };

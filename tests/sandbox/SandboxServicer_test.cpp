@@ -69,8 +69,7 @@ class SandboxServicerTest : public testing::SandboxHouse {
     EXPECT_EQ(error->code, static_cast<std::int64_t>(code)) << error->description();
   }
 
-  fake_platform::FakeLog log;
-  LinuxSandbox sandbox{TokenKey::random(), keyFile, bundles, peers};
+  LinuxSandbox sandbox{loadedSession(), bundles, peers};
   const std::shared_ptr<SandboxListenerDelegate> delegate = std::make_shared<SandboxListenerDelegate>(sandbox, log.defaultLog());
   fake_platform::FakeRpcListener listener;
   std::shared_ptr<fake_platform::FakeRpcConnection> connection;

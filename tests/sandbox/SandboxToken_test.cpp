@@ -15,6 +15,7 @@ constexpr const char* kNonceText = "000102030405060708090a0b0c0d0e0f";
 
 SandboxToken tokenFor(std::string path) {
   SandboxToken token;
+  token.number = 7;
   token.path = std::move(path);
   for (std::size_t i = 0; i < token.nonce.size(); ++i) token.nonce[i] = static_cast<std::uint8_t>(i);
   return token;
@@ -43,30 +44,15 @@ TEST(SandboxToken, IsReadBackAsItWasWhateverBytesItsPathHas) {
   std::string everyByte = "/";
   for (int byte = 1; byte < 256; ++byte) everyByte += static_cast<char>(byte);
   for (const std::string& path : {std::string("/a/b.txt"), std::string("/Docuvend Storage/ü:%41.txt"), std::string("/\xff\xfe"), everyByte,
-                                  "/" + std::string(SandboxToken::kMaximumPathLength - 1, '\x01')}) {
+                                  "/" + std::string(kMaximumTokenPathLength - 1, '\x01')}) {
     const SandboxToken token = tokenFor(path);
     const std::string text = token.sealed(key);
     EXPECT_TRUE(std::all_of(text.begin(), text.end(), [](char c) { return c > ' ' && c < '\x7f'; })) << text;
-    EXPECT_LE(text.size(), SandboxToken::kMaximumTextLength);
+    EXPECT_LE(text.size() + kMaximumTokenNumberDigits, SandboxToken::kMaximumTextLength);
     const auto opened = SandboxToken::opened(text, key);
     ASSERT_TRUE(std::holds_alternative<SandboxToken>(opened)) << text;
     EXPECT_EQ(std::get<SandboxToken>(opened), token) << text;
   }
-}
-
-// The example of docs/tokens.md.
-TEST(SandboxToken, HasTheDocumentedText) {
-  const testing::TemporaryDirectory directory;
-  const std::string file = directory.path() + "/token-key";
-  std::string bytes;
-  for (int byte = 0; byte < 32; ++byte) bytes += static_cast<char>(byte);
-  testing::write(file, bytes);
-  ASSERT_EQ(::chmod(file.c_str(), 0600), 0);
-  const auto key = TokenKey::loadOrCreate(file);
-  ASSERT_TRUE(std::holds_alternative<TokenKey>(key));
-  EXPECT_EQ(tokenFor("/home/u/Docuvend Storage/café.txt").sealed(std::get<TokenKey>(key)),
-            "docuvend-token:1:rw:/home/u/Docuvend%20Storage/caf%C3%A9.txt:000102030405060708090a0b0c0d0e0f:"
-            "618b71dfaec87e77d54d1835a5f37c1e350e21b062f51e5cb1d11c1372432c4b");
 }
 
 TEST(SandboxToken, IsRefusedWithAnyBitChanged) {
@@ -93,48 +79,64 @@ TEST(SandboxToken, IsRefusedWhenItIsCutShortOrContinued) {
   EXPECT_EQ(refusalOf(text + std::string(SandboxToken::kMaximumTextLength, '0'), key), TokenRefusal::malformed);
 }
 
-TEST(SandboxToken, IsNotAuthenticForAnotherPathOrNonceOrUnderARenewedKey) {
+TEST(SandboxToken, IsNotAuthenticForAnotherPathNumberOrNonceOrUnderARenewedKey) {
   const TokenKey key = TokenKey::random();
   const std::string text = tokenFor("/a/b").sealed(key);
   const std::string tag = text.substr(text.rfind(':'));
-  EXPECT_EQ(refusalOf(std::string("docuvend-token:1:rw:/a/c:") + kNonceText + tag, key), TokenRefusal::notAuthentic);
-  EXPECT_EQ(refusalOf("docuvend-token:1:rw:/a/b:100102030405060708090a0b0c0d0e0f" + tag, key), TokenRefusal::notAuthentic);
+  EXPECT_EQ(refusalOf(std::string("docuvend-token:2:rw:7:/a/c:") + kNonceText + tag, key), TokenRefusal::notAuthentic);
+  EXPECT_EQ(refusalOf("docuvend-token:2:rw:7:/a/b:100102030405060708090a0b0c0d0e0f" + tag, key), TokenRefusal::notAuthentic);
+  EXPECT_EQ(refusalOf(std::string("docuvend-token:2:rw:8:/a/b:") + kNonceText + tag, key), TokenRefusal::notAuthentic);
   EXPECT_EQ(refusalOf(text, TokenKey::random()), TokenRefusal::notAuthentic);
 }
 
 TEST(SandboxToken, IsReadStrictlyEvenWhenItIsAuthentic) {
   const TokenKey key = TokenKey::random();
   const std::string nonce = kNonceText;
-  const std::string longest = "/" + std::string(SandboxToken::kMaximumPathLength, 'a');
+  const std::string longest = "/" + std::string(kMaximumTokenPathLength, 'a');
   const std::vector<std::pair<std::string, TokenRefusal>> table = {
-      {"docuvend-token:2:rw:/a:" + nonce, TokenRefusal::unknownVersion},
-      {"docuvend-token:01:rw:/a:" + nonce, TokenRefusal::unknownVersion},
-      {"docuvend-token::rw:/a:" + nonce, TokenRefusal::unknownVersion},
-      {"docuvend-token:1:ro:/a:" + nonce, TokenRefusal::unknownKind},
-      {"docuvend-token:1::/a:" + nonce, TokenRefusal::unknownKind},
-      {"Docuvend-token:1:rw:/a:" + nonce, TokenRefusal::malformed},
-      {"docuvend-token:1:rw:a:" + nonce, TokenRefusal::malformed},
-      {"docuvend-token:1:rw::" + nonce, TokenRefusal::malformed},
-      {"docuvend-token:1:rw:/a b:" + nonce, TokenRefusal::malformed},
-      {"docuvend-token:1:rw:/%:" + nonce, TokenRefusal::malformed},
-      {"docuvend-token:1:rw:/%4:" + nonce, TokenRefusal::malformed},
-      {"docuvend-token:1:rw:/%2G:" + nonce, TokenRefusal::malformed},
-      {"docuvend-token:1:rw:/%00:" + nonce, TokenRefusal::malformed},
-      {"docuvend-token:1:rw:/%41:" + nonce, TokenRefusal::malformed},
-      {"docuvend-token:1:rw:/%c3:" + nonce, TokenRefusal::malformed},
-      {"docuvend-token:1:rw:/\xc3\xa9:" + nonce, TokenRefusal::malformed},
-      {"docuvend-token:1:rw:" + longest + ":" + nonce, TokenRefusal::malformed},
-      {"docuvend-token:1:rw:/a:", TokenRefusal::malformed},
-      {"docuvend-token:1:rw:/a:" + nonce.substr(2), TokenRefusal::malformed},
-      {"docuvend-token:1:rw:/a:" + nonce + "00", TokenRefusal::malformed},
-      {"docuvend-token:1:rw:/a:000102030405060708090A0B0C0D0E0F", TokenRefusal::malformed},
-      {"docuvend-token:1:rw:/a", TokenRefusal::malformed},
-      {"docuvend-token:1:rw:/a:" + nonce + ":", TokenRefusal::malformed},
+      {"docuvend-token:3:rw:7:/a:" + nonce, TokenRefusal::unknownVersion},
+      {"docuvend-token:1:rw:7:/a:" + nonce, TokenRefusal::unknownVersion},
+      {"docuvend-token:1:rw:/a:" + nonce, TokenRefusal::malformed},
+      {"docuvend-token:02:rw:7:/a:" + nonce, TokenRefusal::unknownVersion},
+      {"docuvend-token::rw:7:/a:" + nonce, TokenRefusal::unknownVersion},
+      {"docuvend-token:2:ro:7:/a:" + nonce, TokenRefusal::unknownKind},
+      {"docuvend-token:2::7:/a:" + nonce, TokenRefusal::unknownKind},
+      {"Docuvend-token:2:rw:7:/a:" + nonce, TokenRefusal::malformed},
+      {"docuvend-token:2:rw:0:/a:" + nonce, TokenRefusal::malformed},
+      {"docuvend-token:2:rw:07:/a:" + nonce, TokenRefusal::malformed},
+      {"docuvend-token:2:rw:+7:/a:" + nonce, TokenRefusal::malformed},
+      {"docuvend-token:2:rw:-7:/a:" + nonce, TokenRefusal::malformed},
+      {"docuvend-token:2:rw:7 :/a:" + nonce, TokenRefusal::malformed},
+      {"docuvend-token:2:rw:7a:/a:" + nonce, TokenRefusal::malformed},
+      {"docuvend-token:2:rw::/a:" + nonce, TokenRefusal::malformed},
+      {"docuvend-token:2:rw:1000000000000000000:/a:" + nonce, TokenRefusal::malformed},
+      {"docuvend-token:2:rw:7:a:" + nonce, TokenRefusal::malformed},
+      {"docuvend-token:2:rw:7::" + nonce, TokenRefusal::malformed},
+      {"docuvend-token:2:rw:7:/a b:" + nonce, TokenRefusal::malformed},
+      {"docuvend-token:2:rw:7:/%:" + nonce, TokenRefusal::malformed},
+      {"docuvend-token:2:rw:7:/%4:" + nonce, TokenRefusal::malformed},
+      {"docuvend-token:2:rw:7:/%2G:" + nonce, TokenRefusal::malformed},
+      {"docuvend-token:2:rw:7:/%00:" + nonce, TokenRefusal::malformed},
+      {"docuvend-token:2:rw:7:/%41:" + nonce, TokenRefusal::malformed},
+      {"docuvend-token:2:rw:7:/%c3:" + nonce, TokenRefusal::malformed},
+      {"docuvend-token:2:rw:7:/\xc3\xa9:" + nonce, TokenRefusal::malformed},
+      {"docuvend-token:2:rw:7:" + longest + ":" + nonce, TokenRefusal::malformed},
+      {"docuvend-token:2:rw:7:/a:", TokenRefusal::malformed},
+      {"docuvend-token:2:rw:7:/a:" + nonce.substr(2), TokenRefusal::malformed},
+      {"docuvend-token:2:rw:7:/a:" + nonce + "00", TokenRefusal::malformed},
+      {"docuvend-token:2:rw:7:/a:000102030405060708090A0B0C0D0E0F", TokenRefusal::malformed},
+      {"docuvend-token:2:rw:7:/a", TokenRefusal::malformed},
+      {"docuvend-token:2:rw:7:/a:" + nonce + ":", TokenRefusal::malformed},
       {"", TokenRefusal::malformed},
   };
   for (const auto& [text, refusal] : table) EXPECT_EQ(refusalOf(authentic(key, text), key), refusal) << text;
   // The table's way of making texts makes good ones, too.
-  EXPECT_TRUE(std::holds_alternative<SandboxToken>(SandboxToken::opened(authentic(key, "docuvend-token:1:rw:/a:" + nonce), key)));
+  for (const char* number : {"1", "10", "999999999999999999"}) {
+    const auto opened = SandboxToken::opened(authentic(key, std::string("docuvend-token:2:rw:") + number + ":/a:" + nonce), key);
+    ASSERT_TRUE(std::holds_alternative<SandboxToken>(opened)) << number;
+    EXPECT_EQ(std::to_string(std::get<SandboxToken>(opened).number), number);
+  }
+  EXPECT_TRUE(std::holds_alternative<SandboxToken>(SandboxToken::opened(authentic(key, "docuvend-token:2:rw:7:/a:" + nonce), key)));
 }
 
 TEST(SandboxToken, DiffersFromAnyOtherForTheSameFile) { EXPECT_NE(SandboxToken::freshNonce(), SandboxToken::freshNonce()); }

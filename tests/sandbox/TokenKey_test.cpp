@@ -4,11 +4,10 @@
 #include <sys/stat.h>
 #include <unistd.h>
 
-#include <algorithm>
+#include <cerrno>
 #include <filesystem>
 #include <functional>
 #include <string>
-#include <thread>
 #include <utility>
 #include <vector>
 
@@ -33,7 +32,7 @@ struct TokenKeyFile : ::testing::Test {
 
 TEST_F(TokenKeyFile, IsMadeWithMode600AndFoundAgain) {
   ::umask(0277);
-  const auto first = TokenKey::loadOrCreate(path);
+  const auto first = TokenKey::renew(path);
   ::umask(0);
   ASSERT_TRUE(std::holds_alternative<TokenKey>(first)) << std::get<QXError>(first).description();
   struct stat status {};
@@ -43,29 +42,28 @@ TEST_F(TokenKeyFile, IsMadeWithMode600AndFoundAgain) {
   EXPECT_EQ(status.st_size, static_cast<off_t>(TokenKey::kLength));
   EXPECT_EQ(entries(), 1U);
 
-  const auto second = TokenKey::loadOrCreate(path);
+  const auto second = TokenKey::load(path);
   ASSERT_TRUE(std::holds_alternative<TokenKey>(second));
   EXPECT_TRUE(std::get<TokenKey>(second).verifies("text", std::get<TokenKey>(first).authenticate("text")));
   EXPECT_FALSE(std::get<TokenKey>(second).verifies("texts", std::get<TokenKey>(first).authenticate("text")));
   EXPECT_FALSE(TokenKey::random().verifies("text", std::get<TokenKey>(first).authenticate("text")));
 }
 
-TEST_F(TokenKeyFile, IsTheSameForAllWhoMakeItAtOnce) {
-  for (int round = 0; round < 50; ++round) {
-    std::vector<TokenKey::Tag> tags(4);
-    std::vector<std::thread> starters;
-    for (auto& tag : tags) {
-      starters.emplace_back([this, &tag] {
-        const auto loaded = TokenKey::loadOrCreate(path);
-        if (const auto* mine = std::get_if<TokenKey>(&loaded)) tag = mine->authenticate("text");
-      });
-    }
-    for (auto& starter : starters) starter.join();
-    EXPECT_NE(tags.front(), TokenKey::Tag{});
-    EXPECT_TRUE(std::all_of(tags.begin(), tags.end(), [&tags](const TokenKey::Tag& tag) { return tag == tags.front(); })) << round;
-    EXPECT_EQ(entries(), 1U);
-    ASSERT_EQ(::unlink(path.c_str()), 0);
-  }
+TEST_F(TokenKeyFile, IsReplacedWhenItIsRenewed) {
+  const auto first = TokenKey::renew(path);
+  const auto second = TokenKey::renew(path);
+  const auto loaded = TokenKey::load(path);
+  ASSERT_TRUE(std::holds_alternative<TokenKey>(loaded));
+  EXPECT_TRUE(std::get<TokenKey>(loaded).verifies("text", std::get<TokenKey>(second).authenticate("text")));
+  EXPECT_FALSE(std::get<TokenKey>(loaded).verifies("text", std::get<TokenKey>(first).authenticate("text")));
+  EXPECT_EQ(entries(), 1U);
+}
+
+TEST_F(TokenKeyFile, IsNotThereBeforeItIsMade) {
+  const auto loaded = TokenKey::load(path);
+  ASSERT_TRUE(std::holds_alternative<QXError>(loaded));
+  EXPECT_EQ(std::get<QXError>(loaded).code, ENOENT);
+  EXPECT_EQ(entries(), 0U);
 }
 
 TEST_F(TokenKeyFile, IsRefusedAndLeftAloneWhenItIsNotWhatItShouldBe) {
@@ -100,17 +98,17 @@ TEST_F(TokenKeyFile, IsRefusedAndLeftAloneWhenItIsNotWhatItShouldBe) {
   for (const auto& [name, make] : table) {
     make();
     const auto before = std::filesystem::symlink_status(path);
-    EXPECT_TRUE(std::holds_alternative<QXError>(TokenKey::loadOrCreate(path))) << name;
+    EXPECT_TRUE(std::holds_alternative<QXError>(TokenKey::load(path))) << name;
     EXPECT_EQ(std::filesystem::symlink_status(path), before) << name;
     for (const auto& entry : std::filesystem::directory_iterator(directory.path())) std::filesystem::remove_all(entry.path());
   }
   // And what it should be is accepted.
   makeFile(key, 0600);
-  EXPECT_TRUE(std::holds_alternative<TokenKey>(TokenKey::loadOrCreate(path)));
+  EXPECT_TRUE(std::holds_alternative<TokenKey>(TokenKey::load(path)));
 }
 
 TEST_F(TokenKeyFile, IsAnErrorWhenItsDirectoryIsMissing) {
-  EXPECT_TRUE(std::holds_alternative<QXError>(TokenKey::loadOrCreate(directory.path() + "/missing/token-key")));
+  EXPECT_TRUE(std::holds_alternative<QXError>(TokenKey::renew(directory.path() + "/missing/token-key")));
 }
 
 }  // namespace

@@ -37,6 +37,12 @@ std::string contentsOf(const UniqueDescriptor& file) {
   return {buffer.data(), static_cast<std::size_t>(length)};
 }
 
+mode_t modeOf(const std::string& path) {
+  struct stat status {};
+  EXPECT_EQ(::lstat(path.c_str(), &status), 0) << path;
+  return status.st_mode & 07777U;
+}
+
 bool puts(const UniqueDescriptor& file, const std::string& text) {
   return ::pwrite(file.get(), text.data(), text.size(), 0) == static_cast<ssize_t>(text.size());
 }
@@ -45,7 +51,7 @@ class TokenRedeemerTest : public testing::SandboxHouse {
  protected:
   // A token as the sandbox would have issued it at some time, whatever lies at the path now.
   [[nodiscard]] std::string tokenFor(const std::string& path) const {
-    return SandboxToken{TokenKind::readWrite, path, SandboxToken::freshNonce()}.sealed(key);
+    return SandboxToken{TokenKind::readWrite, TokenFloors().number(), path, SandboxToken::freshNonce()}.sealed(key);
   }
   [[nodiscard]] UniqueDescriptor redeemed(const std::string& token, TokenUse use) const {
     auto result = redeemer.redeem(token, use);
@@ -69,8 +75,9 @@ class TokenRedeemerTest : public testing::SandboxHouse {
   }
 
   const TokenKey key = TokenKey::random();
+  TokenSession session{paths.tokenFloors, key, TokenFloors()};
   GroupContainers containers{bundles};
-  const TokenRedeemer redeemer{key, containers};
+  const TokenRedeemer redeemer{session, containers};
 };
 
 TEST_F(TokenRedeemerTest, OpensForReadingAlone) {
@@ -101,8 +108,8 @@ TEST_F(TokenRedeemerTest, ServesATokenAgainAndAgain) {
 TEST_F(TokenRedeemerTest, RefusesABadToken) {
   const std::string token = tokenFor(document);
   const TokenKey renewed = TokenKey::random();
-  for (const std::string& bad :
-       {std::string(), std::string("x"), token.substr(1), SandboxToken{TokenKind::readWrite, document, {}}.sealed(renewed)}) {
+  for (const std::string& bad : {std::string(), std::string("x"), token.substr(1),
+                                 SandboxToken{TokenKind::readWrite, TokenFloors().number(), document, {}}.sealed(renewed)}) {
     expectError(bad, TokenUse::reading, SandboxErrorCode::badToken, bad);
     expectReplaceError(bad, tokenFor(sibling), SandboxErrorCode::badToken, bad);
     expectReplaceError(token, bad, SandboxErrorCode::badToken, bad);
@@ -192,12 +199,53 @@ TEST_F(TokenRedeemerTest, RenamesTheHiddenSiblingOverItsItem) {
   const auto expected = std::get<ObjectStatus>(statusOf(written.get())).identity;
 
   const auto result = redeemer.replaceItem(tokenFor(document), tokenFor(sibling));
-  ASSERT_TRUE(std::holds_alternative<ObjectIdentity>(result)) << std::get<QXError>(result).description();
-  EXPECT_EQ(std::get<ObjectIdentity>(result), expected);
+  ASSERT_TRUE(std::holds_alternative<ReplacedItem>(result)) << std::get<QXError>(result).description();
+  EXPECT_EQ(std::get<ReplacedItem>(result).identity, expected);
   EXPECT_EQ(read(document), "replaced");
   EXPECT_FALSE(std::filesystem::exists(sibling));
   EXPECT_EQ(contentsOf(before), "contents") << "an open file stays what it was";
   EXPECT_EQ(contentsOf(redeemed(tokenFor(document), TokenUse::reading)), "replaced");
+}
+
+TEST_F(TokenRedeemerTest, GivesTheNewItemThePermissionBitsOfTheOld) {
+  for (const mode_t mode : {0644U, 0600U, 0664U, 0755U, 0400U, 0002U, 04755U}) {
+    ASSERT_EQ(::chmod(document.c_str(), mode), 0);
+    static_cast<void>(redeemed(tokenFor(sibling), TokenUse::writing));
+    const auto result = redeemer.replaceItem(tokenFor(document), tokenFor(sibling));
+    ASSERT_TRUE(std::holds_alternative<ReplacedItem>(result)) << std::get<QXError>(result).description();
+    EXPECT_EQ(modeOf(document), mode & 0777U);
+  }
+}
+
+TEST_F(TokenRedeemerTest, LeavesTheSiblingsModeWhenItCannotBeRenamed) {
+  ASSERT_EQ(::chmod(document.c_str(), 0444), 0);
+  static_cast<void>(redeemed(tokenFor(sibling), TokenUse::writing));
+  ASSERT_EQ(::chmod(storage.c_str(), 0500), 0);
+  expectReplaceError(tokenFor(document), tokenFor(sibling), SandboxErrorCode::notPermitted, "a directory that cannot be written");
+  EXPECT_EQ(modeOf(sibling), 0600U);
+  EXPECT_EQ(read(document), "contents");
+}
+
+TEST_F(TokenRedeemerTest, RefusesTokensThatWereTakenBackAndServesNewOnes) {
+  const std::string item = tokenFor(document);
+  const std::string by = tokenFor(sibling);
+  const UniqueDescriptor open = redeemed(item, TokenUse::writing);
+  ASSERT_EQ(session.takeBack({storage + "/"}), std::nullopt);
+  for (const TokenUse use : {TokenUse::reading, TokenUse::writing}) {
+    expectError(item, use, SandboxErrorCode::badToken, "item");
+    expectError(by, use, SandboxErrorCode::badToken, "sibling");
+  }
+  EXPECT_FALSE(std::filesystem::exists(sibling)) << "nothing is made for an old token";
+  EXPECT_TRUE(puts(open, "CON")) << "an open file stays open";
+
+  const std::string newItem = session.issue(document).value_or("");
+  const std::string newSibling = session.issue(sibling).value_or("");
+  EXPECT_EQ(contentsOf(redeemed(newItem, TokenUse::reading)), "CONtents");
+  static_cast<void>(redeemed(newSibling, TokenUse::writing));
+  expectReplaceError(item, newSibling, SandboxErrorCode::badToken, "old item");
+  expectReplaceError(newItem, by, SandboxErrorCode::badToken, "old sibling");
+  EXPECT_EQ(read(document), "CONtents");
+  EXPECT_TRUE(std::holds_alternative<ReplacedItem>(redeemer.replaceItem(newItem, newSibling)));
 }
 
 TEST_F(TokenRedeemerTest, RenamesNothingButAHiddenSiblingOverItsItem) {

@@ -83,7 +83,7 @@ class WriteQueryTest : public testing::SandboxHouse {
     EXPECT_TRUE(std::holds_alternative<UniqueDescriptor>(result)) << path;
   }
 
-  LinuxSandbox sandbox{TokenKey::random(), keyFile, bundles, peers};
+  LinuxSandbox sandbox{loadedSession(), bundles, peers};
 };
 
 TEST_F(WriteQueryTest, RefusesNobodyAndEveryOtherOperation) {
@@ -116,7 +116,7 @@ TEST_F(WriteQueryTest, NeverLooksTheZeroTokenUp) {
   PeerIdentity self = thisProcess(Standing::unconfined);
   self.pidfd = UniqueDescriptor(static_cast<int>(::syscall(SYS_pidfd_open, self.pid, 0)));
   everybody.peer = std::make_shared<const PeerIdentity>(std::move(self));
-  LinuxSandbox open(TokenKey::random(), keyFile, bundles, everybody);
+  LinuxSandbox open(loadedSession(), bundles, everybody);
   QXAuditToken somebody;
   somebody.bytes[0] = 1;
   EXPECT_EQ(open.mayWrite(somebody, kQXSandboxFileWriteData, document), WriteVerdict::allowedByAccess);

@@ -4,8 +4,9 @@
 
 #include <algorithm>
 #include <cerrno>
+#include <set>
 
-#include "platform/linux/sandbox/SandboxToken.h"
+#include "platform/linux/sandbox/TokenText.h"
 
 namespace docuvend::linux_platform {
 namespace {
@@ -39,7 +40,7 @@ std::variant<std::string, PathRefusal> normalised(const std::string& path) {
     result += '/';
     result += component;
   }
-  if (result.size() > SandboxToken::kMaximumPathLength) return PathRefusal::malformed;
+  if (result.size() > kMaximumTokenPathLength) return PathRefusal::malformed;
   return result;
 }
 
@@ -127,7 +128,7 @@ std::variant<PlacedItem, PathRefusal> GroupContainers::place(const std::string& 
 
   PlacedItem item;
   item.path = root.path + "/" + root.below;
-  if (item.path.size() > SandboxToken::kMaximumPathLength) return PathRefusal::malformed;
+  if (item.path.size() > kMaximumTokenPathLength) return PathRefusal::malformed;
   const auto slash = root.below.rfind('/');
   item.name = slash == std::string::npos ? root.below : root.below.substr(slash + 1);
   auto directory = openBeneath(root.directory.get(), slash == std::string::npos ? "." : root.below.substr(0, slash), Expecting::directory);
@@ -138,6 +139,28 @@ std::variant<PlacedItem, PathRefusal> GroupContainers::place(const std::string& 
   if (const auto* refusal = std::get_if<PathRefusal>(&entry)) return *refusal;
   item.file = std::move(std::get<std::optional<PlacedFile>>(entry));
   return item;
+}
+
+// The container that a file lies in is some directory on the way down, or lies itself below the directory; what is below the container
+// is spelled as it was asked for. So the links of each part of the way are followed once, and the rest is left as it is.
+std::vector<std::string> GroupContainers::spellingsOf(const std::string& directory) {
+  const auto normal = normalised(withoutFinalSlashes(directory));
+  const auto* plain = std::get_if<std::string>(&normal);
+  if (plain == nullptr) return {"/"};
+  std::set<std::string> spellings = {*plain + "/"};
+  const auto addLinkFree = [&spellings](const std::string& way, const std::string& rest) {
+    const auto opened = openDirectory(way);
+    const auto* descriptor = std::get_if<UniqueDescriptor>(&opened);
+    const auto canonical = descriptor == nullptr ? std::nullopt : kernelPath(descriptor->get());
+    if (canonical) spellings.insert(*canonical == "/" ? rest : *canonical + rest);
+  };
+  for (std::size_t end = plain->size(); end != 0; end = plain->rfind('/', end - 1)) {
+    addLinkFree(plain->substr(0, end), plain->substr(end) + "/");
+  }
+  for (const std::string& container : directories()) {
+    if (liesBelow(*plain, container)) addLinkFree(container, "/");
+  }
+  return {spellings.begin(), spellings.end()};
 }
 
 std::variant<std::optional<PlacedFile>, PathRefusal> placeEntry(int directory, const std::string& name) {

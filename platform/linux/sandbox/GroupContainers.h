@@ -52,6 +52,10 @@ class GroupContainers {
 
   [[nodiscard]] std::variant<PlacedItem, PathRefusal> place(const std::string& path);
 
+  // Directories without links, each with a final slash: below one of them lies every path that `place` has given, or may give, for a file
+  // below that directory, whether or not it exists. Everything ("/") when the directory's path is malformed.
+  [[nodiscard]] std::vector<std::string> spellingsOf(const std::string& directory);
+
  private:
   struct Root {
     UniqueDescriptor directory;

@@ -5,7 +5,6 @@
 #include <cerrno>
 
 #include "platform/linux/sandbox/SandboxErrors.h"
-#include "platform/linux/sandbox/SandboxToken.h"
 
 namespace docuvend::linux_platform {
 namespace {
@@ -40,43 +39,30 @@ QXError nobodyError() { return sandboxError(SandboxErrorCode::notPermitted, "the
 }  // namespace
 
 std::variant<std::unique_ptr<LinuxSandbox>, QXError> LinuxSandbox::create(const Paths& paths, BundleRegistry& registry,
-                                                                          PeerDirectory& peers) {
-  auto key = TokenKey::loadOrCreate(paths.tokenKey);
-  if (auto* error = std::get_if<QXError>(&key)) return std::move(*error);
-  return std::make_unique<LinuxSandbox>(std::get<TokenKey>(key), paths.tokenKey, registry, peers);
+                                                                          PeerDirectory& peers, QXLogHandle& log) {
+  auto session = TokenSession::load(paths, log);
+  if (auto* error = std::get_if<QXError>(&session)) return std::move(*error);
+  return std::make_unique<LinuxSandbox>(std::get<std::unique_ptr<TokenSession>>(std::move(session)), registry, peers);
 }
 
-LinuxSandbox::LinuxSandbox(TokenKey key, std::string keyFile, BundleRegistry& registry, PeerDirectory& peers)
-    : keyFile_(std::move(keyFile)),
-      key_(std::move(key)),
+LinuxSandbox::LinuxSandbox(std::unique_ptr<TokenSession> session, BundleRegistry& registry, PeerDirectory& peers)
+    : session_(std::move(session)),
       peers_(peers),
       containers_(registry),
-      redeemer_(key_, containers_),
+      redeemer_(*session_, containers_),
       query_(registry, peers, ledger_) {}
 
 std::optional<std::string> LinuxSandbox::issueReadWriteExtension(const std::string& path) {
-  auto issued = issue(path);
-  if (auto* token = std::get_if<std::string>(&issued)) return std::move(*token);
-  return std::nullopt;
-}
-
-std::variant<std::string, PathRefusal> LinuxSandbox::issue(const std::string& path) {
   const auto place = containers_.place(path);
-  if (const auto* refusal = std::get_if<PathRefusal>(&place)) return *refusal;
-  const std::shared_lock lock(keyMutex_);
-  return SandboxToken{TokenKind::readWrite, std::get<PlacedItem>(place).path, SandboxToken::freshNonce()}.sealed(key_);
+  if (const auto* item = std::get_if<PlacedItem>(&place)) return session_->issue(item->path);
+  return std::nullopt;
 }
 
-// A new key makes the tokens for all files worthless, those below the directory among them.
-std::optional<QXError> LinuxSandbox::invalidateReadWriteExtensions(const std::optional<std::string>& /*directory*/) {
-  const std::lock_guard lock(keyMutex_);
-  auto renewed = TokenKey::renew(keyFile_);
-  if (auto* error = std::get_if<QXError>(&renewed)) {
-    key_ = TokenKey::random();
-    return std::move(*error);
-  }
-  key_ = std::get<TokenKey>(renewed);
-  return std::nullopt;
+std::optional<QXError> LinuxSandbox::invalidateReadWriteExtensions(const std::optional<std::string>& directory) {
+  auto error = session_->takeBack(containers_.spellingsOf(directory.value_or("/")));
+  // Nobody is in the middle of entering what he redeemed with an old token: the cut has waited for that.
+  ledger_.forgetAll();
+  return error;
 }
 
 int LinuxSandbox::checkWithoutReport(const QXAuditToken& token, std::string_view operation, const std::string& path) {
@@ -97,7 +83,6 @@ std::shared_ptr<const PeerIdentity> LinuxSandbox::somebody(const QXAuditToken& c
 std::variant<UniqueDescriptor, QXError> LinuxSandbox::redeem(const QXAuditToken& caller, std::string_view token, TokenUse use) {
   const auto peer = somebody(caller);
   if (!peer) return nobodyError();
-  const std::shared_lock lock(keyMutex_);
   auto redeemed = redeemer_.redeem(token, use);
   if (auto* error = std::get_if<QXError>(&redeemed)) return std::move(*error);
   auto& file = std::get<RedeemedFile>(redeemed);
@@ -108,11 +93,10 @@ std::variant<UniqueDescriptor, QXError> LinuxSandbox::redeem(const QXAuditToken&
 std::optional<QXError> LinuxSandbox::replaceItem(const QXAuditToken& caller, std::string_view itemToken, std::string_view siblingToken) {
   const auto peer = somebody(caller);
   if (!peer) return nobodyError();
-  const std::shared_lock lock(keyMutex_);
   auto replaced = redeemer_.replaceItem(itemToken, siblingToken);
   if (auto* error = std::get_if<QXError>(&replaced)) return std::move(*error);
   // The item is another object now, and the one who put it there may say that it has written it.
-  ledger_.enter(peer->instance, std::get<ObjectIdentity>(replaced));
+  ledger_.enter(peer->instance, std::get<ReplacedItem>(replaced).identity);
   return std::nullopt;
 }
 

@@ -1,11 +1,11 @@
 // What confined processes may open, on Linux: tokens, their redemption, and the write query.
 //
-// Nothing is remembered of a token that was issued; what was redeemed for writing is, for the write query. May be used from any thread.
+// Of a token that was issued nothing is remembered but the number that it may not be below, if some were taken back; what was redeemed for
+// writing is remembered for the write query, until the next time that tokens are taken back. May be used from any thread.
 #pragma once
 
 #include <memory>
 #include <optional>
-#include <shared_mutex>
 #include <string>
 #include <string_view>
 #include <variant>
@@ -13,8 +13,8 @@
 #include "platform/linux/base/Paths.h"
 #include "platform/linux/sandbox/GroupContainers.h"
 #include "platform/linux/sandbox/RedemptionLedger.h"
-#include "platform/linux/sandbox/TokenKey.h"
 #include "platform/linux/sandbox/TokenRedeemer.h"
+#include "platform/linux/sandbox/TokenSession.h"
 #include "platform/linux/sandbox/WriteQuery.h"
 #include "platform/sandbox.h"
 
@@ -22,18 +22,16 @@ namespace docuvend::linux_platform {
 
 class LinuxSandbox final : public QXSandbox {
  public:
-  // With the session's key from `paths.tokenKey`, whose directory exists. The registry and the directory outlive it.
+  // With the session that `paths` has. The registry and the directory outlive it.
   [[nodiscard]] static std::variant<std::unique_ptr<LinuxSandbox>, QXError> create(const Paths& paths, BundleRegistry& registry,
-                                                                                   PeerDirectory& peers);
-  // The key is kept in that file.
-  LinuxSandbox(TokenKey key, std::string keyFile, BundleRegistry& registry, PeerDirectory& peers);
+                                                                                   PeerDirectory& peers, QXLogHandle& log);
+  LinuxSandbox(std::unique_ptr<TokenSession> session, BundleRegistry& registry, PeerDirectory& peers);
 
   std::optional<std::string> issueReadWriteExtension(const std::string& path) override;
   std::optional<QXError> invalidateReadWriteExtensions(const std::optional<std::string>& directory) override;
   int checkWithoutReport(const QXAuditToken& token, std::string_view operation, const std::string& path) override;
 
   // The same, with the reason.
-  [[nodiscard]] std::variant<std::string, PathRefusal> issue(const std::string& path);
   [[nodiscard]] WriteVerdict mayWrite(const QXAuditToken& token, std::string_view operation, const std::string& path) const;
 
   // For the process that the audit token identifies, which must be one of this user's: confined or not, what it brings is what counts.
@@ -43,9 +41,7 @@ class LinuxSandbox final : public QXSandbox {
  private:
   [[nodiscard]] std::shared_ptr<const PeerIdentity> somebody(const QXAuditToken& caller) const;
 
-  const std::string keyFile_;
-  std::shared_mutex keyMutex_;
-  TokenKey key_;  // guarded by keyMutex_
+  const std::unique_ptr<TokenSession> session_;
   PeerDirectory& peers_;
   GroupContainers containers_;
   RedemptionLedger ledger_;

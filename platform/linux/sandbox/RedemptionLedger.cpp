@@ -20,6 +20,11 @@ void RedemptionLedger::enter(const std::string& instance, const ObjectIdentity& 
   objects.push_back(object);
 }
 
+void RedemptionLedger::forgetAll() {
+  const std::lock_guard lock(mutex_);
+  entries_.clear();
+}
+
 bool RedemptionLedger::holds(const std::string& instance, const ObjectIdentity& object) const {
   if (instance.empty()) return false;
   const std::lock_guard lock(mutex_);

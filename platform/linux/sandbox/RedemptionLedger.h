@@ -21,6 +21,7 @@ class RedemptionLedger {
 
   // An empty instance names nobody's launch and is not entered.
   void enter(const std::string& instance, const ObjectIdentity& object);
+  void forgetAll();
   [[nodiscard]] bool holds(const std::string& instance, const ObjectIdentity& object) const;
 
  private:

@@ -12,6 +12,7 @@
 #include <variant>
 
 #include "platform/linux/sandbox/TokenKey.h"
+#include "platform/linux/sandbox/TokenText.h"
 
 namespace docuvend::linux_platform {
 
@@ -22,15 +23,16 @@ enum class TokenRefusal {
   unknownVersion,
   unknownKind,
   notAuthentic,  // changed, made up, or issued under another key
+  takenBack,     // issued before a cut
 };
 
 struct SandboxToken {
-  static constexpr std::size_t kMaximumPathLength = 4095;
-  static constexpr std::size_t kMaximumTextLength = 3 * kMaximumPathLength + 128;
+  static constexpr std::size_t kMaximumTextLength = 3 * kMaximumTokenPathLength + 144;
   static constexpr std::size_t kNonceLength = 16;
   using Nonce = std::array<std::uint8_t, kNonceLength>;
 
   TokenKind kind = TokenKind::readWrite;
+  TokenNumber number = 1;
   std::string path;  // absolute, any bytes but NUL
   Nonce nonce{};     // makes two tokens for one file differ
 

@@ -1,7 +1,7 @@
 // The secret that makes this session's sandbox tokens authentic.
 //
 // Its bytes never leave the object but into the key file: everything else goes through `authenticate` and `verifies`. A new key makes
-// every older token worthless.
+// every older token worthless. Only one process of a user has to do with the file: the one that holds the platform's lock.
 #pragma once
 
 #include <array>
@@ -21,10 +21,11 @@ class TokenKey {
   static constexpr std::size_t kTagLength = 32;
   using Tag = std::array<std::uint8_t, kTagLength>;
 
-  // The key in that file, which is made when it is missing. Two processes that make it at once end with the same key. An error when
-  // the file is not a regular file of this user with mode 600, one link and the length of a key: such a file is never used or mended.
-  [[nodiscard]] static std::variant<TokenKey, QXError> loadOrCreate(const std::string& path);
-  // A new key in the place of whatever lies at that path. After an error the file holds what it held.
+  // The key in that file; ENOENT when there is none. Any other error when the file is not a private one with the length of a key: such a
+  // file is never used.
+  [[nodiscard]] static std::variant<TokenKey, QXError> load(const std::string& path);
+  // A new key in the place of whatever is there, on disk when this returns. After an error the file holds what it held, or a key that
+  // nobody has used.
   [[nodiscard]] static std::variant<TokenKey, QXError> renew(const std::string& path);
   // A key that no file holds.
   [[nodiscard]] static TokenKey random();
@@ -39,9 +40,6 @@ class TokenKey {
 
  private:
   TokenKey() = default;
-
-  [[nodiscard]] static std::variant<TokenKey, QXError> load(const std::string& path);
-  [[nodiscard]] static int create(const std::string& path);
 
   std::array<std::uint8_t, kLength> bytes_{};
 };

@@ -5,6 +5,10 @@
 //
 // A rename has no such form: it takes names. Both names are single components in one directory that is held open, so nothing outside that
 // directory can be meant, and what has the item's name afterwards is compared with the sibling that was examined.
+//
+// A token may be taken back at any moment, too. Whatever comes of it happens within one use of the session, which began before the token
+// was looked at: a cut that the token has not seen yet waits for the use to end. Forcing a sibling's contents to disk takes as long as its
+// writer likes, so that comes before the use.
 
 #include "platform/linux/sandbox/TokenRedeemer.h"
 
@@ -23,6 +27,7 @@ namespace {
 // The sibling vanished or appeared in between that often: somebody does it on purpose.
 constexpr int kCreationTries = 8;
 constexpr mode_t kSiblingMode = 0600;
+constexpr mode_t kPermissionBits = 0777;
 constexpr int kNeverWaiting = O_NONBLOCK | O_NOCTTY | O_CLOEXEC;
 
 int accessMode(TokenUse use) { return use == TokenUse::writing ? O_RDWR : O_RDONLY; }
@@ -33,8 +38,13 @@ std::optional<std::string> itemNameOf(const std::string& siblingName) {
   return siblingName.substr(1);
 }
 
+struct OpenFile {
+  UniqueDescriptor file;
+  ObjectIdentity identity;
+};
+
 // Opens the object itself and makes sure that it is still a regular file with one link.
-std::variant<RedeemedFile, QXError> openPlaced(const PlacedFile& placed, int access) {
+std::variant<OpenFile, QXError> openPlaced(const PlacedFile& placed, int access) {
   UniqueDescriptor file(::open(descriptorPath(placed.path.get()).c_str(), access | kNeverWaiting));
   if (!file) return sandboxErrorFor(SystemFailure{errno}, "the file cannot be opened");
   const auto examined = statusOf(file.get());
@@ -47,13 +57,13 @@ std::variant<RedeemedFile, QXError> openPlaced(const PlacedFile& placed, int acc
   if (flags < 0 || ::fcntl(file.get(), F_SETFL, flags & ~O_NONBLOCK) != 0) {
     return sandboxErrorFor(SystemFailure{errno}, "the file cannot be made blocking");
   }
-  return RedeemedFile{std::move(file), placed.identity};
+  return OpenFile{std::move(file), placed.identity};
 }
 
 struct NameTaken {};
 
 // Makes the missing sibling, unless something has its name by now.
-std::variant<RedeemedFile, NameTaken, QXError> createSibling(const PlacedItem& sibling) {
+std::variant<OpenFile, NameTaken, QXError> createSibling(const PlacedItem& sibling) {
   UniqueDescriptor file(
       ::openat(sibling.directory.get(), sibling.name.c_str(), O_RDWR | O_CREAT | O_EXCL | O_NOFOLLOW | O_NOCTTY | O_CLOEXEC, kSiblingMode));
   if (!file) {
@@ -63,7 +73,7 @@ std::variant<RedeemedFile, NameTaken, QXError> createSibling(const PlacedItem& s
   const auto examined = statusOf(file.get());
   if (const auto* failure = std::get_if<SystemFailure>(&examined))
     return sandboxErrorFor(*failure, "the hidden sibling cannot be examined");
-  return RedeemedFile{std::move(file), std::get<ObjectStatus>(examined).identity};
+  return OpenFile{std::move(file), std::get<ObjectStatus>(examined).identity};
 }
 
 bool itemOfSiblingExists(const PlacedItem& sibling) {
@@ -85,33 +95,63 @@ std::optional<QXError> flushDirectory(int directory) {
   return flush(readable.get(), "the directory cannot be written");
 }
 
+// Renames the open sibling over the item, which gives it the item's permission bits.
+std::optional<QXError> renameOver(const PlacedItem& item, const std::string& siblingName, int sibling) {
+  const auto itemStatus = statusOf(item.file->path.get());
+  const auto siblingStatus = statusOf(sibling);
+  for (const auto* status : {&itemStatus, &siblingStatus}) {
+    if (const auto* failure = std::get_if<SystemFailure>(status)) return sandboxErrorFor(*failure, "the files cannot be examined");
+  }
+  if (::fchmod(sibling, std::get<ObjectStatus>(itemStatus).mode & kPermissionBits) != 0) {
+    return sandboxErrorFor(SystemFailure{errno}, "the hidden sibling cannot be given the item's mode");
+  }
+  if (::renameat(item.directory.get(), siblingName.c_str(), item.directory.get(), item.name.c_str()) == 0) return std::nullopt;
+  const SystemFailure failure{errno};
+  // It is still the hidden sibling, and the next one to write it needs the mode that it had.
+  static_cast<void>(::fchmod(sibling, std::get<ObjectStatus>(siblingStatus).mode & kPermissionBits));
+  return sandboxErrorFor(failure, "the hidden sibling cannot be renamed");
+}
+
 QXError goneError() { return sandboxError(SandboxErrorCode::gone, "the file does not exist"); }
 
 }  // namespace
 
-std::variant<PlacedItem, QXError> TokenRedeemer::placed(std::string_view text) const {
-  const auto opened = SandboxToken::opened(text, key_);
-  if (std::holds_alternative<TokenRefusal>(opened)) return sandboxError(SandboxErrorCode::badToken, "the token is not valid");
-  auto place = containers_.place(std::get<SandboxToken>(opened).path);
+std::variant<std::string, QXError> TokenRedeemer::pathOf(std::string_view token) const {
+  auto opened = session_.opened(token);
+  if (auto* good = std::get_if<SandboxToken>(&opened)) return std::move(good->path);
+  const bool takenBack = std::get<TokenRefusal>(opened) == TokenRefusal::takenBack;
+  return sandboxError(SandboxErrorCode::badToken, takenBack ? "the token was taken back" : "the token is not valid");
+}
+
+std::variant<PlacedItem, QXError> TokenRedeemer::placed(std::string_view token) const {
+  auto path = pathOf(token);
+  if (auto* error = std::get_if<QXError>(&path)) return std::move(*error);
+  auto place = containers_.place(std::get<std::string>(path));
   if (const auto* refusal = std::get_if<PathRefusal>(&place)) return sandboxErrorFor(*refusal);
   return std::move(std::get<PlacedItem>(place));
 }
 
-std::variant<RedeemedFile, QXError> TokenRedeemer::redeem(std::string_view token, TokenUse use) const {
+std::variant<RedeemedFile, QXError> TokenRedeemer::redeem(std::string_view token, TokenUse tokenUse) const {
   for (int attempt = 0; attempt < kCreationTries; ++attempt) {
+    auto use = session_.beginUse();
     auto place = placed(token);
     if (auto* error = std::get_if<QXError>(&place)) return std::move(*error);
     const auto& item = std::get<PlacedItem>(place);
-    if (item.file) return openPlaced(*item.file, accessMode(use));
-    if (use != TokenUse::writing || !itemOfSiblingExists(item)) return goneError();
+    if (item.file) {
+      auto opened = openPlaced(*item.file, accessMode(tokenUse));
+      if (auto* error = std::get_if<QXError>(&opened)) return std::move(*error);
+      auto& [file, identity] = std::get<OpenFile>(opened);
+      return RedeemedFile{std::move(file), identity, std::move(use)};
+    }
+    if (tokenUse != TokenUse::writing || !itemOfSiblingExists(item)) return goneError();
     auto created = createSibling(item);
     if (auto* error = std::get_if<QXError>(&created)) return std::move(*error);
-    if (auto* file = std::get_if<RedeemedFile>(&created)) return std::move(*file);
+    if (auto* made = std::get_if<OpenFile>(&created)) return RedeemedFile{std::move(made->file), made->identity, std::move(use)};
   }
   return sandboxErrorFor(PathRefusal::unsteady);
 }
 
-std::variant<ObjectIdentity, QXError> TokenRedeemer::replaceItem(std::string_view itemToken, std::string_view siblingToken) const {
+std::variant<ReplacedItem, QXError> TokenRedeemer::replaceItem(std::string_view itemToken, std::string_view siblingToken) const {
   auto itemPlace = placed(itemToken);
   if (auto* error = std::get_if<QXError>(&itemPlace)) return std::move(*error);
   auto siblingPlace = placed(siblingToken);
@@ -132,17 +172,23 @@ std::variant<ObjectIdentity, QXError> TokenRedeemer::replaceItem(std::string_vie
 
   auto opened = openPlaced(*source, O_RDONLY);
   if (auto* error = std::get_if<QXError>(&opened)) return std::move(*error);
-  if (auto error = flush(std::get<RedeemedFile>(opened).file.get(), "the hidden sibling cannot be written")) return *error;
-  if (::renameat(item.directory.get(), sibling.name.c_str(), item.directory.get(), item.name.c_str()) != 0) {
-    return sandboxErrorFor(SystemFailure{errno}, "the hidden sibling cannot be renamed");
+  const int file = std::get<OpenFile>(opened).file.get();
+  if (auto error = flush(file, "the hidden sibling cannot be written")) return *std::move(error);
+
+  auto use = session_.beginUse();
+  for (const std::string_view token : {itemToken, siblingToken}) {
+    auto path = pathOf(token);
+    if (auto* error = std::get_if<QXError>(&path)) return std::move(*error);
   }
-  if (auto error = flushDirectory(item.directory.get())) return *error;
+  if (auto error = renameOver(item, sibling.name, file)) return *std::move(error);
+  if (auto error = flush(file, "the item's mode cannot be written")) return *std::move(error);
+  if (auto error = flushDirectory(item.directory.get())) return *std::move(error);
 
   auto after = placeEntry(item.directory.get(), item.name);
   if (const auto* refusal = std::get_if<PathRefusal>(&after)) return sandboxErrorFor(*refusal);
   const auto& now = std::get<std::optional<PlacedFile>>(after);
   if (!now || now->identity != source->identity) return sandboxError(SandboxErrorCode::gone, "the item was exchanged meanwhile");
-  return source->identity;
+  return ReplacedItem{source->identity, std::move(use)};
 }
 
 }  // namespace docuvend::linux_platform

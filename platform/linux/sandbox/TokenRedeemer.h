@@ -8,7 +8,7 @@
 
 #include "platform/linux/sandbox/GroupContainers.h"
 #include "platform/linux/sandbox/SandboxErrors.h"
-#include "platform/linux/sandbox/SandboxToken.h"
+#include "platform/linux/sandbox/TokenSession.h"
 
 namespace docuvend::linux_platform {
 
@@ -17,22 +17,29 @@ enum class TokenUse { reading, writing };
 struct RedeemedFile {
   UniqueDescriptor file;  // open for reading, or for reading and writing; blocking
   ObjectIdentity identity;
+  UsesInFlight::Use use;  // a cut waits for whoever holds it
+};
+
+struct ReplacedItem {
+  ObjectIdentity identity;  // what is the item now
+  UsesInFlight::Use use;
 };
 
 class TokenRedeemer {
  public:
   // Both outlive it.
-  TokenRedeemer(const TokenKey& key, GroupContainers& containers) : key_(key), containers_(containers) {}
+  TokenRedeemer(TokenSession& session, GroupContainers& containers) : session_(session), containers_(containers) {}
 
-  [[nodiscard]] std::variant<RedeemedFile, QXError> redeem(std::string_view token, TokenUse use) const;
+  [[nodiscard]] std::variant<RedeemedFile, QXError> redeem(std::string_view token, TokenUse tokenUse) const;
 
-  // What is the item now.
-  [[nodiscard]] std::variant<ObjectIdentity, QXError> replaceItem(std::string_view itemToken, std::string_view siblingToken) const;
+  // The item's new file has the permission bits of the old one.
+  [[nodiscard]] std::variant<ReplacedItem, QXError> replaceItem(std::string_view itemToken, std::string_view siblingToken) const;
 
  private:
+  [[nodiscard]] std::variant<std::string, QXError> pathOf(std::string_view token) const;
   [[nodiscard]] std::variant<PlacedItem, QXError> placed(std::string_view token) const;
 
-  const TokenKey& key_;
+  TokenSession& session_;
   GroupContainers& containers_;
 };
 

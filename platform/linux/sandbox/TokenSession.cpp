@@ -1,0 +1,131 @@
+// A cut has three steps, and their order is what makes it one. The floors rise in memory: from then on no old token passes. Uses
+// that had passed before are waited for: whoever opens or renames after that has passed the new floors. At last the floors are written.
+//
+// The number of new tokens follows the file, not the memory: it is raised when the floors that belong to it are on disk. So the file's
+// number is never less than that of any token, and a cut that got lost with a crash or on a full disk leaves no token behind
+// whose number a later cut would give out again. Until the file is written, nothing is issued below the directories that were cut.
+//
+// Floors are only as good as their memory. A file that is missing, damaged, cut short, another's or of another version would bring
+// tokens back that had been taken, so its body is authenticated with the session's key, and where it does not hold the key goes with it.
+
+#include "platform/linux/sandbox/TokenSession.h"
+
+#include <cerrno>
+
+#include "platform/linux/sandbox/PrivateFile.h"
+
+namespace docuvend::linux_platform {
+namespace {
+
+constexpr std::string_view kTag = "tag:";
+constexpr int kIssueTries = 8;  // each costs a cut that came in between
+
+std::string sealed(const TokenFloors& floors, const TokenKey& key) {
+  std::string text = floors.printed();
+  const TokenKey::Tag tag = key.authenticate(text);
+  text += kTag;
+  appendHex(text, tag);
+  return text += '\n';
+}
+
+std::optional<TokenFloors> opened(std::string_view text, const TokenKey& key) {
+  constexpr std::size_t kTagLineLength = kTag.size() + 2 * TokenKey::kTagLength + 1;
+  if (text.size() < kTagLineLength || !text.ends_with('\n')) return std::nullopt;
+  const std::string_view body = text.substr(0, text.size() - kTagLineLength);
+  const std::string_view tagLine = text.substr(body.size(), kTagLineLength - 1);
+  TokenKey::Tag tag{};
+  if (!tagLine.starts_with(kTag) || !readHex(tagLine.substr(kTag.size()), tag) || !key.verifies(body, tag)) return std::nullopt;
+  return TokenFloors::parsed(body);
+}
+
+std::optional<QXError> saveFloors(const std::string& path, const TokenFloors& floors, const TokenKey& key) {
+  return writePrivateFile(path, sealed(floors, key));
+}
+
+std::variant<TokenFloors, QXError> loadFloors(const std::string& path, const TokenKey& key) {
+  const auto read = readPrivateFile(path, TokenFloors::kMaximumTextLength);
+  if (const auto* error = std::get_if<QXError>(&read)) return *error;
+  auto floors = opened(std::get<std::string>(read), key);
+  if (!floors) return QXError::system(EINVAL, path + " is damaged, of another key or of another version");
+  return *std::move(floors);
+}
+
+}  // namespace
+
+std::variant<std::unique_ptr<TokenSession>, QXError> TokenSession::load(const Paths& paths, QXLogHandle& log) {
+  auto key = TokenKey::load(paths.tokenKey);
+  if (const auto* error = std::get_if<QXError>(&key)) {
+    if (error->code != ENOENT) return *error;
+  } else {
+    auto floors = loadFloors(paths.tokenFloors, std::get<TokenKey>(key));
+    if (auto* known = std::get_if<TokenFloors>(&floors)) {
+      return std::make_unique<TokenSession>(paths.tokenFloors, std::get<TokenKey>(key), std::move(*known));
+    }
+    log.write(QXLogType::defaultType,
+              "[NOTICE] No sandbox token issued until now is good any more: " + std::get<QXError>(floors).description());
+  }
+  // The key first: what was issued under the old one is worthless from here, whatever becomes of the floors.
+  key = TokenKey::renew(paths.tokenKey);
+  if (const auto* error = std::get_if<QXError>(&key)) return *error;
+  if (auto error = saveFloors(paths.tokenFloors, TokenFloors(), std::get<TokenKey>(key))) return *std::move(error);
+  return std::make_unique<TokenSession>(paths.tokenFloors, std::get<TokenKey>(key), TokenFloors());
+}
+
+TokenSession::TokenSession(std::string floorsFile, TokenKey key, TokenFloors floors)
+    : floorsFile_(std::move(floorsFile)), key_(std::move(key)), floors_(std::move(floors)), numberOnDisk_(floors_.number()) {}
+
+// The number that a new token for the path may have: a good one that is on disk.
+std::optional<TokenNumber> TokenSession::issuableNumber(const std::string& path) {
+  for (int attempt = 0; attempt < kIssueTries; ++attempt) {
+    {
+      const std::lock_guard lock(mutex_);
+      if (floors_.isGood(path, numberOnDisk_)) return numberOnDisk_;
+    }
+    if (save()) break;
+  }
+  return std::nullopt;
+}
+
+std::optional<std::string> TokenSession::issue(const std::string& path) {
+  const auto number = issuableNumber(path);
+  if (!number) return std::nullopt;
+  SandboxToken token;
+  token.number = *number;
+  token.path = path;
+  token.nonce = SandboxToken::freshNonce();
+  return token.sealed(key_);
+}
+
+std::variant<SandboxToken, TokenRefusal> TokenSession::opened(std::string_view text) const {
+  auto read = SandboxToken::opened(text, key_);
+  const auto* token = std::get_if<SandboxToken>(&read);
+  if (token == nullptr) return read;
+  const std::lock_guard lock(mutex_);
+  if (!floors_.isGood(token->path, token->number)) return TokenRefusal::takenBack;
+  return read;
+}
+
+std::optional<QXError> TokenSession::takeBack(const std::vector<std::string>& directories) {
+  {
+    const std::lock_guard lock(mutex_);
+    for (const std::string& directory : directories) floors_.raise(directory);
+  }
+  uses_.waitForEarlier();
+  return save();
+}
+
+std::optional<QXError> TokenSession::save() {
+  const std::lock_guard oneAtATime(fileMutex_);
+  TokenFloors floors;
+  {
+    const std::lock_guard lock(mutex_);
+    if (floors_.number() == numberOnDisk_) return std::nullopt;
+    floors = floors_;
+  }
+  if (auto error = saveFloors(floorsFile_, floors, key_)) return error;
+  const std::lock_guard lock(mutex_);
+  numberOnDisk_ = floors.number();
+  return std::nullopt;
+}
+
+}  // namespace docuvend::linux_platform
