@@ -63,6 +63,33 @@ TEST_F(AnswerDeadlinesTest, TheTimerIsSetAgainForTheOldestThatIsLeft) {
   EXPECT_EQ(deadlines.timerFired(*verdict.setTimer).overdue, "b");
 }
 
+TEST_F(AnswerDeadlinesTest, WhenThisProcessDidNotRunNobodyIsBlamedBeforeAnotherLimit) {
+  const auto sent = deadlines.sent("a", now);
+  (void)deadlines.sent("b", now + kOne);
+  const auto late = *sent.setTimer + AnswerDeadlines::kFarTooLate;
+  const auto excused = deadlines.timerFired(late);
+  EXPECT_FALSE(excused.overdue);
+  ASSERT_EQ(excused.setTimer, late + kLimit);
+  EXPECT_EQ(deadlines.timerFired(*excused.setTimer).overdue, "a");
+}
+
+TEST_F(AnswerDeadlinesTest, WhatIsExcusedKeepsItsOrder) {
+  const auto first = deadlines.sent("a", now);
+  (void)deadlines.sent("b", now + 2 * kOne);
+  const auto excused = deadlines.timerFired(*first.setTimer + AnswerDeadlines::kFarTooLate);
+  ASSERT_TRUE(excused.setTimer);
+  deadlines.answered(first.message);
+  (void)deadlines.sent("c", *excused.setTimer - kLimit + kOne);
+  const auto next = deadlines.timerFired(*excused.setTimer);
+  EXPECT_EQ(next.setTimer, *excused.setTimer + 2 * kOne);
+  EXPECT_EQ(deadlines.timerFired(*next.setTimer).overdue, "b");
+}
+
+TEST_F(AnswerDeadlinesTest, ATimerThatIsALittleLateExcusesNobody) {
+  const auto sent = deadlines.sent("a", now);
+  EXPECT_EQ(deadlines.timerFired(*sent.setTimer + AnswerDeadlines::kFarTooLate - kOne).overdue, "a");
+}
+
 TEST_F(AnswerDeadlinesTest, AnAnswerMayComeTwice) {
   const auto first = deadlines.sent("a", now);
   const auto second = deadlines.sent("b", now);

@@ -35,9 +35,6 @@ class LinuxExtensionHostTest : public ::testing::Test {
     result.answerLimit = answerLimit;
     return result;
   }
-  static void release(const RealExtensions& real, const std::string& identifier = "com.orvane.test") {
-    std::ofstream(real.home() + "/containers/" + identifier + "/release") << "now";
-  }
 };
 
 bool isOfKind(const std::optional<QXError>& error, ExtensionHostErrorCode code) {
@@ -302,7 +299,7 @@ TEST_F(LinuxExtensionHostTest, StartingToProvideHasNoTimeLimitAndDelaysNoIdentif
   const auto hung = await(Conversation(set[1]).identify("hang"));
   ASSERT_TRUE(hung && hung->error);
   EXPECT_EQ(slow.identifier("process"), process);
-  release(real, "com.orvane.a");
+  real.release("com.orvane.a");
   const auto answer = await(std::move(started));
   ASSERT_TRUE(answer);
   ASSERT_FALSE(answer->error) << answer->error->description();

@@ -23,18 +23,21 @@ AnswerDeadlines::Sent AnswerDeadlines::sent(std::string operationName, Time now)
   Sent result{++last_, std::nullopt};
   const Time due = now + limit_;
   due_.emplace(result.message, Due{std::move(operationName), due});
-  if (!timerIsSet_) result.setTimer = due;
-  timerIsSet_ = true;
+  if (!timer_) result.setTimer = timer_ = due;
   return result;
 }
 
 AnswerDeadlines::Verdict AnswerDeadlines::timerFired(Time now) {
-  timerIsSet_ = false;
+  const std::optional<Time> wasSetFor = std::exchange(timer_, std::nullopt);
   if (due_.empty()) return {};
   const Due& oldest = due_.begin()->second;
+  if (oldest.time <= now && wasSetFor && now - *wasSetFor >= kFarTooLate) {
+    const auto delay = now + limit_ - oldest.time;
+    for (auto& [message, due] : due_) due.time += delay;
+  }
   if (oldest.time <= now) return {oldest.operationName, std::nullopt};
-  timerIsSet_ = true;
-  return {std::nullopt, oldest.time};
+  timer_ = oldest.time;
+  return {std::nullopt, timer_};
 }
 
 }  // namespace docuvend::linux_platform

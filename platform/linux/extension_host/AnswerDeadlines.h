@@ -3,6 +3,9 @@
 // A value without clock or lock. All limited answers have the same limit, so the oldest message is always due first, and one timer for all
 // is enough: it is set when a message is sent while it is not set, and looks around when it fires. Most messages are answered long before
 // and cost no timer call.
+//
+// A timer that fires far too late tells that this process has not run meanwhile: it was stopped, or the machine was busy. Then the answers
+// may lie here unread, and nobody is blamed before another limit has passed.
 #pragma once
 
 #include <chrono>
@@ -31,6 +34,9 @@ class AnswerDeadlines {
   [[nodiscard]] Sent sent(std::string operationName, Time now);
   void answered(Message message) { due_.erase(message); }
 
+  // By which a timer that fires is far too late.
+  static constexpr std::chrono::milliseconds kFarTooLate{1'000};
+
   struct Verdict {
     std::optional<std::string> overdue;  // the operation that was not answered in time
     std::optional<Time> setTimer;        // when nothing is overdue but something is due later
@@ -46,7 +52,7 @@ class AnswerDeadlines {
   std::chrono::milliseconds limit_;
   Message last_ = 0;
   std::map<Message, Due> due_;  // in the order of sending, so in the order of time
-  bool timerIsSet_ = false;
+  std::optional<Time> timer_;   // what it is set for
 };
 
 }  // namespace docuvend::linux_platform

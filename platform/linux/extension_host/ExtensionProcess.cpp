@@ -49,8 +49,9 @@ class ExtensionProcess::Proxy : public QXRpcProxy {
         plain_(endpoint_->remoteObjectProxy(errorHandler_)) {}
 
   void send(const QXRpcOperation& operation, QXArray arguments, QXRpcReply reply) override {
-    const auto process = hasLimitedAnswer(operation.name) && reply ? process_.lock() : nullptr;
-    if (!process) {
+    const auto process = reply ? process_.lock() : nullptr;
+    if (process) process->watchLiveness();
+    if (!process || !hasLimitedAnswer(operation.name)) {
       plain_->send(operation, std::move(arguments), std::move(reply));
       return;
     }
@@ -101,6 +102,9 @@ std::shared_ptr<ExtensionProcess> ExtensionProcess::create(Ends ends, const std:
   });
   process->answerTimer_ = std::make_unique<Timer>(reactor, [weak] {
     if (const auto strongSelf = weak.lock()) strongSelf->lookForOverdueAnswers();
+  });
+  process->livenessTimer_ = std::make_unique<Timer>(reactor, [weak] {
+    if (const auto strongSelf = weak.lock()) strongSelf->askForSignOfLife();
   });
   {
     const std::lock_guard lock(process->eventMutex_);
@@ -216,6 +220,25 @@ void ExtensionProcess::lookForOverdueAnswers() {
   note(QXLogType::defaultType, what);
   handlers_.onLost(ProcessLifetime::Cause::notAnswering);
   closeAndKill(extensionHostError(ExtensionHostErrorCode::notAnswering, "The process of " + identifier_ + " " + what + "."));
+}
+
+void ExtensionProcess::watchLiveness() {
+  if (!livenessTimerIsSet_.exchange(true)) livenessTimer_->setFor(Clock::now() + times_.livenessInterval);
+}
+
+// The timer counts as not set before it is known whether anything is expected: what comes after the look sets it.
+void ExtensionProcess::askForSignOfLife() {
+  livenessTimerIsSet_ = false;
+  if (!handlers_.hasRequests() && !endpoint_->awaitsAnswers()) return;
+  watchLiveness();
+  if (pingIsUnanswered_.exchange(true)) return;
+  const AnswerDeadlines::Message message = expectAnswer("a ping");
+  endpoint_->ping([weak = weak_from_this(), message] {
+    const auto strongSelf = weak.lock();
+    if (!strongSelf) return;
+    strongSelf->gotAnswer(message);
+    strongSelf->pingIsUnanswered_ = false;
+  });
 }
 
 void ExtensionProcess::closeAndKill(const QXError& why) {

@@ -1,9 +1,12 @@
 // A running process of an extension, from its spawning to its reaping.
 //
 // Its connection is that of all its requests. When the connection is over for any reason, messages that wait for an answer fail and the
-// process is ended; when an answer that must be quick is overdue, the same. The handlers run on threads of the reactor, one at a time.
+// process is ended; when an answer that must be quick is overdue, the same. As long as something is expected of it (it has requests, or a
+// message waits for its answer) the process is asked for signs of life, which must be quick too: the thread that reads its connection gives
+// them, so they tell a process that hangs from one that works. The handlers run on threads of the reactor, one at a time.
 #pragma once
 
+#include <atomic>
 #include <functional>
 #include <memory>
 #include <mutex>
@@ -32,6 +35,8 @@ class ExtensionProcess : public std::enable_shared_from_this<ExtensionProcess> {
     std::function<void(ProcessLifetime::Cause)> onLost;
     // The process is gone. Once, after onLost.
     std::function<void()> onGone;
+    // Asked from time to time.
+    std::function<bool()> hasRequests;
   };
   struct Ends {
     SpawnedProcess process;
@@ -56,6 +61,9 @@ class ExtensionProcess : public std::enable_shared_from_this<ExtensionProcess> {
   // Looks whether the connection is over. Messages are told of that before anybody else is, so whoever tries again at once must look.
   void noticeEnd();
 
+  // A request has begun: sees to it that the process is asked for signs of life.
+  void watchLiveness();
+
   [[nodiscard]] int number() const { return process_.number; }
   // A proxy of the connection that watches over the answers which must be quick.
   [[nodiscard]] std::shared_ptr<QXRpcProxy> remoteObjectProxy(QXErrorHandler errorHandler);
@@ -71,6 +79,7 @@ class ExtensionProcess : public std::enable_shared_from_this<ExtensionProcess> {
   [[nodiscard]] bool reap();
   void graceIsOver();
   void lookForOverdueAnswers();
+  void askForSignOfLife();
   // With the event lock.
   void closeAndKill(const QXError& why);
   [[nodiscard]] AnswerDeadlines::Message expectAnswer(const std::string& operationName);
@@ -88,6 +97,10 @@ class ExtensionProcess : public std::enable_shared_from_this<ExtensionProcess> {
   std::unique_ptr<OutputLog> output_;
   std::unique_ptr<Timer> graceTimer_;
   std::unique_ptr<Timer> answerTimer_;
+  std::unique_ptr<Timer> livenessTimer_;
+
+  std::atomic<bool> livenessTimerIsSet_ = false;
+  std::atomic<bool> pingIsUnanswered_ = false;
 
   std::mutex deadlinesMutex_;  // guards the deadlines and nothing else; nothing is called with it
   AnswerDeadlines deadlines_;

@@ -10,8 +10,10 @@ struct ExtensionTimes {
 
   // A process without requests is kept this long for the next one.
   Duration linger{30'000};
-  // An answer that must be quick (initial setup, identifier, URL) and takes longer ends the process.
+  // An answer that must be quick (initial setup, identifier, URL, a sign of life) and takes longer ends the process.
   Duration answerLimit{10'000};
+  // A process of which something is expected is asked for a sign of life this often.
+  Duration livenessInterval{10'000};
   // After its connection was closed, a process has this long to end by itself, and again after it was asked to by signal.
   Duration endGrace{2'000};
   // A process that is gone sooner than this after its start died quickly.

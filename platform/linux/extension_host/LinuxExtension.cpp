@@ -83,9 +83,11 @@ void LinuxExtension::beginExtensionRequest(BeginCompletion completion) {
   const QXUUID request = freshUUID();
   ProcessLifetime::Begin begin{};
   std::optional<QXError> refusal;
+  std::shared_ptr<ExtensionProcess> joined;
   {
     const std::lock_guard lock(mutex_);
     begin = isStopped_ ? ProcessLifetime::Begin::refuse : lifetime_.begin(request, Clock::now());
+    if (begin == ProcessLifetime::Begin::join) joined = process_;
     if (begin == ProcessLifetime::Begin::refuse) refusal = isStopped_ ? hostIsStopping() : backingOffError();
     if (begin == ProcessLifetime::Begin::start || begin == ProcessLifetime::Begin::wait) {
       waiting_.push_back({request, std::move(completion)});
@@ -98,6 +100,7 @@ void LinuxExtension::beginExtensionRequest(BeginCompletion completion) {
     case ProcessLifetime::Begin::wait:
       break;
     case ProcessLifetime::Begin::join:
+      if (joined) joined->watchLiveness();
       completion(request, /*error=*/std::nullopt);
       break;
     case ProcessLifetime::Begin::refuse:
@@ -200,6 +203,10 @@ std::variant<std::shared_ptr<ExtensionProcess>, QXError> LinuxExtension::makePro
   handlers.onGone = [weak = weak_from_this()] {
     if (const auto strongSelf = weak.lock()) strongSelf->processIsGone();
   };
+  handlers.hasRequests = [weak = weak_from_this()] {
+    const auto strongSelf = weak.lock();
+    return strongSelf && strongSelf->hasRequests();
+  };
   auto process =
       ExtensionProcess::create({std::move(std::get<SpawnedProcess>(spawned)), std::move(ourSocket), std::move(ourPipe)}, bundle_.identifier,
                                contextClass_.hostInterface, services_->times, services_->reactor, services_->log, std::move(handlers));
@@ -219,6 +226,7 @@ void LinuxExtension::didStart(std::shared_ptr<ExtensionProcess> process) {
   }
   process->resume();
   if (isTooLate) process->endAtOnce();
+  process->watchLiveness();
   for (const Waiting& waiting : ready) waiting.completion(waiting.request, /*error=*/std::nullopt);
 }
 
@@ -230,6 +238,11 @@ void LinuxExtension::didNotStart(const QXError& why) {
     failed.swap(waiting_);
   }
   for (const Waiting& waiting : failed) waiting.completion(/*request=*/std::nullopt, why);
+}
+
+bool LinuxExtension::hasRequests() const {
+  const std::lock_guard lock(mutex_);
+  return lifetime_.requests() > 0;
 }
 
 void LinuxExtension::processIsLost(ProcessLifetime::Cause cause) {

@@ -78,6 +78,7 @@ class LinuxExtension : public QXExtension, public std::enable_shared_from_this<L
   [[nodiscard]] std::variant<std::shared_ptr<ExtensionProcess>, QXError> makeProcess();
   void didStart(std::shared_ptr<ExtensionProcess> process);
   void didNotStart(const QXError& why);
+  [[nodiscard]] bool hasRequests() const;
   void processIsLost(ProcessLifetime::Cause cause);
   void processIsGone();
   void endWhenIdleForLong();

@@ -9,17 +9,23 @@
 //                       leave        _exit(7)
 //                       wait         answers when the file "release" lies in its container
 //                       stay         lets the process outlive its connection
+//                       suspend      stops the process as a whole
+//                       spin         keeps the thread busy that reads the connection
 //                       anything     succeeds
 //   itemURL             the URL of a file of that name in its container
 #include <fcntl.h>
+#include <signal.h>
 #include <sys/random.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <chrono>
 #include <cstdio>
 #include <cstdlib>
+#include <filesystem>
 #include <string>
 #include <thread>
+#include <vector>
 
 #include "sdk/Provider.h"
 
@@ -46,6 +52,18 @@ std::string randomText() {
   for (;;) pause();
 }
 
+// The library makes the thread that reads before all others.
+void spinReader() {
+  std::vector<pid_t> threads;
+  for (const auto& entry : std::filesystem::directory_iterator("/proc/self/task")) threads.push_back(std::stoi(entry.path().filename()));
+  std::sort(threads.begin(), threads.end());
+  signal(SIGUSR1, [](int) {
+    for (volatile bool isOn = true; isOn;) {
+    }
+  });
+  if (tgkill(getpid(), threads.at(1), SIGUSR1) != 0) std::abort();
+}
+
 class TestProvider : public Provider {
  public:
   [[nodiscard]] Failure performInitialSetup() override { return std::nullopt; }
@@ -56,6 +74,8 @@ class TestProvider : public Provider {
     if (what == "crash") std::abort();
     if (what == "leave") _exit(7);
     if (what == "stay") std::atexit([] { waitForever(); });
+    if (what == "suspend") raise(SIGSTOP);
+    if (what == "spin") spinReader();
     while (what == "wait" && access("release", F_OK) != 0) std::this_thread::sleep_for(std::chrono::milliseconds(1));
     return std::nullopt;
   }

@@ -5,6 +5,7 @@
 
 #include <cstdlib>
 #include <filesystem>
+#include <fstream>
 #include <stdexcept>
 #include <thread>
 #include <utility>
@@ -116,6 +117,10 @@ Reports::Set RealExtensions::extensions(std::vector<Bundle> bundles) {
 std::shared_ptr<QXExtension> RealExtensions::extension(const std::string& identifier) {
   const Reports::Set set = extensions({makeBundle(identifier)});
   return set.empty() ? nullptr : set.front();
+}
+
+void RealExtensions::release(const std::string& identifier) const {
+  std::ofstream(paths_.containers + "/" + identifier + "/release") << "now";
 }
 
 QXDictionary RealExtensions::status(const std::string& identifier) const {

@@ -101,6 +101,9 @@ class RealExtensions {
   [[nodiscard]] Reports::Set extensions(std::vector<Bundle> bundles);
   [[nodiscard]] std::shared_ptr<QXExtension> extension(const std::string& identifier = "com.orvane.test");
 
+  // Lets that extension's processes answer what they wait with.
+  void release(const std::string& identifier = "com.orvane.test") const;
+
   [[nodiscard]] const std::string& home() const { return home_; }
   [[nodiscard]] fake_platform::FakeLog& log() { return log_; }
   // Waits until a line that contains the text is in the log.

@@ -1,0 +1,193 @@
+// An extension's process as its host sees it, with a peer that speaks by hand. The process itself does nothing.
+#include "platform/linux/extension_host/ExtensionProcess.h"
+
+#include <fcntl.h>
+#include <gmock/gmock.h>
+#include <gtest/gtest.h>
+#include <poll.h>
+#include <unistd.h>
+
+#include <array>
+#include <atomic>
+#include <future>
+
+#include "platform/fake/FakeLog.h"
+#include "platform/linux/extension_host/ExtensionErrors.h"
+#include "providers/_QXDocuvendHostProtocol.h"
+#include "providers/_QXDocuvendVendor.h"
+#include "tests/wire/RawPeer.h"
+#include "tests/wire/Waiting.h"
+
+namespace docuvend::linux_platform {
+namespace {
+
+using std::chrono::milliseconds;
+using tests::Mailbox;
+using tests::RawPeer;
+
+constexpr milliseconds kOne{1};
+constexpr std::chrono::hours kLong{1};
+
+ExtensionTimes times(ExtensionTimes::Duration answerLimit, ExtensionTimes::Duration livenessInterval) {
+  ExtensionTimes result;
+  result.answerLimit = answerLimit;
+  result.livenessInterval = livenessInterval;
+  return result;
+}
+
+class ExtensionProcessTest : public ::testing::Test {
+ protected:
+  ~ExtensionProcessTest() override {
+    process.reset();
+    reactor.reset();
+    spawner.stop();
+  }
+
+  void start(const ExtensionTimes& allTimes) {
+    auto [ours, theirs] = tests::socketPair();
+    ASSERT_EQ(fcntl(ours.get(), F_SETFL, O_NONBLOCK), 0);
+    std::array<int, 2> pipe{};
+    ASSERT_EQ(pipe2(pipe.data(), O_CLOEXEC), 0);
+    UniqueDescriptor reading(pipe[0]);
+    const UniqueDescriptor writing(pipe[1]);
+    ASSERT_EQ(fcntl(reading.get(), F_SETFL, O_NONBLOCK), 0);
+    ExtensionProcess::Handlers handlers;
+    handlers.onLost = [this](ProcessLifetime::Cause cause) { lost.put(cause); };
+    handlers.onGone = [this] { gone.put(true); };
+    handlers.hasRequests = [this] {
+      looks.put(true);
+      return hasRequests.load();
+    };
+    process = ExtensionProcess::create({spawn(writing), std::move(ours), std::move(reading)}, "com.orvane.test",
+                                       qxInterfaceOf<_QXDocuvendHostProtocol>(), allTimes, *reactor, log.defaultLog(), std::move(handlers));
+    ASSERT_TRUE(process);
+    peer.emplace(std::move(theirs));
+    peer->sayHello();
+    process->resume();
+    ASSERT_TRUE(peer->read<Hello>());
+  }
+
+  // Sends start providing, which has no limit of its own.
+  std::future<QXError> sendMessage() {
+    const auto failed = std::make_shared<std::promise<QXError>>();
+    const QXRpcInterface vendor = qxInterfaceOf<_QXDocuvendVendor>();
+    const auto& operation = vendor.operations()[vendor.indexOf("_startProvidingItemAtURL:completion:").value()];
+    process->remoteObjectProxy([failed](const QXError& error) { failed->set_value(error); })
+        ->send(operation, {QXURL::fileURL("/item", QXURLKind::file)}, [this](QXArray values) { replies.put(std::move(values)); });
+    return failed->get_future();
+  }
+
+  // What the reactor's one thread was about is over then.
+  void settle() {
+    std::promise<void> settled;
+    reactor->post([&settled] { settled.set_value(); });
+    settled.get_future().wait();
+  }
+  // A process's own timer that is set for sooner has fired then.
+  void waitForATimer() {
+    std::promise<void> fired;
+    Timer later(*reactor, [&fired] { fired.set_value(); });
+    later.setFor(std::chrono::steady_clock::now() + 20 * kOne);
+    fired.get_future().wait();
+    settle();
+  }
+  bool isSilent() const {
+    pollfd ready{peer->socket(), POLLIN, 0};
+    return poll(&ready, 1, 0) == 0;
+  }
+
+  fake_platform::FakeLog log;
+  Mailbox<ProcessLifetime::Cause> lost;
+  Mailbox<bool> gone;
+  Mailbox<bool> looks;
+  Mailbox<QXArray> replies;
+  std::atomic<bool> hasRequests = false;
+  ProcessSpawner spawner;
+  std::unique_ptr<Reactor> reactor = std::make_unique<Reactor>(1U);
+  std::shared_ptr<ExtensionProcess> process;
+  std::optional<RawPeer> peer;
+
+ private:
+  SpawnedProcess spawn(const UniqueDescriptor& output) {
+    std::promise<SpawnedProcess> spawned;
+    EXPECT_TRUE(spawner.perform([this, &spawned, &output] {
+      LaunchPlan plan;
+      plan.arguments = {"/bin/sleep", "1000"};
+      spawned.set_value(std::get<SpawnedProcess>(spawner.spawn(std::move(plan), output)));
+    }));
+    return spawned.get_future().get();
+  }
+};
+
+TEST_F(ExtensionProcessTest, OneWithARequestIsAskedForASignOfLifeAgainAndAgain) {
+  hasRequests = true;
+  start(times(kLong, kOne));
+  process->watchLiveness();
+  for (int i = 0; i < 3; ++i) {
+    ASSERT_TRUE(peer->read<PingFrame>());
+    peer->write(Frame(PongFrame{}));
+  }
+  EXPECT_EQ(lost.count(), 0U);
+}
+
+TEST_F(ExtensionProcessTest, OneWhoseRequestsAreOverIsNotAskedAndNoTimerRuns) {
+  start(times(kLong, kOne));
+  process->watchLiveness();
+  ASSERT_TRUE(looks.take());
+  settle();
+  EXPECT_TRUE(isSilent());
+  waitForATimer();
+  EXPECT_EQ(looks.count(), 0U);
+}
+
+TEST_F(ExtensionProcessTest, OneThatOwesAnAnswerIsAskedUntilItHasGivenIt) {
+  start(times(kLong, kOne));
+  auto failed = sendMessage();
+  const auto request = peer->read<RequestFrame>();
+  ASSERT_TRUE(request);
+  for (int i = 0; i < 2; ++i) {
+    ASSERT_TRUE(peer->read<PingFrame>());
+    peer->write(Frame(PongFrame{}));
+  }
+  peer->write(Frame(ReplyFrame{request->callID, {QXValue()}}));
+  ASSERT_TRUE(replies.take());
+  waitForATimer();
+  while (looks.count() > 0) looks.take();
+  waitForATimer();
+  EXPECT_EQ(looks.count(), 0U);
+}
+
+TEST_F(ExtensionProcessTest, NoSecondSignIsAskedForWhileTheFirstIsAwaited) {
+  hasRequests = true;
+  start(times(kLong, kOne));
+  process->watchLiveness();
+  for (int i = 0; i < 3; ++i) ASSERT_TRUE(looks.take());
+  settle();
+  ASSERT_TRUE(peer->read<PingFrame>());
+  EXPECT_TRUE(isSilent());
+  peer->write(Frame(PongFrame{}));
+  EXPECT_TRUE(peer->read<PingFrame>());
+}
+
+TEST_F(ExtensionProcessTest, WithoutASignInTimeItIsEndedAndItsMessagesFail) {
+  start(times(kOne, kOne));
+  auto failed = sendMessage();
+  EXPECT_EQ(lost.take(), ProcessLifetime::Cause::notAnswering);
+  EXPECT_TRUE(gone.take());
+  const QXError error = failed.get();
+  EXPECT_EQ(error.domain, kExtensionHostErrorDomain);
+  EXPECT_EQ(error.code, static_cast<std::int64_t>(ExtensionHostErrorCode::notAnswering));
+  EXPECT_NE(error.description().find("The process of com.orvane.test did not answer a ping in time."), std::string::npos);
+  EXPECT_THAT(log.texts(), ::testing::Contains("[NOTICE] The process of com.orvane.test did not answer a ping in time."));
+  EXPECT_EQ(lost.count(), 0U);
+}
+
+TEST_F(ExtensionProcessTest, ASignThatWasNotAskedForEndsIt) {
+  start(times(kLong, kLong));
+  peer->write(Frame(PongFrame{}));
+  EXPECT_EQ(lost.take(), ProcessLifetime::Cause::died);
+  EXPECT_TRUE(gone.take());
+}
+
+}  // namespace
+}  // namespace docuvend::linux_platform
