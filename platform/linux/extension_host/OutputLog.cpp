@@ -5,10 +5,13 @@
 
 #include <array>
 #include <cerrno>
+#include <chrono>
+#include <cstddef>
 #include <mutex>
 #include <string_view>
 #include <utility>
 
+#include "platform/linux/extension_host/LineAllowance.h"
 #include "platform/linux/extension_host/OutputLines.h"
 
 namespace docuvend::linux_platform {
@@ -30,8 +33,15 @@ struct OutputLog::State {
         pipe(std::move(descriptor)),
         lines([this](const std::string& line) { write(line); }) {}
 
-  void write(const std::string& line) const {
-    if (log.isEnabled(QXLogType::info)) log.write(QXLogType::info, "[INFO] " + name + ": " + line);
+  void write(const std::string& line) {
+    if (!log.isEnabled(QXLogType::info)) return;
+    const auto verdict = allowance.line(std::chrono::steady_clock::now());
+    tellOfDropped(verdict.droppedBefore);
+    if (verdict.isAllowed) log.write(QXLogType::info, "[INFO] " + name + ": " + line);
+  }
+
+  void tellOfDropped(std::size_t count) const {
+    if (count > 0) log.write(QXLogType::info, "[INFO] " + name + " wrote " + std::to_string(count) + " lines more than are logged.");
   }
 
   Pipe readChunk() {
@@ -43,27 +53,32 @@ struct OutputLog::State {
       return Pipe::maybeMore;
     }
     if (count < 0 && (errno == EAGAIN || errno == EINTR)) return Pipe::empty;
-    lines.finish();
     return Pipe::over;
   }
 
   void finish() {
     const std::lock_guard lock(mutex);
     lines.finish();
+    tellOfDropped(allowance.finish());
   }
 
   QXLogHandle& log;
   const std::string name;
   UniqueDescriptor pipe;
-  std::mutex mutex;  // guards the lines and the order of reading
+  std::mutex mutex;  // guards the two below and the order of reading
   OutputLines lines;
+  LineAllowance allowance;
 };
 
 OutputLog::OutputLog(Reactor& reactor, QXLogHandle& log, std::string name, UniqueDescriptor pipe)
     : state_(std::make_shared<State>(log, std::move(name), std::move(pipe))) {
   registration_ = reactor.watch(state_->pipe.get(), EPOLLIN, [weak = std::weak_ptr(state_)](std::uint32_t) -> std::uint32_t {
     const auto state = weak.lock();
-    if (!state || state->readChunk() == Pipe::over) return 0;
+    if (!state) return 0;
+    if (state->readChunk() == Pipe::over) {
+      state->finish();
+      return 0;
+    }
     return EPOLLIN;
   });
 }

@@ -1,4 +1,7 @@
 // Brings what a process writes to its outputs into the log, line by line, at the info type: "[INFO] NAME: LINE".
+//
+// Whatever it writes is taken, so that it is never held up, but of a flood only the beginning is logged (LineAllowance.h); how much was
+// dropped is told with the next line that is logged, or at the end: "[INFO] NAME wrote 12345 lines more than are logged."
 #pragma once
 
 #include <memory>
