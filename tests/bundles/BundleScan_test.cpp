@@ -8,6 +8,7 @@
 namespace docuvend::linux_platform {
 namespace {
 
+namespace fs = std::filesystem;
 using ::testing::ElementsAre;
 using ::testing::HasSubstr;
 using ::testing::IsEmpty;
@@ -80,6 +81,47 @@ TEST_F(BundleScanTest, SaysTheSameAgainOnlyAfterItWasMended) {
   std::filesystem::remove(user("bad") + "/Info.plist");
   EXPECT_THAT(scan.run(), IsEmpty());
   EXPECT_EQ(house_.log.texts().size(), 2U);
+}
+
+TEST_F(BundleScanTest, AnUnsettledBundleCountsAsWhatItWas) {
+  BundleScan scan(house_.paths, house_.propertyLists, house_.log.defaultLog());
+  BundleHouse::install(user("a"), "org.a");
+  BundleHouse::install(user("b"), "org.b");
+  const std::string before = scan.run().at("org.a").version;
+  BundleHouse::write(user("a") + "/Info.plist", "half");
+  fs::remove_all(user("b"));
+  for (int look = 0; look < 2; ++look) {
+    const auto bundles = scan.run({user("a"), user("b")});
+    ASSERT_TRUE(bundles.contains("org.a"));
+    EXPECT_EQ(bundles.at("org.a").version, before);
+    EXPECT_FALSE(bundles.contains("org.b")) << "what is not there any more counts as nothing";
+  }
+  EXPECT_THAT(house_.log.texts(), IsEmpty());
+  EXPECT_THAT(scan.run(), IsEmpty());
+  EXPECT_THAT(scan.run({user("a")}), IsEmpty()) << "what it was last is no bundle";
+  EXPECT_EQ(house_.log.texts().size(), 1U);
+}
+
+TEST_F(BundleScanTest, AnUnsettledBundleThatWasNeverSeenIsPassedOverInSilence) {
+  BundleHouse::install(user("a"), "org.a");
+  fs::create_directories(user("b"));
+  BundleScan scan(house_.paths, house_.propertyLists, house_.log.defaultLog());
+  EXPECT_THAT(scan.run({user("a"), user("b")}), IsEmpty());
+  EXPECT_THAT(house_.log.texts(), IsEmpty());
+  EXPECT_EQ(scan.run({user("b")}).size(), 1U);
+}
+
+TEST_F(BundleScanTest, TheDirectoriesOfABundleAreThoseNearestFirstAndBounded) {
+  const std::string bundle = user("a");
+  fs::create_directories(bundle + "/x/y/z");
+  fs::create_directories(bundle + "/w");
+  fs::create_directory_symlink(house_.root(), bundle + "/link");
+  BundleHouse::write(bundle + "/file", "");
+  EXPECT_THAT(directoriesOfBundle(bundle), ElementsAre(bundle, bundle + "/w", bundle + "/x", bundle + "/x/y", bundle + "/x/y/z"));
+  for (std::size_t i = 0; i < kMostBundleDirectories; ++i) fs::create_directory(bundle + "/x/" + std::to_string(i));
+  const auto directories = directoriesOfBundle(bundle);
+  EXPECT_EQ(directories.size(), kMostBundleDirectories);
+  EXPECT_EQ(directories[2], bundle + "/x");
 }
 
 TEST_F(BundleScanTest, GivesGroupContainersToMembersAlone) {

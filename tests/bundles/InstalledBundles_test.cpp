@@ -3,10 +3,15 @@
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
 
+#include <algorithm>
+#include <atomic>
 #include <chrono>
 #include <condition_variable>
 #include <mutex>
+#include <thread>
+#include <utility>
 
+#include "platform/linux/bundles/BundleInstaller.h"
 #include "tests/bundles/BundleHouse.h"
 
 namespace docuvend::linux_platform {
@@ -14,6 +19,7 @@ namespace {
 
 // Only a registry that notices nothing waits so long.
 constexpr std::chrono::seconds kLongestWait{30};
+constexpr int kMostTries = 20;
 
 class Changes {
  public:
@@ -51,6 +57,36 @@ class InstalledBundlesTest : public ::testing::Test {
   }
   [[nodiscard]] bool disappears(const std::string& identifier) {
     return changes_.waitFor([this, &identifier] { return !bundles_->find(identifier).has_value(); });
+  }
+
+  template <class Condition>
+  static bool eventually(Condition condition) {
+    const auto deadline = std::chrono::steady_clock::now() + kLongestWait;
+    while (!condition()) {
+      if (std::chrono::steady_clock::now() > deadline) return false;
+      std::this_thread::yield();
+    }
+    return true;
+  }
+  // Writes a bundle as a slow copy does, its entitlements last. True when there were pauses in which it may have been looked at.
+  static bool copyInPlace(const std::string& directory, const std::string& identifier) {
+    using Clock = std::chrono::steady_clock;
+    const auto begin = Clock::now();
+    auto last = begin;
+    Clock::duration longest{0};
+    const auto step = [&last, &longest] {
+      const auto now = Clock::now();
+      longest = std::max(longest, now - std::exchange(last, now));
+    };
+    BundleHouse::install(directory, identifier);
+    step();
+    while (Clock::now() < begin + 2 * Settling::kQuietInPlace) {
+      std::ofstream(directory + "/resource", std::ios::app) << "x";
+      step();
+    }
+    BundleHouse::write(directory + "/Entitlements.plist", BundleHouse::propertyList("<key>right</key><true/>"));
+    step();
+    return longest > Settling::kQuietInPlace / 2;
   }
 
   BundleHouse house_;
@@ -128,6 +164,114 @@ TEST_F(InstalledBundlesTest, CallsNobodyForWhatChangesNoBundle) {
   ASSERT_TRUE(appears("org.a"));
   bundles_.reset();
   EXPECT_EQ(changes_.count(), 1);
+}
+
+TEST_F(InstalledBundlesTest, NoticesAProgramDeepInABundleThatIsCopiedInPlace) {
+  std::filesystem::create_directories(house_.paths.userBundles);
+  start();
+  BundleHouse::write(user("a") + "/Info.plist",
+                     BundleHouse::propertyList(BundleHouse::entry("QXBundleIdentifier", BundleHouse::text("org.a")) +
+                                               BundleHouse::entry("QXBundleExecutable", BundleHouse::text("bin/deep/program"))));
+  const std::string complaint =
+      "[ERROR] Ignoring the bundle at " + user("a") + ": its executable cannot be opened: No such file or directory.";
+  ASSERT_TRUE(eventually([this, &complaint] { return !house_.log.texts().empty() && house_.log.texts().back() == complaint; }));
+  BundleHouse::writeExecutable(user("a") + "/bin/deep/program", "#!/bin/sh\n");
+  EXPECT_TRUE(appears("org.a"));
+}
+
+TEST_F(InstalledBundlesTest, ACopyInPlaceThatMakesNoPauseIsNeverSeenInPart) {
+  std::filesystem::create_directories(house_.paths.userBundles);
+  start();
+  std::atomic<bool> isSeenInPart = false;
+  bundles_->onChange([this, &isSeenInPart] {
+    for (const auto& bundle : bundles_->all()) isSeenInPart = isSeenInPart || bundle.entitlements.empty();
+  });
+  // A machine that makes the copy pause proves nothing; the next try does.
+  for (int i = 0; i < kMostTries; ++i) {
+    const std::string name = std::to_string(i);
+    isSeenInPart = false;
+    const bool pauses = copyInPlace(user(name), "org.a" + name);
+    ASSERT_TRUE(appears("org.a" + name));
+    ASSERT_TRUE(changes_.waitFor([this, &name] { return !bundles_->find("org.a" + name)->entitlements.empty(); }));
+    if (pauses) continue;
+    EXPECT_FALSE(isSeenInPart);
+    return;
+  }
+  FAIL() << "this machine is too slow to tell";
+}
+
+TEST_F(InstalledBundlesTest, ABundleThatIsOverwrittenWithoutPauseCountsAsItWasUntilItIsWhole) {
+  BundleHouse::install(user("a"), "org.a");
+  BundleHouse::write(user("a") + "/Entitlements.plist", BundleHouse::propertyList("<key>right</key><true/>"));
+  start();
+  std::atomic<bool> isSeenInPart = false;
+  bundles_->onChange([this, &isSeenInPart] {
+    const auto bundle = bundles_->find("org.a");
+    isSeenInPart = isSeenInPart || !bundle || bundle->entitlements.empty();
+  });
+  for (int i = 0; i < kMostTries; ++i) {
+    const std::string version = bundles_->find("org.a")->version;
+    isSeenInPart = false;
+    std::filesystem::remove(user("a") + "/Entitlements.plist");
+    BundleHouse::write(user("a") + "/Info.plist", "half");
+    const bool pauses = copyInPlace(user("a"), "org.a");
+    ASSERT_TRUE(changes_.waitFor([this, &version] {
+      const auto bundle = bundles_->find("org.a");
+      return bundle && bundle->version != version && !bundle->entitlements.empty();
+    }));
+    if (pauses) continue;
+    EXPECT_FALSE(isSeenInPart);
+    return;
+  }
+  FAIL() << "this machine is too slow to tell";
+}
+
+TEST_F(InstalledBundlesTest, ABundleThatIsWrittenHoldsUpNoOther) {
+  BundleHouse::install(user("busy"), "org.busy");
+  start();
+  // Written until the other one is seen, and never quiet long enough to be looked at itself.
+  std::atomic<bool> isEnough = false;
+  std::thread writer([this, &isEnough] {
+    while (!isEnough) BundleHouse::write(user("busy") + "/note", "x");
+  });
+  BundleHouse::install(user(".a"), "org.a");
+  std::filesystem::rename(user(".a"), user("a"));
+  EXPECT_TRUE(appears("org.a"));
+  isEnough = true;
+  writer.join();
+}
+
+TEST_F(InstalledBundlesTest, AHundredInstallationsInARowAreFewChanges) {
+  std::filesystem::create_directories(house_.paths.userBundles);
+  for (int i = 0; i < 20; ++i) BundleHouse::install(house_.root() + "/source" + std::to_string(i), "org.a" + std::to_string(i));
+  start();
+  for (int i = 0; i < 100; ++i) {
+    const std::string number = std::to_string(i % 20);
+    if (i % 3 == 2) {
+      (void)uninstallBundle("org.a" + number, house_.paths, house_.propertyLists);
+    } else {
+      ASSERT_EQ(installBundle(house_.root() + "/source" + number, house_.paths, house_.propertyLists).index(), 0U);
+    }
+  }
+  const auto expected = house_.scan();
+  EXPECT_TRUE(changes_.waitFor([this, &expected] {
+    const auto present = bundles_->all();
+    return std::equal(present.begin(), present.end(), expected.begin(), expected.end(),
+                      [](const Bundle& bundle, const auto& entry) { return bundle.version == entry.second.version; });
+  }));
+  bundles_.reset();
+  EXPECT_LE(changes_.count(), 20);
+}
+
+TEST_F(InstalledBundlesTest, WatchesBundlesBehindALinkedHome) {
+  std::filesystem::create_directories(house_.root() + "/real/bundles");
+  std::filesystem::create_directory_symlink(house_.root() + "/real", house_.root() + "/alias");
+  house_.paths.userBundles = house_.root() + "/alias/bundles";
+  start();
+  BundleHouse::install(user("a"), "org.a");
+  EXPECT_TRUE(appears("org.a"));
+  BundleHouse::write(user("a") + "/Entitlements.plist", BundleHouse::propertyList("<key>right</key><true/>"));
+  EXPECT_TRUE(changes_.waitFor([this] { return !bundles_->find("org.a")->entitlements.empty(); }));
 }
 
 TEST_F(InstalledBundlesTest, NoticesThatItsDirectoryIsReplaced) {

@@ -41,17 +41,34 @@ std::vector<std::string> bundleDirectories(const std::string& root) {
   return result;
 }
 
-BundleMap BundleScan::run() {
+std::vector<std::string> directoriesOfBundle(const std::string& directory) {
+  std::vector<std::string> result{directory};
+  for (std::size_t next = 0; next < result.size() && result.size() < kMostBundleDirectories; ++next) {
+    std::error_code error;
+    std::vector<std::string> below;
+    for (fs::directory_iterator entry(result[next], error), end; !error && entry != end; entry.increment(error)) {
+      std::error_code unknown;
+      if (entry->symlink_status(unknown).type() == fs::file_type::directory) below.push_back(entry->path().string());
+    }
+    std::sort(below.begin(), below.end());
+    below.resize(std::min(below.size(), kMostBundleDirectories - result.size()));
+    result.insert(result.end(), below.begin(), below.end());
+  }
+  return result;
+}
+
+BundleMap BundleScan::run(const std::set<std::string>& unsettled) {
   found_.clear();
   reported_.clear();
-  scanDirectory(paths_.systemBundles);
-  scanDirectory(paths_.userBundles);
+  const auto lastParsed = std::exchange(parsed_, {});
+  scanDirectory(paths_.systemBundles, unsettled, lastParsed);
+  scanDirectory(paths_.userBundles, unsettled, lastParsed);
   BundleMap result = resolve();
   lastReported_ = std::move(reported_);
   return result;
 }
 
-void BundleScan::scanDirectory(const std::string& root) {
+void BundleScan::scanDirectory(const std::string& root, const std::set<std::string>& unsettled, const Parsed& lastParsed) {
   for (const auto& path : visibleEntries(root)) {
     std::error_code error;
     const auto type = fs::symlink_status(path, error).type();
@@ -59,20 +76,25 @@ void BundleScan::scanDirectory(const std::string& root) {
       report("[ERROR] Ignoring the bundle at " + path.string() + ": it is a link.");
     }
     if (type != fs::file_type::directory) continue;
+    if (unsettled.contains(path.string())) {
+      if (const auto last = lastParsed.find(path.string()); last != lastParsed.end()) add(last->second);
+      continue;
+    }
     auto parsed = parseBundle(path.string(), propertyLists_);
     if (const auto* problem = std::get_if<BundleProblem>(&parsed)) {
       report("[ERROR] Ignoring the bundle at " + path.string() + ": " + problem->text + ".");
     } else {
-      add(std::get<ParsedBundle>(std::move(parsed)));
+      add(std::get<ParsedBundle>(parsed));
     }
   }
 }
 
-void BundleScan::add(ParsedBundle parsed) {
+void BundleScan::add(const ParsedBundle& parsed) {
+  parsed_.insert_or_assign(parsed.bundle.directory, parsed);
   const auto same = std::find_if(found_.begin(), found_.end(),
                                  [&parsed](const ParsedBundle& other) { return other.bundle.identifier == parsed.bundle.identifier; });
   if (same == found_.end()) {
-    found_.push_back(std::move(parsed));
+    found_.push_back(parsed);
     return;
   }
   report("[ERROR] Ignoring the bundle at " + parsed.bundle.directory + ": " + same->bundle.directory + " has the same identifier.");

@@ -22,12 +22,15 @@ class BundleScan {
 
   // Every sound bundle of the system's and then of the user's directory. Of several with one identifier the system's wins, then the
   // first by name of directory. Directories whose name begins with "." are not looked at: an installer copies under such a name, then
-  // renames. Links are no bundles. Creates nothing.
-  [[nodiscard]] BundleMap run();
+  // renames. Links are no bundles. Creates nothing. A directory of `unsettled` is not read: it counts as what the last look found there,
+  // and as nothing if that was no bundle.
+  [[nodiscard]] BundleMap run(const std::set<std::string>& unsettled = {});
 
  private:
-  void scanDirectory(const std::string& root);
-  void add(ParsedBundle parsed);
+  using Parsed = std::map<std::string, ParsedBundle>;  // by directory
+
+  void scanDirectory(const std::string& root, const std::set<std::string>& unsettled, const Parsed& lastParsed);
+  void add(const ParsedBundle& parsed);
   [[nodiscard]] BundleMap resolve();
   void report(const std::string& text);
 
@@ -35,6 +38,7 @@ class BundleScan {
   QXPropertyLists& propertyLists_;
   QXLogHandle& log_;
 
+  Parsed parsed_;                       // by the look that is going on, or else the last
   std::vector<ParsedBundle> found_;     // of the look that is going on
   std::set<std::string> reported_;      // by the look that is going on
   std::set<std::string> lastReported_;  // by the one before
@@ -42,5 +46,10 @@ class BundleScan {
 
 // The real paths of the directories directly below `root` that may be bundles, in order of name.
 [[nodiscard]] std::vector<std::string> bundleDirectories(const std::string& root);
+
+// The directory of a bundle and those below it, as they may be in the way to its files: at most kMostBundleDirectories, those nearest
+// first.
+inline constexpr std::size_t kMostBundleDirectories = 64;
+[[nodiscard]] std::vector<std::string> directoriesOfBundle(const std::string& directory);
 
 }  // namespace docuvend::linux_platform

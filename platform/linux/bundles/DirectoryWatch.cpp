@@ -15,7 +15,8 @@ namespace {
 
 constexpr unsigned kNames = IN_CREATE | IN_DELETE | IN_MOVED_FROM | IN_MOVED_TO;
 constexpr unsigned kOnTheWay = kNames | IN_ONLYDIR | IN_MASK_ADD;
-constexpr unsigned kInside = kNames | IN_CLOSE_WRITE | IN_ATTRIB | IN_DELETE_SELF | IN_MOVE_SELF | IN_ONLYDIR | IN_MASK_ADD;
+constexpr unsigned kMoves = IN_DELETE | IN_MOVED_FROM | IN_MOVED_TO | IN_DELETE_SELF | IN_MOVE_SELF;
+constexpr unsigned kInside = kNames | IN_MODIFY | IN_CLOSE_WRITE | IN_ATTRIB | IN_DELETE_SELF | IN_MOVE_SELF | IN_ONLYDIR | IN_MASK_ADD;
 
 bool isAbsent(int error) { return error == ENOENT || error == ENOTDIR; }
 
@@ -31,9 +32,11 @@ bool DirectoryWatch::watch(const std::vector<std::string>& whole) {
     complete = watchWay(path) && complete;
     complete = watchWhole(path) && complete;
   }
-  for (const auto& [number, names] : watches_) {
+  for (const int number : numbers_) {
     if (!wanted_.contains(number)) ::inotify_rm_watch(queue_.get(), number);
   }
+  numbers_.clear();
+  for (const auto& [number, watched] : wanted_) numbers_.insert(number);
   watches_ = std::move(wanted_);
   return complete;
 }
@@ -55,32 +58,48 @@ bool DirectoryWatch::add(const std::string& path, unsigned mask, const std::stri
   const int number = ::inotify_add_watch(queue_.get(), path.c_str(), mask);
   // What this user may not look at may not hold bundles for this user either.
   if (number < 0) return isAbsent(errno) || errno == EACCES;
-  const auto [entry, isNew] = wanted_.try_emplace(number);
+  const auto [entry, isNew] = wanted_.try_emplace(number, Watched{path, {}});
+  auto& names = entry->second.names;
   if (name.empty()) {
-    entry->second.clear();
-  } else if (isNew || !entry->second.empty()) {
-    entry->second.insert(name);
+    names.clear();
+  } else if (isNew || !names.empty()) {
+    names.insert(name);
   }
   return true;
 }
 
-bool DirectoryWatch::takeEvents() {
-  bool matters = false;
+std::vector<DirectoryChange> DirectoryWatch::takeChanges() {
+  std::vector<DirectoryChange> changes;
   alignas(inotify_event) std::array<char, 16384> bytes{};
   for (;;) {
     const ssize_t count = ::read(queue_.get(), bytes.data(), bytes.size());
     if (count < 0 && errno == EINTR) continue;
-    if (count <= 0) return matters;
+    if (count <= 0) return changes;
     for (ssize_t place = 0; place < count;) {
       inotify_event event{};
       std::memcpy(&event, bytes.data() + place, sizeof(event));
-      const std::string name = event.len == 0 ? std::string() : std::string(bytes.data() + place + sizeof(event));
+      std::string name = event.len == 0 ? std::string() : std::string(bytes.data() + place + sizeof(event));
       place += static_cast<ssize_t>(sizeof(event) + event.len);
-      const auto watch = watches_.find(event.wd);
-      if ((event.mask & IN_Q_OVERFLOW) != 0) matters = true;
-      if (watch != watches_.end() && (watch->second.empty() || watch->second.contains(name))) matters = true;
+      if ((event.mask & IN_Q_OVERFLOW) != 0) changes.push_back({DirectoryChange::Kind::lost, {}, {}, /*isOfDirectory=*/true});
+      const auto found = watches_.find(event.wd);
+      if (found == watches_.end() || (event.mask & IN_IGNORED) != 0) continue;
+      const auto& [path, names] = found->second;
+      if (!names.empty() && !names.contains(name)) continue;
+      const auto kind = (event.mask & kMoves) != 0 ? DirectoryChange::Kind::cameOrWent : DirectoryChange::Kind::written;
+      const bool isOfDirectory = name.empty() || (event.mask & IN_ISDIR) != 0;
+      changes.push_back({kind, path, std::move(name), isOfDirectory});
+      const auto& change = changes.back();
+      if (kind == DirectoryChange::Kind::cameOrWent && !change.name.empty()) forgetBelow(change.directory + "/" + change.name);
     }
   }
+}
+
+// The watches themselves are removed by the next `watch`.
+void DirectoryWatch::forgetBelow(const std::string& path) {
+  std::erase_if(watches_, [&path](const auto& watch) {
+    const std::string& other = watch.second.path;
+    return other.starts_with(path) && (other.size() == path.size() || other[path.size()] == '/');
+  });
 }
 
 }  // namespace docuvend::linux_platform

@@ -1,4 +1,4 @@
-// Says that something may have changed at or below a few paths, also when they do not exist yet.
+// Says what may have changed at or below a few paths, also when they do not exist yet.
 #pragma once
 
 #include <map>
@@ -9,6 +9,18 @@
 #include "platform/linux/base/UniqueDescriptor.h"
 
 namespace docuvend::linux_platform {
+
+struct DirectoryChange {
+  enum class Kind {
+    written,     // something is being written or made there
+    cameOrWent,  // the entry was renamed from, to or within the directory, or removed
+    lost,        // something was missed; neither directory nor name are known
+  };
+  Kind kind;
+  std::string directory;  // as it was given
+  std::string name;       // of the entry; empty when it is the directory itself
+  bool isOfDirectory;     // the change is of a directory, so that there may be others to watch now
+};
 
 // Used by one thread.
 class DirectoryWatch {
@@ -22,18 +34,25 @@ class DirectoryWatch {
   // much of their paths exists. False when the kernel refused a watch on something that exists.
   [[nodiscard]] bool watch(const std::vector<std::string>& whole);
 
-  // Takes every event that waits; true when one of them matters. Lost events matter.
-  [[nodiscard]] bool takeEvents();
+  // Takes every event that waits; those that matter, in their order. When an entry that is itself watched came or went, nothing more is
+  // heard from it or from below it until the next `watch`.
+  [[nodiscard]] std::vector<DirectoryChange> takeChanges();
 
  private:
+  struct Watched {
+    std::string path;
+    std::set<std::string> names;  // the names whose events matter; empty: all of them
+  };
+
   [[nodiscard]] bool watchWhole(const std::string& path);
   [[nodiscard]] bool watchWay(const std::string& path);
   [[nodiscard]] bool add(const std::string& path, unsigned mask, const std::string& name);
+  void forgetBelow(const std::string& path);
 
   UniqueDescriptor queue_;
-  // Watch to the names whose events matter; an empty set: all of them.
-  std::map<int, std::set<std::string>> watches_;
-  std::map<int, std::set<std::string>> wanted_;  // what `watch` is collecting
+  std::set<int> numbers_;           // all that the kernel watches
+  std::map<int, Watched> watches_;  // those of them that are listened to
+  std::map<int, Watched> wanted_;   // what `watch` is collecting
 };
 
 }  // namespace docuvend::linux_platform

@@ -1,5 +1,5 @@
-// Watches are set before the directories are read, so that what changes while they are read leads to another look. An installation is many
-// changes; they are let settle for a moment, at most kLongestSettling, and then looked at once.
+// Watches are set before the directories are read, so that what changes while they are read leads to another look. A directory that appears
+// is watched at once, not only when it is looked at, so that it is known how long nothing has been written there.
 #include "platform/linux/bundles/InstalledBundles.h"
 
 #include <poll.h>
@@ -10,16 +10,21 @@
 #include <array>
 #include <cerrno>
 #include <chrono>
+#include <filesystem>
+#include <system_error>
 
 namespace docuvend::linux_platform {
 namespace {
 
+using Clock = std::chrono::steady_clock;
+
 constexpr int kForEver = -1;
-constexpr int kQuietMilliseconds = 20;
 constexpr int kMostWatchTries = 4;
-constexpr std::chrono::milliseconds kLongestSettling{500};
 
 bool isSame(const Bundle& one, const Bundle& other) { return one.version == other.version && one.directory == other.directory; }
+
+// An installer works under such a name.
+bool isHidden(const std::string& bundle) { return bundle[bundle.rfind('/') + 1] == '.'; }
 
 bool areSame(const BundleMap& one, const BundleMap& other) {
   return std::equal(one.begin(), one.end(), other.begin(), other.end(),
@@ -29,7 +34,10 @@ bool areSame(const BundleMap& one, const BundleMap& other) {
 }  // namespace
 
 InstalledBundles::InstalledBundles(const Paths& paths, QXPropertyLists& propertyLists, QXLogHandle& log)
-    : paths_(paths), log_(log), stop_(::eventfd(0, EFD_CLOEXEC)), scan_(paths, propertyLists, log) {
+    : log_(log),
+      stop_(::eventfd(0, EFD_CLOEXEC)),
+      roots_{Root{paths.systemBundles, {}}, Root{paths.userBundles, {}}},
+      scan_(paths, propertyLists, log) {
   renewWatch();
   bundles_ = std::make_shared<const BundleMap>(scan_.run());
   if (stop_ && watch_.descriptor() >= 0) thread_ = std::thread([this] { run(); });  // joined by the destructor
@@ -63,49 +71,88 @@ void InstalledBundles::onChange(std::function<void()> callback) {
 }
 
 void InstalledBundles::run() {
-  while (waitForEvents(kForEver)) {
-    if (!watch_.takeEvents()) continue;
-    settle();
-    lookAgain();
+  while (waitForEvents()) {
+    takeChanges();
+    const auto nextLook = settling_.nextLook();
+    if (nextLook && *nextLook <= Clock::now()) lookAgain();
   }
 }
 
-// False when the registry is to end, or nothing came in time.
-bool InstalledBundles::waitForEvents(int timeoutMilliseconds) {
+// Until something happens or the time for a look has come. False when the registry is to end.
+bool InstalledBundles::waitForEvents() {
   std::array<pollfd, 2> waiting = {pollfd{stop_.get(), POLLIN, 0}, pollfd{watch_.descriptor(), POLLIN, 0}};
-  int count = 0;
-  do {
-    count = ::poll(waiting.data(), waiting.size(), timeoutMilliseconds);
-  } while (count < 0 && errno == EINTR);
-  return count > 0 && waiting[0].revents == 0;
+  int timeout = kForEver;
+  if (const auto nextLook = settling_.nextLook()) {
+    const auto left = std::chrono::ceil<std::chrono::milliseconds>(*nextLook - Clock::now()).count();
+    timeout = static_cast<int>(std::max<std::int64_t>(left, 0));
+  }
+  while (::poll(waiting.data(), waiting.size(), timeout) < 0 && errno == EINTR) {
+  }
+  return waiting[0].revents == 0;
 }
 
-void InstalledBundles::settle() {
-  const auto end = std::chrono::steady_clock::now() + kLongestSettling;
-  while (std::chrono::steady_clock::now() < end && waitForEvents(kQuietMilliseconds)) {
-    if (!watch_.takeEvents()) return;
+void InstalledBundles::takeChanges() {
+  bool isToBeWatchedAnew = false;
+  const auto changes = watch_.takeChanges();
+  const auto now = Clock::now();
+  for (const DirectoryChange& change : changes) {
+    const std::string path = realPathOf(change);
+    const std::string bundle = bundleAround(path);
+    if (isHidden(bundle)) continue;
+    settling_.changed(now);
+    isToBeWatchedAnew = isToBeWatchedAnew || change.isOfDirectory;
+    if (bundle.empty()) continue;
+    if (path == bundle && change.kind == DirectoryChange::Kind::cameOrWent) {
+      settling_.wasRenamed(bundle);
+    } else {
+      settling_.wasWritten(bundle, now);
+    }
   }
+  if (isToBeWatchedAnew) renewWatch();
+}
+
+// What changed, below a real directory of bundles if it was below one.
+std::string InstalledBundles::realPathOf(const DirectoryChange& change) const {
+  std::string path = change.directory;
+  if (!change.name.empty()) path += "/" + change.name;
+  for (const Root& root : roots_) {
+    if (path.starts_with(root.given + "/")) return root.real + path.substr(root.given.size());
+  }
+  return path;
+}
+
+// The directory of the bundle that the path is or lies in; empty when it lies in none.
+std::string InstalledBundles::bundleAround(const std::string& path) const {
+  for (const Root& root : roots_) {
+    if (path.starts_with(root.real + "/")) return path.substr(0, path.find('/', root.real.size() + 1));
+  }
+  return {};
 }
 
 void InstalledBundles::lookAgain() {
   renewWatch();
-  auto looked = std::make_shared<const BundleMap>(scan_.run());
+  const auto began = Clock::now();
+  auto looked = std::make_shared<const BundleMap>(scan_.run(settling_.unsettled(began)));
   std::vector<std::function<void()>> callbacks;
+  bool isChanged = false;
   {
     const std::lock_guard lock(mutex_);
-    const bool changed = !areSame(*looked, *bundles_);
+    isChanged = !areSame(*looked, *bundles_);
     bundles_ = std::move(looked);
-    if (changed) callbacks = callbacks_;
+    if (isChanged) callbacks = callbacks_;
   }
+  settling_.looked(began, isChanged ? Settling::Found::changes : Settling::Found::nothingNew);
   for (const auto& callback : callbacks) callback();
 }
 
 std::vector<std::string> InstalledBundles::directoriesToWatch() const {
   std::vector<std::string> result;
-  for (const auto& root : {paths_.systemBundles, paths_.userBundles}) {
-    result.push_back(root);
-    const auto directories = bundleDirectories(root);
-    result.insert(result.end(), directories.begin(), directories.end());
+  for (const Root& root : roots_) {
+    result.push_back(root.given);
+    for (const auto& bundle : bundleDirectories(root.given)) {
+      const auto directories = directoriesOfBundle(bundle);
+      result.insert(result.end(), directories.begin(), directories.end());
+    }
   }
   return result;
 }
@@ -113,6 +160,11 @@ std::vector<std::string> InstalledBundles::directoriesToWatch() const {
 // A directory that appears before its parent is watched would go unnoticed; so the list must be the same afterwards.
 void InstalledBundles::renewWatch() {
   bool isComplete = true;
+  for (Root& root : roots_) {
+    std::error_code error;
+    const auto real = std::filesystem::canonical(root.given, error);
+    root.real = error ? root.given : real.string();
+  }
   auto directories = directoriesToWatch();
   for (int tries = 0; tries < kMostWatchTries; ++tries) {
     isComplete = watch_.watch(directories);

@@ -1,7 +1,13 @@
 // The installed bundles of this machine and this user, looked at again whenever their directories change.
+//
+// What is renamed into place is seen as a whole. What is written in place is seen when nothing was written anywhere in its directory for a
+// moment (Settling.h): a copy that goes on without pauses is never seen in part, and one that pauses longer is seen as it then is, and
+// again when it goes on; so is one that was under way when the registry was made. As long as a bundle that was seen is written to, it
+// counts as it was; its files are those on disk, so a process started from it meanwhile may find a program that does not run yet, and the
+// process of the version after that is another. Changes deeper in a bundle than kMostBundleDirectories reach are not noticed.
 #pragma once
 
-#include <atomic>
+#include <array>
 #include <functional>
 #include <memory>
 #include <mutex>
@@ -15,6 +21,7 @@
 #include "platform/linux/bundles/Bundle.h"
 #include "platform/linux/bundles/BundleScan.h"
 #include "platform/linux/bundles/DirectoryWatch.h"
+#include "platform/linux/bundles/Settling.h"
 
 namespace docuvend::linux_platform {
 
@@ -30,21 +37,30 @@ class InstalledBundles final : public BundleRegistry {
   void onChange(std::function<void()> callback) override;
 
  private:
+  // A directory of bundles.
+  struct Root {
+    std::string given;
+    std::string real;  // as far as it is known; the same while it does not exist
+  };
+
   void run();
-  [[nodiscard]] bool waitForEvents(int timeoutMilliseconds);
-  void settle();
+  [[nodiscard]] bool waitForEvents();
+  void takeChanges();
   void lookAgain();
   void renewWatch();
   [[nodiscard]] std::vector<std::string> directoriesToWatch() const;
+  [[nodiscard]] std::string realPathOf(const DirectoryChange& change) const;
+  [[nodiscard]] std::string bundleAround(const std::string& path) const;
 
   // Constant after construction.
-  const Paths paths_;
   QXLogHandle& log_;
   UniqueDescriptor stop_;
 
   // Used by the constructor, then only by thread_.
+  std::array<Root, 2> roots_;
   BundleScan scan_;
   DirectoryWatch watch_;
+  Settling settling_;
   bool watchIsComplete_ = true;
 
   std::mutex mutex_;
