@@ -18,6 +18,7 @@ TEST(ConfinePolicy, IsReadAsItWasWritten) {
   command.policy.descriptors = 4;
   command.policy.processes = 7;
   command.policy.memory = 1ULL << 40U;
+  command.policy.openFiles = 9;
   command.command = {"/bin/x", "--", "--read", ""};
   const auto parsed = parseConfineArguments(confineArguments(command));
   ASSERT_TRUE(std::holds_alternative<ConfineCommand>(parsed)) << std::get<std::string>(parsed);
@@ -25,8 +26,10 @@ TEST(ConfinePolicy, IsReadAsItWasWritten) {
 }
 
 TEST(ConfinePolicy, IsWrittenAsWords) {
-  EXPECT_THAT(confineArguments({{{{PathAccess::readWrite, "/a"}}, 3, std::nullopt, std::nullopt}, {"/b", "c"}}),
+  EXPECT_THAT(confineArguments({{{{PathAccess::readWrite, "/a"}}, 3, std::nullopt, std::nullopt, std::nullopt}, {"/b", "c"}}),
               ElementsAre("--read-write", "/a", "--descriptors", "3", "--", "/b", "c"));
+  EXPECT_THAT(confineArguments({{{}, 4, 1, 2, 3}, {"/b"}}),
+              ElementsAre("--descriptors", "4", "--processes", "1", "--memory", "2", "--open-files", "3", "--", "/b"));
 }
 
 TEST(ConfinePolicy, IsNotGuessed) {
@@ -49,6 +52,7 @@ TEST(ConfinePolicy, IsNotGuessed) {
            {{"--descriptors", "3", "--read", "etc", "--", "/sh"}, "--read needs an absolute path, not \"etc\""},
            {{"--descriptors", "3", "--processes", "0", "--", "/sh"}, "--processes cannot be \"0\""},
            {{"--descriptors", "3", "--memory", "99999999999999999999", "--", "/sh"}, "--memory cannot be \"99999999999999999999\""},
+           {{"--descriptors", "3", "--open-files", "many", "--", "/sh"}, "--open-files cannot be \"many\""},
            {{"--descriptors", "3", "--all", "/", "--", "/sh"}, "unknown option \"--all\""},
        }) {
     const auto parsed = parseConfineArguments(words);

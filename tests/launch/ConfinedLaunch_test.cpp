@@ -337,9 +337,10 @@ TEST_F(ConfinedExtension, SeesNoSocketDirectory) {
 }
 
 TEST_F(ConfinedExtension, IsLimited) {
-  const auto outcomes = run({"limit", "processes", "limit", "memory"});
+  const auto outcomes = run({"limit", "processes", "limit", "memory", "limit", "open files"});
   EXPECT_EQ(outcomes.at("limit processes"), std::to_string(kExtensionProcesses));
   EXPECT_EQ(outcomes.at("limit memory"), std::to_string(kExtensionMemory.value_or(RLIM_INFINITY)));
+  EXPECT_EQ(outcomes.at("limit open files"), std::to_string(kExtensionOpenFiles));
 }
 
 // Counted within its own confinement: the user's other processes take nothing away.

@@ -131,12 +131,14 @@ TEST_F(LaunchArguments, LimitAnExtensionAndNoApplication) {
   EXPECT_EQ(application.descriptors, 3);
   EXPECT_FALSE(application.processes);
   EXPECT_FALSE(application.memory);
+  EXPECT_FALSE(application.openFiles);
 
   subject_.kind = LaunchKind::extension;
   const auto extension = confinePolicy(subject_, host_);
   EXPECT_EQ(extension.descriptors, 4);
   EXPECT_EQ(extension.processes, kExtensionProcesses);
   EXPECT_EQ(extension.memory, kExtensionMemory);
+  EXPECT_EQ(extension.openFiles, kExtensionOpenFiles);
 
   host_.landlockLevel = kProcessLimitLevel - 1;
   EXPECT_FALSE(confinePolicy(subject_, host_).processes);

@@ -5,6 +5,7 @@
 #include <sys/syscall.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <cerrno>
 #include <climits>
 #include <cstdio>
@@ -25,9 +26,13 @@ int fail(const std::string& why) {
   return kFailed;
 }
 
+// A tighter limit that was inherited stays.
 std::optional<QXError> limit(__rlimit_resource resource, std::optional<std::uint64_t> most) {
   if (!most) return std::nullopt;
-  const rlimit limit{*most, *most};
+  rlimit limit{};
+  if (::getrlimit(resource, &limit) != 0) return QXError::system(errno, "cannot read a limit");
+  limit.rlim_max = std::min<rlim_t>(limit.rlim_max, *most);
+  limit.rlim_cur = limit.rlim_max;
   if (::setrlimit(resource, &limit) != 0) return QXError::system(errno, "cannot set a limit");
   return std::nullopt;
 }
@@ -46,6 +51,7 @@ int run(const std::vector<std::string>& arguments) {
   if (const auto error = leaveKeyring()) return fail(error->description());
   if (const auto error = limit(RLIMIT_NPROC, policy.processes)) return fail(error->description());
   if (const auto error = limit(RLIMIT_DATA, policy.memory)) return fail(error->description());
+  if (const auto error = limit(RLIMIT_NOFILE, policy.openFiles)) return fail(error->description());
   if (const auto error = restrictToRules(policy.rules, landlockLevel())) return fail(error->description());
   if (::close_range(static_cast<unsigned>(policy.descriptors), UINT_MAX, 0) != 0) return fail("cannot close the other descriptors");
 

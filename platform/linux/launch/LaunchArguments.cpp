@@ -89,6 +89,7 @@ ConfinePolicy confinePolicy(const LaunchSubject& subject, const HostLayout& host
     policy.descriptors = kExtensionSocketNumber + 1;
     if (host.landlockLevel >= kProcessLimitLevel) policy.processes = kExtensionProcesses;
     policy.memory = kExtensionMemory;
+    policy.openFiles = kExtensionOpenFiles;
   }
   return policy;
 }

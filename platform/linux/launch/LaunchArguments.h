@@ -31,6 +31,11 @@ inline constexpr std::optional<std::uint64_t> kExtensionMemory;
 inline constexpr std::optional<std::uint64_t> kExtensionMemory = std::uint64_t{4} << 30U;
 #endif
 
+// Descriptors of each process of an extension. The kernel counts those that lie in sockets unread for all of a user's processes together,
+// and refuses to pass more on to whoever's own limit is below that number. This one is below what every login gives the daemon, so an
+// extension that hoards descriptors cannot keep the daemon from handing out files.
+inline constexpr std::uint64_t kExtensionOpenFiles = 512;
+
 // Where docuvend-confine is found inside.
 inline constexpr const char* kHelperPath = "/.docuvend-confine";
 

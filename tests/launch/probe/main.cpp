@@ -20,6 +20,7 @@
 #include <cstdio>
 #include <cstdlib>
 #include <cstring>
+#include <map>
 #include <string>
 #include <utility>
 #include <vector>
@@ -214,7 +215,11 @@ std::string attempt(const std::string& what, const std::string& subject) {
   if (what == "chroot") return outcome(::chroot(subject.c_str()));
   if (what == "execute") return execute(subject);
   if (what == "key") return outcome(::syscall(SYS_keyctl, KEYCTL_SEARCH, KEY_SPEC_SESSION_KEYRING, "user", subject.c_str(), 0));
-  if (what == "limit") return limitOf(subject == "processes" ? RLIMIT_NPROC : RLIMIT_DATA);
+  if (what == "limit") {
+    const std::map<std::string, __rlimit_resource> resources = {
+        {"processes", RLIMIT_NPROC}, {"memory", RLIMIT_DATA}, {"open files", RLIMIT_NOFILE}};
+    return limitOf(resources.at(subject));
+  }
   if (what == "fork") return forkUntilRefused();
   if (what == "echo") return echoOnce();
   if (what == "variable") {

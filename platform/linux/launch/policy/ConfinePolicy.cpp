@@ -15,8 +15,11 @@ constexpr std::array<std::pair<PathAccess, std::string_view>, 4> kAccessOptions 
     {PathAccess::device, "--device"},
 }};
 constexpr std::string_view kDescriptorsOption = "--descriptors";
-constexpr std::string_view kProcessesOption = "--processes";
-constexpr std::string_view kMemoryOption = "--memory";
+constexpr std::array<std::pair<std::string_view, std::optional<std::uint64_t> ConfinePolicy::*>, 3> kLimitOptions = {{
+    {"--processes", &ConfinePolicy::processes},
+    {"--memory", &ConfinePolicy::memory},
+    {"--open-files", &ConfinePolicy::openFiles},
+}};
 constexpr std::string_view kEndOfOptions = "--";
 constexpr std::uint64_t kFewestDescriptors = 3;
 constexpr std::uint64_t kMostDescriptors = 4;
@@ -48,10 +51,13 @@ std::optional<std::string> takeOption(const std::string& option, const std::stri
     policy.descriptors = static_cast<int>(*number);
     return std::nullopt;
   }
-  if (option != kProcessesOption && option != kMemoryOption) return "unknown option \"" + option + "\"";
-  if (!number || *number == 0) return option + " cannot be \"" + value + "\"";
-  (option == kProcessesOption ? policy.processes : policy.memory) = number;
-  return std::nullopt;
+  for (const auto& [name, limit] : kLimitOptions) {
+    if (option != name) continue;
+    if (!number || *number == 0) return option + " cannot be \"" + value + "\"";
+    policy.*limit = number;
+    return std::nullopt;
+  }
+  return "unknown option \"" + option + "\"";
 }
 
 }  // namespace
@@ -68,8 +74,9 @@ std::vector<std::string> confineArguments(const ConfineCommand& command) {
     }
   }
   add(kDescriptorsOption, std::to_string(command.policy.descriptors));
-  if (command.policy.processes) add(kProcessesOption, std::to_string(*command.policy.processes));
-  if (command.policy.memory) add(kMemoryOption, std::to_string(*command.policy.memory));
+  for (const auto& [name, limit] : kLimitOptions) {
+    if (const auto& most = command.policy.*limit) add(name, std::to_string(*most));
+  }
   arguments.emplace_back(kEndOfOptions);
   arguments.insert(arguments.end(), command.command.begin(), command.command.end());
   return arguments;

@@ -1,7 +1,7 @@
 // What docuvend-confine is told to do, as its arguments say it. The launcher writes them, docuvend-confine reads them.
 //
 //   docuvend-confine [--read-execute PATH | --read PATH | --read-write PATH | --device PATH]... --descriptors COUNT
-//                    [--processes COUNT] [--memory BYTES] -- EXECUTABLE [ARGUMENT...]
+//                    [--processes COUNT] [--memory BYTES] [--open-files COUNT] -- EXECUTABLE [ARGUMENT...]
 #pragma once
 
 #include <cstdint>
@@ -29,7 +29,8 @@ struct ConfinePolicy {
   std::vector<Rule> rules;  // what no rule names is out of reach
   int descriptors = 3;      // 0 to this number, exclusive, stay open; every other is closed
   std::optional<std::uint64_t> processes;
-  std::optional<std::uint64_t> memory;  // bytes of private writable memory per process
+  std::optional<std::uint64_t> memory;     // bytes of private writable memory per process
+  std::optional<std::uint64_t> openFiles;  // descriptors per process
 
   friend bool operator==(const ConfinePolicy&, const ConfinePolicy&) = default;
 };
