@@ -50,6 +50,17 @@ TEST_F(GroupContainersTest, PlaceAFileThatDoesNotExistYet) {
   expectRefusal(document + "/new.txt", PathRefusal::noParent);
 }
 
+TEST_F(GroupContainersTest, SpellADirectoryWithAndWithoutTheLinksOfEachPartOfItsWay) {
+  using Spellings = std::vector<std::string>;
+  EXPECT_EQ(containers.spellingsOf(storage), Spellings{storage + "/"});
+  EXPECT_EQ(containers.spellingsOf("/" + storage + "//"), Spellings{storage + "/"});
+  EXPECT_EQ(containers.spellingsOf(storage + "/missing/deeper"), Spellings{storage + "/missing/deeper/"});
+  ASSERT_EQ(::symlink(group.c_str(), (home + "/a").c_str()), 0);
+  ASSERT_EQ(::symlink(outside.c_str(), (group + "/b").c_str()), 0);
+  EXPECT_EQ(containers.spellingsOf(home + "/a/b/c"), (Spellings{home + "/a/b/c/", group + "/b/c/", outside + "/c/"}));
+  for (const char* path : {"", "/", "//", "relative", "/a/../b"}) EXPECT_EQ(containers.spellingsOf(path), Spellings{"/"}) << path;
+}
+
 TEST_F(GroupContainersTest, TakeDoubledSlashesAsOne) { EXPECT_EQ(placed("//" + group + "///Docuvend Storage//report.txt").path, document); }
 
 TEST_F(GroupContainersTest, RefuseASecondSpelling) {
