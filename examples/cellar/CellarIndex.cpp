@@ -18,9 +18,9 @@ constexpr const char* kIndexName = "/index";
 constexpr const char* kTemporaryName = "/.index.new";
 constexpr const char* kLockName = "/index.lock";
 constexpr mode_t kFileMode = 0600;
-constexpr std::string_view kHeading = "cellar index 1\n";
+constexpr std::string_view kHeading = "cellar index 2\n";
 constexpr std::size_t kFieldsPerSide = 7;
-constexpr std::size_t kFields = 2 + 2 * kFieldsPerSide;
+constexpr std::size_t kFields = 1 + 2 * kFieldsPerSide;
 constexpr std::size_t kReadBytes = 65536;
 constexpr char kHexDigits[] = "0123456789abcdef";
 
@@ -86,9 +86,8 @@ std::optional<Item> parseItem(std::string_view line) {
   }
   Item item;
   item.identifier = fields[0];
-  if (item.identifier.empty() || (fields[1] != "placeholder" && fields[1] != "here")) return std::nullopt;
-  item.contents = fields[1] == "here" ? Item::Contents::here : Item::Contents::placeholder;
-  if (!parseSide(&fields[2], item.local) || !parseSide(&fields[2 + kFieldsPerSide], item.cloud)) return std::nullopt;
+  if (item.identifier.empty()) return std::nullopt;
+  if (!parseSide(&fields[1], item.local) || !parseSide(&fields[1 + kFieldsPerSide], item.cloud)) return std::nullopt;
   return item;
 }
 
@@ -132,7 +131,7 @@ std::vector<Entry> recognise(std::vector<Item>& items, Tracked Item::*side, std:
 std::string indexText(const std::vector<Item>& items) {
   std::string text(kHeading);
   for (const Item& item : items) {
-    text += item.identifier + '\t' + (item.contents == Item::Contents::here ? "here" : "placeholder");
+    text += item.identifier;
     append(text, item.local);
     append(text, item.cloud);
     text += '\n';

@@ -28,15 +28,14 @@ struct Tracked {
 };
 
 struct Item {
-  enum class Contents { placeholder, here };
-
   std::string identifier;
-  Contents contents = Contents::placeholder;
   Tracked local;
   Tracked cloud;
 
+  // There is a file, and it is no placeholder.
+  [[nodiscard]] bool isHere() const { return local.present && !local.present->isPlaceholder(); }
   // Somebody has written the file since the two sides were the same.
-  [[nodiscard]] bool isChangedHere() const { return local.present && *local.present != local.fingerprint; }
+  [[nodiscard]] bool isChangedHere() const { return isHere() && *local.present != local.fingerprint; }
   [[nodiscard]] bool isChangedInCloud() const { return cloud.present && *cloud.present != cloud.fingerprint; }
 };
 

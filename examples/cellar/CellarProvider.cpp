@@ -3,8 +3,6 @@
 // identifier (its name may be another by now), and only if what justified the transfer is still so the temporary takes its place.
 #include "examples/cellar/CellarProvider.h"
 
-#include <fcntl.h>
-#include <signal.h>
 #include <unistd.h>
 
 #include <algorithm>
@@ -14,6 +12,8 @@
 #include <cstdlib>
 #include <string_view>
 #include <utility>
+
+#include "examples/cellar/Eviction.h"
 
 namespace docuvend::cellar {
 namespace {
@@ -28,13 +28,11 @@ QXError cellarError(CellarErrorCode code, std::string description) {
   return QXError::make(kErrorDomain, static_cast<std::int64_t>(code), std::move(description));
 }
 
+QXError notSaved() { return cellarError(CellarErrorCode::notSaved, "The document is not in the cloud yet."); }
+
 // One for each item: an item's contents move one way at a time.
 std::string temporaryIn(const std::string& directory, const Item& item) {
   return directory + "/." + item.identifier + std::string(kTemporarySuffix);
-}
-
-UniqueDescriptor openForReading(const std::string& path) {
-  return UniqueDescriptor(open(path.c_str(), O_RDONLY | O_NOFOLLOW | O_NONBLOCK | O_CLOEXEC));
 }
 
 // Copies from one file to the other and calls `onProgress` with the number of bytes so far. An error when the first file changed meanwhile.
@@ -42,6 +40,7 @@ template <class Progress>
 Provider::Failure copy(const UniqueDescriptor& from, const UniqueDescriptor& to, Fingerprint& version, const Progress& onProgress) {
   const auto before = fingerprintOf(from);
   if (!before) return systemError("cannot examine a document");
+  awaitLaterTime(*before);
   std::array<char, kChunk> buffer{};
   std::uint64_t copied = 0;
   for (;;) {
@@ -84,12 +83,13 @@ Provider::Failure CellarProvider::performInitialSetup() {
   if (index.error()) return index.error();
 
   std::erase_if(index.items(), [this](const Item& item) {
-    if (item.cloud.present || item.contents == Item::Contents::here || item.isChangedHere()) return false;
+    if (item.cloud.present || (item.local.present && *item.local.present != item.local.fingerprint)) return false;
+    if (item.isHere()) return false;
     if (item.local.present) unlink(localPath(item.local.name).c_str());
     return true;
   });
   for (Item& item : index.items()) {
-    const bool isStale = item.contents == Item::Contents::placeholder && !item.isChangedHere() && item.isChangedInCloud();
+    const bool isStale = !item.isHere() && item.isChangedInCloud();
     if (!item.cloud.present || (item.local.present && !isStale)) continue;
     if (auto error = makePlaceholder(item)) return error;
   }
@@ -115,14 +115,15 @@ Provider::Failure CellarProvider::startProviding(const QXURL& url) {
     if (const auto* error = std::get_if<QXError>(&found)) return *error;
     before = *std::get<Item*>(found);
   }
-  const bool isHere = before.contents == Item::Contents::here && before.local.present;
-  if (before.isChangedHere() || (isHere && !before.isChangedInCloud())) return std::nullopt;
+  if (before.isChangedHere() || (before.isHere() && !before.isChangedInCloud())) return std::nullopt;
   if (!before.cloud.present) return cellarError(CellarErrorCode::notInCloud, "The document is not in the cloud any more.");
 
   Replacement replacement(temporaryIn(storage_, before));
   if (!replacement.file()) return systemError("cannot make a file for " + before.local.name);
   Fingerprint version;
   if (auto error = fetch(before.cloud.name, replacement.file(), version)) return error;
+  // The document's own time, which has passed: whoever writes the file, however soon, gives it another.
+  if (!setModified(replacement.file(), version.modified)) return systemError("cannot date " + before.local.name);
 
   auto index = openIndex();
   const auto found = find(index, ItemID{before.identifier});
@@ -136,7 +137,6 @@ Provider::Failure CellarProvider::startProviding(const QXURL& url) {
   item.local.fingerprint = *fingerprint;
   item.local.key = fingerprint->key;
   item.cloud.fingerprint = version;
-  item.contents = Item::Contents::here;
   return index.save();
 }
 
@@ -170,7 +170,6 @@ Provider::Failure CellarProvider::itemChanged(const QXURL& url) {
   item.local.fingerprint = version;
   item.cloud.fingerprint = *cloudFingerprint;
   item.cloud.key = cloudFingerprint->key;
-  item.contents = Item::Contents::here;
   return index.save();
 }
 
@@ -179,25 +178,21 @@ Provider::Failure CellarProvider::stopProviding(const QXURL& url) {
   const auto found = find(index, url);
   if (const auto* error = std::get_if<QXError>(&found)) return *error;
   Item& item = *std::get<Item*>(found);
-  if (!item.local.present) return std::nullopt;
-  if (item.isChangedHere() || !item.cloud.present) {
-    return cellarError(CellarErrorCode::notSaved, "The document is not in the cloud yet.");
-  }
-  if (item.contents == Item::Contents::placeholder) return std::nullopt;
+  if (!item.isHere()) return std::nullopt;
+  if (item.isChangedHere() || !item.cloud.present) return notSaved();
 
-  // A lease is given only while nobody else has the file open, and whoever opens it then waits until it is closed here. The holder is told
-  // of that by a signal, which must be one that does not end the process.
-  const UniqueDescriptor file = openForReading(localPath(item.local.name));
-  if (!file) return systemError("cannot open " + item.local.name);
-  if (fcntl(file.get(), F_SETSIG, SIGURG) != 0) return systemError("cannot prepare a lease");
-  if (fcntl(file.get(), F_SETLEASE, F_WRLCK) != 0) {
-    if (errno == EAGAIN) return cellarError(CellarErrorCode::inUse, "Somebody has the document open.");
-    return systemError("cannot lease " + item.local.name);
+  // Made before the file is leased, so that nobody waits for it.
+  Replacement placeholder(temporaryIn(storage_, item));
+  if (auto error = placeholder.becomePlaceholder(item.cloud.present->size, item.cloud.present->modified)) return error;
+  {
+    const Eviction eviction(localPath(item.local.name));
+    auto error = eviction.error();
+    if (!error && fingerprintOf(eviction.file()) != item.local.fingerprint) return notSaved();
+    if (!error) error = eviction.commit(placeholder);
+    if (error && error->code == EAGAIN) return cellarError(CellarErrorCode::inUse, "Somebody has the document open.");
+    if (error) return error;
   }
-  if (fingerprintOf(file) != item.local.fingerprint) {
-    return cellarError(CellarErrorCode::notSaved, "The document is not in the cloud yet.");
-  }
-  if (auto error = makePlaceholder(item)) return error;
+  if (auto error = notePlaceholder(item, placeholder)) return error;
   return index.save();
 }
 
@@ -226,7 +221,6 @@ CellarIndex::Session CellarProvider::openIndex() {
   for (const Entry& entry : newHere) {
     Item& item = items.emplace_back();
     item.identifier = newIdentifier();
-    item.contents = Item::Contents::here;
     item.local = {entry.name, entry.fingerprint.key, /*fingerprint=*/{}, entry.fingerprint};
   }
   for (const Entry& entry : newInCloud) {
@@ -278,23 +272,24 @@ Provider::Result<Item*> CellarProvider::find(CellarIndex::Session& index, const 
 }
 
 Provider::Failure CellarProvider::makePlaceholder(Item& item) const {
-  Replacement replacement(temporaryIn(storage_, item));
-  if (!replacement.file() || ftruncate(replacement.file().get(), static_cast<off_t>(item.cloud.present->size)) != 0) {
-    return systemError("cannot make a placeholder for " + item.local.name);
-  }
+  Replacement placeholder(temporaryIn(storage_, item));
+  if (auto error = placeholder.becomePlaceholder(item.cloud.present->size, item.cloud.present->modified)) return error;
   const auto over = item.local.present ? Replacement::Over::anything : Replacement::Over::nothing;
-  if (auto error = replacement.commit(localPath(item.local.name), over)) {
+  if (auto error = placeholder.commit(localPath(item.local.name), over)) {
     // Another document has the name now.
     if (error->code == EEXIST) return std::nullopt;
     return error;
   }
-  const auto fingerprint = fingerprintOf(replacement.file());
+  return notePlaceholder(item, placeholder);
+}
+
+Provider::Failure CellarProvider::notePlaceholder(Item& item, const Replacement& placeholder) {
+  const auto fingerprint = fingerprintOf(placeholder.file());
   if (!fingerprint) return systemError("cannot examine " + item.local.name);
   item.local.present = fingerprint;
   item.local.fingerprint = *fingerprint;
   item.local.key = fingerprint->key;
   item.cloud.fingerprint = *item.cloud.present;
-  item.contents = Item::Contents::placeholder;
   return std::nullopt;
 }
 

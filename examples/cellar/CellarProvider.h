@@ -6,7 +6,9 @@
 // Subdirectories and hidden files are not documents.
 //
 // Contents come and go by replacing the file, never by writing into it, so a reader has all of the old file or all of the new. A file that
-// was opened while it was a placeholder stays a placeholder for its holder: open it after the item is provided.
+// was opened while it was a placeholder stays a placeholder for its holder: open it after the item is provided. Contents are given up only
+// while nobody has the file open, so who has them keeps them; who comes between the start and the opening and finds a placeholder again,
+// because another application has let the item go, starts once more.
 //
 // What is written here and not yet in the cloud is never overwritten and never given up; here and in the cloud changed at once, the one
 // here wins. A document that is removed here comes back as a placeholder at the next setup; one that is removed in the cloud goes here too,
@@ -55,8 +57,9 @@ class CellarProvider : public Provider {
   [[nodiscard]] Result<Item*> find(CellarIndex::Session& index, const QXURL& url) const;
   [[nodiscard]] static Result<Item*> find(CellarIndex::Session& index, const ItemID& identifier);
 
-  // Puts a placeholder in the place of the item's file, or where there is none.
+  // Puts a placeholder in the place of the item's, or where there is no file.
   [[nodiscard]] Failure makePlaceholder(Item& item) const;
+  [[nodiscard]] static Failure notePlaceholder(Item& item, const Replacement& placeholder);
   // Copies the document from the cloud, in chunks, and tells which version of it that was.
   [[nodiscard]] Failure fetch(const std::string& cloudName, const UniqueDescriptor& target, Fingerprint& version) const;
   void crashIfAsked(std::uint64_t fetched, std::uint64_t size) const;

@@ -4,6 +4,7 @@
 #include <fcntl.h>
 #include <stdio.h>
 #include <sys/stat.h>
+#include <time.h>
 #include <unistd.h>
 
 #include <algorithm>
@@ -17,8 +18,15 @@ namespace {
 constexpr mode_t kDirectoryMode = 0700;
 constexpr mode_t kFileMode = 0600;
 constexpr std::int64_t kNanoseconds = 1'000'000'000;
+// The fraction of a second in a placeholder's time.
+constexpr std::int64_t kPlaceholderFraction = 314'159'265;
+// Far more than a tick of any kernel's clock.
+constexpr int kLooksAtTheClock = 100;
+constexpr timespec kBetweenLooks{0, 1'000'000};
 
 std::int64_t nanoseconds(const statx_timestamp& time) { return time.tv_sec * kNanoseconds + time.tv_nsec; }
+
+std::int64_t fractionOf(std::int64_t time) { return ((time % kNanoseconds) + kNanoseconds) % kNanoseconds; }
 
 std::optional<Fingerprint> examine(int directory, const char* name, int flags) {
   struct statx status {};
@@ -30,6 +38,10 @@ std::optional<Fingerprint> examine(int directory, const char* name, int flags) {
 }  // namespace
 
 QXError systemError(const std::string& what) { return QXError::system(errno, what); }
+
+UniqueDescriptor openForReading(const std::string& path) {
+  return UniqueDescriptor(open(path.c_str(), O_RDONLY | O_NOFOLLOW | O_NONBLOCK | O_CLOEXEC));
+}
 
 std::vector<Entry> listFiles(const std::string& directory) {
   std::vector<Entry> result;
@@ -45,6 +57,23 @@ std::vector<Entry> listFiles(const std::string& directory) {
 
 std::optional<Fingerprint> fingerprintOf(const UniqueDescriptor& file) { return examine(file.get(), "", AT_EMPTY_PATH); }
 
+bool Fingerprint::isPlaceholder() const { return fractionOf(modified) == kPlaceholderFraction; }
+
+bool setModified(const UniqueDescriptor& file, std::int64_t modified) {
+  const std::int64_t fraction = fractionOf(modified);
+  const timespec times[2] = {{0, UTIME_OMIT}, {(modified - fraction) / kNanoseconds, fraction}};
+  return futimens(file.get(), times) == 0;
+}
+
+void awaitLaterTime(const Fingerprint& file) {
+  for (int i = 0; i < kLooksAtTheClock; ++i) {
+    timespec now{};
+    clock_gettime(CLOCK_REALTIME_COARSE, &now);  // what the kernel takes a change's time from
+    if (now.tv_sec * kNanoseconds + now.tv_nsec > file.modified) return;
+    nanosleep(&kBetweenLooks, nullptr);
+  }
+}
+
 std::optional<QXError> ensureDirectory(const std::string& path) {
   if (mkdir(path.c_str(), kDirectoryMode) == 0 || errno == EEXIST) return std::nullopt;
   return systemError("cannot make " + path);
@@ -55,6 +84,21 @@ Replacement::Replacement(std::string temporary)
 
 Replacement::~Replacement() {
   if (file_ && !temporary_.empty()) unlink(temporary_.c_str());
+}
+
+std::optional<QXError> Replacement::becomePlaceholder(std::uint64_t size, std::int64_t modified) {
+  const bool isMade = file_ && ftruncate(file_.get(), static_cast<off_t>(size)) == 0 &&
+                      setModified(file_, modified - fractionOf(modified) + kPlaceholderFraction) && fsync(file_.get()) == 0;
+  if (!isMade) return systemError("cannot make a placeholder");
+  // A file system that keeps whole seconds would make every placeholder a document of zeros.
+  const auto made = fingerprintOf(file_);
+  if (!made || !made->isPlaceholder()) return QXError::system(ENOTSUP, "the file system does not keep a placeholder's time");
+  return std::nullopt;
+}
+
+std::optional<QXError> Replacement::exchange(const std::string& path) const {
+  if (renameat2(AT_FDCWD, temporary_.c_str(), AT_FDCWD, path.c_str(), RENAME_EXCHANGE) == 0) return std::nullopt;
+  return systemError("cannot put a file at " + path);
 }
 
 std::optional<QXError> Replacement::commit(const std::string& path, Over over) {

@@ -26,6 +26,10 @@ struct Fingerprint {
   FileKey key;
   std::uint64_t size = 0;
   std::int64_t modified = 0;  // nanoseconds since 1970
+
+  // A placeholder says so itself, by a time that no clock gives: so it is known for one whatever was ended in the middle, and is none any
+  // more as soon as somebody writes it.
+  [[nodiscard]] bool isPlaceholder() const;
   friend bool operator==(const Fingerprint&, const Fingerprint&) = default;
 };
 
@@ -36,10 +40,17 @@ struct Entry {
 
 [[nodiscard]] QXError systemError(const std::string& what);
 
+// Of no kind of file does this wait, and it follows no link. No descriptor: errno says why.
+[[nodiscard]] UniqueDescriptor openForReading(const std::string& path);
 // The regular files directly in the directory whose names do not begin with ".". Links are none.
 [[nodiscard]] std::vector<Entry> listFiles(const std::string& directory);
 // None when it is no regular file.
 [[nodiscard]] std::optional<Fingerprint> fingerprintOf(const UniqueDescriptor& file);
+// Gives the file a time of its last change.
+[[nodiscard]] bool setModified(const UniqueDescriptor& file, std::int64_t modified);
+// Returns when whatever is written from now on has another time than the file has now. Two changes within one tick of the kernel's clock
+// may have the same, so this takes some milliseconds after a change. Of a file from the future it gives up.
+void awaitLaterTime(const Fingerprint& file);
 // Makes the directory if it is missing (mode 700).
 [[nodiscard]] std::optional<QXError> ensureDirectory(const std::string& path);
 
@@ -55,8 +66,13 @@ class Replacement {
 
   // No descriptor: it could not be made.
   [[nodiscard]] const UniqueDescriptor& file() const { return file_; }
+  // Makes it a placeholder of that size, for contents of that time, and puts it on disk.
+  [[nodiscard]] std::optional<QXError> becomePlaceholder(std::uint64_t size, std::int64_t modified);
   // Puts the file on disk, then in its place, which lies in the same directory. None: done. Over nothing, a place that is taken is EEXIST.
   [[nodiscard]] std::optional<QXError> commit(const std::string& path, Over over);
+  // Has the file and the one at its place change names, and changes them back when called again: what is not in its place at the end is
+  // removed. Nothing is put on disk.
+  [[nodiscard]] std::optional<QXError> exchange(const std::string& path) const;
 
  private:
   std::string temporary_;

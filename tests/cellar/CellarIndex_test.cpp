@@ -71,7 +71,6 @@ TEST(Recognise, AFileOfAnotherBirthIsAnother) {
 
 TEST(Index, ReadsWhatItWrote) {
   Item first = item("0123", "a", 1);
-  first.contents = Item::Contents::here;
   first.local.fingerprint = {key(1), 18446744073709551615ULL, -5};
   first.cloud.name = "tab\there, line\nthere, 100%, \xC3\xA4\x01";
   first.cloud.key = key(9);
@@ -83,7 +82,22 @@ TEST(Index, ReadsWhatItWrote) {
   EXPECT_EQ(indexText(*read), indexText(items));
   EXPECT_EQ(read->front().cloud.name, first.cloud.name);
   EXPECT_EQ(read->front().local.fingerprint, first.local.fingerprint);
-  EXPECT_EQ(read->front().contents, Item::Contents::here);
+}
+
+TEST(Item, IsHereUnlessItsFileIsAPlaceholderAndChangedWhenSomebodyHasWrittenIt) {
+  Item one = item("1", "a", 1);
+  EXPECT_FALSE(one.isHere());
+  EXPECT_FALSE(one.isChangedHere());
+  one.local.present = one.local.fingerprint = {key(1), 5, 7'000'000'001};
+  EXPECT_TRUE(one.isHere());
+  EXPECT_FALSE(one.isChangedHere());
+  one.local.present->modified += 1;
+  EXPECT_TRUE(one.isChangedHere());
+  for (const std::int64_t second : {std::int64_t{7'000'000'000}, std::int64_t{0}, std::int64_t{-3'000'000'000}}) {
+    one.local.present->modified = second + 314'159'265;
+    EXPECT_FALSE(one.isHere()) << second;
+    EXPECT_FALSE(one.isChangedHere()) << "whatever the index says of it";
+  }
 }
 
 TEST(Index, AnEmptyOneIsOne) {
@@ -97,16 +111,15 @@ TEST(Index, RefusesWhatIsNone) {
   const std::string heading = indexText({});
   const std::vector<std::string> bad = {
       "",
-      "cellar index 2\n",
-      good.substr(0, good.size() - 1),                                         // the last line is cut
-      heading + "\n",                                                          // an empty line
-      heading + "1\there\n",                                                   // fields are missing
-      good.substr(0, good.size() - 1) + "\tmore\n",                            // a field more
-      heading + "1\tgone" + good.substr(good.find("\ta\t")),                   // contents of no kind
-      heading + "\tplaceholder" + good.substr(good.find("\ta\t")),             // no identifier
-      heading + "1\tplaceholder\ta\tx" + good.substr(good.find("\ta\t") + 4),  // no number
-      heading + "1\tplaceholder\t%zz" + good.substr(good.find("\ta\t") + 2),   // no escape
-      heading + "1\tplaceholder\t%4" + good.substr(good.find("\ta\t") + 2),    // half an escape
+      "cellar index 1\n",
+      good.substr(0, good.size() - 1),                            // the last line is cut
+      heading + "\n",                                             // an empty line
+      heading + "1\ta\n",                                         // fields are missing
+      good.substr(0, good.size() - 1) + "\tmore\n",               // a field more
+      heading + good.substr(good.find("\ta\t")),                  // no identifier
+      heading + "1\ta\tx" + good.substr(good.find("\ta\t") + 4),  // no number
+      heading + "1\t%zz" + good.substr(good.find("\ta\t") + 2),   // no escape
+      heading + "1\t%4" + good.substr(good.find("\ta\t") + 2),    // half an escape
   };
   ASSERT_TRUE(parseIndex(good));
   for (const std::string& text : bad) EXPECT_FALSE(parseIndex(text)) << text;

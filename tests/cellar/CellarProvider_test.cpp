@@ -4,6 +4,7 @@
 #include <fcntl.h>
 #include <gtest/gtest.h>
 #include <sys/stat.h>
+#include <time.h>
 #include <unistd.h>
 
 #include <algorithm>
@@ -55,6 +56,20 @@ class CellarProviderTest : public ::testing::Test {
   static bool hasNoBlocks(const std::string& path) {
     struct stat status {};
     return stat(path.c_str(), &status) == 0 && status.st_blocks == 0;
+  }
+  static std::int64_t nanoseconds(const timespec& time) { return time.tv_sec * 1'000'000'000 + time.tv_nsec; }
+  static std::int64_t modified(const std::string& path) {
+    struct stat status {};
+    return stat(path.c_str(), &status) == 0 ? nanoseconds(status.st_mtim) : -1;
+  }
+  static void setModified(const std::string& path, std::int64_t time) {
+    const timespec times[2] = {{0, UTIME_OMIT}, {time / 1'000'000'000, time % 1'000'000'000}};
+    ASSERT_EQ(utimensat(AT_FDCWD, path.c_str(), times, 0), 0);
+  }
+  static std::int64_t coarseClock() {
+    timespec now{};
+    clock_gettime(CLOCK_REALTIME_COARSE, &now);
+    return nanoseconds(now);
   }
   [[nodiscard]] std::string local(const std::string& name) const { return storage + "/" + name; }
   [[nodiscard]] QXURL url(const std::string& name) const { return QXURL::fileURL(local(name), QXURLKind::file); }
@@ -378,6 +393,109 @@ TEST_F(CellarProviderTest, StoppingDoesNotTakeTheContentsFromWhoHasThemOpen) {
   }
   EXPECT_FALSE(provider->stopProviding(url("a.txt")));
   EXPECT_TRUE(hasNoBlocks(local("a.txt")));
+}
+
+TEST_F(CellarProviderTest, StoppingLeavesNoOtherFile) {
+  write(cloud + "/a.txt", "hello");
+  setUp();
+  start("a.txt");
+  EXPECT_FALSE(provider->stopProviding(url("a.txt")));
+  start("a.txt");
+  {
+    const std::ifstream reader(local("a.txt"));
+    EXPECT_TRUE(provider->stopProviding(url("a.txt")));
+  }
+  save("a.txt", "mine!");
+  EXPECT_TRUE(provider->stopProviding(url("a.txt")));
+  EXPECT_EQ(names(storage), std::vector<std::string>{"a.txt"});
+}
+
+TEST_F(CellarProviderTest, AWriteAfterStoppingIsAChangeLikeAnyOther) {
+  write(cloud + "/a.txt", "hello");
+  setUp();
+  start("a.txt");
+  EXPECT_FALSE(provider->stopProviding(url("a.txt")));
+  save("a.txt", "mine!");
+  start("a.txt");
+  EXPECT_EQ(read(local("a.txt")), "mine!");
+  change("a.txt");
+  EXPECT_EQ(read(cloud + "/a.txt"), "mine!");
+}
+
+TEST_F(CellarProviderTest, TheKernelsClockHidesNoWrite) {
+  // Two writes in one tick may have the same time. What is fetched has an old one, and what is sent is read when a tick has passed.
+  write(cloud + "/a.txt", "hello");
+  setUp();
+  start("a.txt");
+  EXPECT_EQ(modified(local("a.txt")), modified(cloud + "/a.txt"));
+  for (const char* text : {"one  ", "two  ", "three"}) {
+    write(local("a.txt"), text);
+    setModified(local("a.txt"), coarseClock() + 20'000'000);
+    change("a.txt");
+    EXPECT_GT(coarseClock(), modified(local("a.txt"))) << "the next write could hide behind this one";
+    EXPECT_EQ(read(cloud + "/a.txt"), text);
+  }
+}
+
+// --- Ended between putting a file in its place and saving the index
+
+TEST_F(CellarProviderTest, APlaceholderOfStoppingIsOneAlsoIfTheIndexDoesNotSaySo) {
+  write(cloud + "/a.txt", "hello");
+  setUp();
+  start("a.txt");
+  const std::string index = read(container + "/index");
+  EXPECT_FALSE(provider->stopProviding(url("a.txt")));
+  write(container + "/index", index);
+  restart();
+  change("a.txt");
+  EXPECT_EQ(read(cloud + "/a.txt"), "hello") << "zeros were taken for a change";
+  start("a.txt");
+  EXPECT_EQ(read(local("a.txt")), "hello");
+}
+
+TEST_F(CellarProviderTest, APlaceholderOfTheFirstSetupIsOneAlsoIfTheIndexDoesNotSaySo) {
+  write(cloud + "/a.txt", "hello");
+  const std::string before = identifier("a.txt");  // makes the index, with no file
+  const std::string index = read(container + "/index");
+  setUp();
+  write(container + "/index", index);
+  restart();
+  EXPECT_EQ(identifier("a.txt"), before);
+  start("a.txt");
+  EXPECT_EQ(read(local("a.txt")), "hello");
+}
+
+TEST_F(CellarProviderTest, APlaceholderOfANewerVersionIsOneAlsoIfTheIndexDoesNotSaySo) {
+  write(cloud + "/a.txt", "hello");
+  setUp();
+  const std::string index = read(container + "/index");
+  write(cloud + "/a.txt", "hello again");
+  setUp();
+  EXPECT_EQ(fs::file_size(local("a.txt")), 11U);
+  write(container + "/index", index);
+  restart();
+  start("a.txt");
+  EXPECT_EQ(read(local("a.txt")), "hello again");
+}
+
+TEST_F(CellarProviderTest, ContentsOfAStartStayAlsoIfTheIndexDoesNotSaySo) {
+  write(cloud + "/a.txt", "hello");
+  setUp();
+  const std::string index = read(container + "/index");
+  start("a.txt");
+  write(container + "/index", index);
+  restart();
+  start("a.txt");
+  EXPECT_EQ(read(local("a.txt")), "hello");
+}
+
+TEST_F(CellarProviderTest, ACopyOfAPlaceholderIsNotTheProvidersToRemove) {
+  write(cloud + "/a.txt", "hello");
+  setUp();
+  write(local("copy.txt"), std::string(5, '\0'));
+  setModified(local("copy.txt"), modified(local("a.txt")));
+  setUp();
+  EXPECT_EQ(names(storage), (std::vector<std::string>{"a.txt", "copy.txt"}));
 }
 
 TEST_F(CellarProviderTest, APlaceholderIsMadeForADocumentWithoutAFile) {
