@@ -56,18 +56,6 @@ std::map<pid_t, pid_t> parents() {
 
 }  // namespace
 
-bool eventually(const std::string& what, const std::function<bool()>& condition) {
-  const auto deadline = std::chrono::steady_clock::now() + kPatience;
-  while (!condition()) {
-    if (std::chrono::steady_clock::now() > deadline) {
-      ADD_FAILURE() << "never: " << what;
-      return false;
-    }
-    std::this_thread::sleep_for(kBetweenLooks);
-  }
-  return true;
-}
-
 DaemonHouse::DaemonHouse() {
   std::string pattern = (fs::temp_directory_path() / "dvXXXXXX").string();
   if (::mkdtemp(pattern.data()) == nullptr) throw std::runtime_error("no directory for a test");
@@ -142,16 +130,26 @@ std::vector<std::string> DaemonHouse::environment() const {
   return result;
 }
 
-void DaemonHouse::startDaemon(const std::string& logSetting) {
+UniqueDescriptor DaemonHouse::launchDaemon(const std::string& logSetting, const std::string& socketPath) {
   Command command{{program("docuvendd")}, environment(), {}, logDescriptor_.get()};
   command.environment.push_back("DOCUVEND_LOG=" + logSetting);
   daemon_ = std::make_unique<Process>(command);
-  linux_platform::UniqueDescriptor socket;
-  eventually("the daemon can be reached", [this, &socket] {
-    auto connected = linux_platform::connectToSocket(publicSocket(kDVServiceName));
-    if (auto* reached = std::get_if<linux_platform::UniqueDescriptor>(&connected)) socket = std::move(*reached);
+  UniqueDescriptor socket;
+  eventually("the daemon can be reached", [this, &socket, &socketPath] {
+    auto connected = linux_platform::connectToSocket(socketPath);
+    if (auto* reached = std::get_if<UniqueDescriptor>(&connected)) socket = std::move(*reached);
     return socket || !daemon_->isRunning();
   });
+  return socket;
+}
+
+void DaemonHouse::startDaemonWithoutWaiting(const std::string& logSetting) {
+  (void)launchDaemon(logSetting, administrationSocket());
+  ASSERT_TRUE(daemon_->isRunning()) << "the daemon ended at its start";
+}
+
+void DaemonHouse::startDaemon(const std::string& logSetting) {
+  auto socket = launchDaemon(logSetting, publicSocket(kDVServiceName));
   ASSERT_TRUE(daemon_->isRunning()) << "the daemon ended at its start";
   companion_ = std::make_unique<Client>(std::move(socket));
   ASSERT_EQ(companion_->ask<&DVDaemon::wakeUpCompletion>().index(), 0U);

@@ -13,6 +13,8 @@
 #include <vector>
 
 #include "platform/linux/base/UniqueDescriptor.h"
+#include "service/DVAdministration.h"
+#include "tests/support/Eventually.h"
 #include "tests/system/house/Client.h"
 #include "tests/system/house/Process.h"
 
@@ -24,9 +26,6 @@ inline const std::string kPicker = "com.orvane.picker";
 inline const std::string kStranger = "com.orvane.stranger";
 // The provider of provider/main.cpp, which does what an item's name says.
 inline const std::string kTrickster = "com.orvane.trickster";
-
-// True as soon as the condition is; false, and a test failure, when it never becomes so.
-bool eventually(const std::string& what, const std::function<bool()>& condition);
 
 class DaemonHouse {
  public:
@@ -48,6 +47,8 @@ class DaemonHouse {
   // What the file says, empty when there is none.
   [[nodiscard]] std::string accessControl() const { return contentsOf(accessControlFile()); }
   [[nodiscard]] std::string runtime() const { return root_ + "/r"; }
+  // Where the administration is.
+  [[nodiscard]] std::string administrationSocket() const { return runtime() + "/docuvend/" + kDVAdministrationServiceName; }
   [[nodiscard]] std::string publicSocket(const std::string& service) const { return runtime() + "/docuvend/public/" + service; }
 
   // Puts a document of the cellar in its cloud; where it will lie once it is provided.
@@ -60,6 +61,8 @@ class DaemonHouse {
 
   // Starts the daemon and waits until it answers. The connection on which it did stays open as long as the daemon runs.
   void startDaemon(const std::string& logSetting = "debug");
+  // The same, but waits only until its administration can be reached: clients may still wait for the providers then.
+  void startDaemonWithoutWaiting(const std::string& logSetting = "debug");
   // Starts another one, for its failure.
   [[nodiscard]] Ending runDaemon(const std::vector<std::string>& environment) const;
   void killDaemon();
@@ -94,6 +97,8 @@ class DaemonHouse {
   [[nodiscard]] std::vector<pid_t> processesOf(const std::string& program) const;
 
  private:
+  // Starts the daemon; a connection to the socket when it can be reached.
+  [[nodiscard]] linux_platform::UniqueDescriptor launchDaemon(const std::string& logSetting, const std::string& socketPath);
   [[nodiscard]] std::string share() const { return home_ + "/.local/share/docuvend"; }
   [[nodiscard]] std::string logFile() const { return root_ + "/log"; }
   void endDaemon(int signal);

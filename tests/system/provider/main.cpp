@@ -1,9 +1,12 @@
 // A provider that does what the name of an item says, and takes any name below its storage for an item.
 //
+//   performInitialSetup          waits while the file "hang" lies in its container
+//
 //   identifierForItem  control   an identifier with the character U+0001
 //                      refused   an error
 //                      garbage   bytes that are no frame, to the daemon
 //                      abort     abort()
+//                      knock     what the administration answers at the socket "door" in its group's container
 //                      anything  the name
 //   startProviding     stuck     says so, and waits until the file "free" lies in its container
 //                      anything  succeeds
@@ -24,6 +27,7 @@
 #include <thread>
 
 #include "sdk/Provider.h"
+#include "tests/system/knock.h"
 
 namespace docuvend {
 namespace {
@@ -44,6 +48,7 @@ std::string nameOf(const QXURL& url) {
 class Trickster : public Provider {
  public:
   [[nodiscard]] Failure performInitialSetup() override {
+    while (access("hang", F_OK) == 0) std::this_thread::sleep_for(std::chrono::milliseconds(1));
     std::error_code error;
     std::filesystem::create_directory(storage(), error);
     if (error) return QXError::system(error.value(), "cannot make the storage");
@@ -66,6 +71,7 @@ class Trickster : public Provider {
     if (name == "control") return ItemID{"one\x01two"};
     if (name == "refused") return refusal();
     if (name == "abort") std::abort();
+    if (name == "knock") return ItemID{tests::knock(storage() + "/../door", {"first-unlock"})};
     if (name == "garbage") {
       std::array<unsigned char, 64> bytes{};
       bytes.fill(0xff);
