@@ -56,9 +56,9 @@ TEST_F(Commands, AURLAndAPathNameTheSameDocument) {
 TEST_F(Commands, AGrantPrintsWhatOpensTheDocument) {
   const std::string url = QXURL::fileURL(letter_, QXURLKind::file).absoluteString();
   const std::string sibling = QXURL::fileURL(house_.document(".letter.txt"), QXURLKind::file).absoluteString();
-  const std::string token = "docuvend-token:1:rw:[^ \n\"]*";
+  const std::string token = "docuvend-token:[^ \t\n\"]*";
   EXPECT_THAT(house_.confined(kPicker, {"grant", letter_, kCellar, kStranger}).output,
-              MatchesRegex("url " + url + "\ntoken " + token + "\nsiblingURL " + sibling + "\nsiblingToken " + token + "\n"));
+              MatchesRegex("url\t" + url + "\ntoken\t" + token + "\nsiblingURL\t" + sibling + "\nsiblingToken\t" + token + "\n"));
   EXPECT_THAT(house_.confined(kPicker, {"--json", "grant", letter_, kCellar, kStranger}).output,
               MatchesRegex("\\{\"url\":\"" + url + "\",\"token\":\"" + token + "\",\"siblingURL\":\"" + sibling + "\",\"siblingToken\":\"" +
                            token + "\"\\}\n"));

@@ -35,7 +35,7 @@ class MainWay : public SystemTest {
 TEST_F(MainWay, TheProviderIsListedWithItsStorage) {
   const Ending providers = house_.confined(kPicker, {"providers"});
   EXPECT_EQ(providers.status, 0) << providers.errors;
-  EXPECT_EQ(providers.output, QXURL::fileURL(house_.storage(kCellar), QXURLKind::directory).absoluteString() + "\n");
+  EXPECT_EQ(providers.output, kCellar + "\t" + QXURL::fileURL(house_.storage(kCellar), QXURLKind::directory).absoluteString() + "\n");
   EXPECT_EQ(house_.logged("[INFO] Registered docuvend extension com.orvane.cellar for path " +
                           QXURL::fileURL(house_.storage(kCellar), QXURLKind::directory).absoluteString()),
             1);

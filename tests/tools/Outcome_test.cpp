@@ -5,14 +5,19 @@
 #include <vector>
 
 #include "common/DVErrors.h"
+#include "platform/linux/bundles/BundleErrors.h"
 #include "platform/linux/wire/SandboxProtocol.h"
 #include "platform/rpc_errors.h"
-#include "sdk/Consumer.h"
+#include "sdk/ConsumerErrors.h"
 
 namespace docuvend::ctl {
 namespace {
 
+using linux_platform::BundleErrorCode;
+
 QXError own(ConsumerErrorCode code) { return QXError::make(kConsumerErrorDomain, static_cast<std::int64_t>(code), "x"); }
+
+QXError bundle(BundleErrorCode code) { return linux_platform::bundleError(code, "x"); }
 
 TEST(Outcome, AKindOfFailureHasAStatusOfItsOwn) {
   const QXURL url = *QXURL::fromString("file:///x");
@@ -34,16 +39,32 @@ TEST(Outcome, AKindOfFailureHasAStatusOfItsOwn) {
       {DVNotFoundError(foreign), ExitStatus::notFound},
       {own(ConsumerErrorCode::unreachable), ExitStatus::unreachable},
       {own(ConsumerErrorCode::deadlinePassed), ExitStatus::deadlinePassed},
+      {own(ConsumerErrorCode::connectionLost), ExitStatus::unreachable},
       {own(ConsumerErrorCode::noAnswer), ExitStatus::notFound},
       {own(ConsumerErrorCode::noToken), ExitStatus::notPermitted},
       {QXError::make(linux_platform::kQXSandboxErrorDomain, 3, "x"), ExitStatus::fileError},
       {QXError::system(2, "x"), ExitStatus::fileError},
+      {bundle(BundleErrorCode::noBundle), ExitStatus::invalidInput},
+      {bundle(BundleErrorCode::forbidden), ExitStatus::invalidInput},
+      {bundle(BundleErrorCode::tooLarge), ExitStatus::invalidInput},
+      {bundle(BundleErrorCode::notPermitted), ExitStatus::notPermitted},
+      {bundle(BundleErrorCode::notFound), ExitStatus::notFound},
+      {bundle(BundleErrorCode::inTheWay), ExitStatus::fileError},
+      {makeControlError(ControlErrorCode::usage, "x"), ExitStatus::usage},
+      {makeControlError(ControlErrorCode::confined, "x"), ExitStatus::notPermitted},
       {foreign, ExitStatus::other},
       {QXError::make(kQXRpcErrorDomain, static_cast<std::int64_t>(QXRpcErrorCode::refused), "x"), ExitStatus::other},
       {QXError::make(kDVErrorDomain, 999, "x"), ExitStatus::other},
       {QXError::make(kConsumerErrorDomain, 999, "x"), ExitStatus::other},
+      {QXError::make(kControlErrorDomain, 999, "x"), ExitStatus::other},
+      {QXError::make(linux_platform::kBundleErrorDomain, 999, "x"), ExitStatus::other},
   };
   for (const auto& [error, status] : table) EXPECT_EQ(statusOf(error), status) << error.description();
+}
+
+TEST(Outcome, ItsOwnFailuresAreToldWithoutDomainAndCode) {
+  EXPECT_EQ(messageOf(makeControlError(ControlErrorCode::usage, "no command")), "no command");
+  EXPECT_EQ(messageOf(DVNotPermittedError()), DVNotPermittedError().description());
 }
 
 }  // namespace

@@ -10,7 +10,7 @@ namespace docuvend::ctl {
 namespace {
 
 using ::testing::EndsWith;
-using ::testing::HasSubstr;
+using ::testing::MatchesRegex;
 using ::testing::StartsWith;
 using tests::Ending;
 
@@ -25,19 +25,39 @@ void expectOneLine(const std::string& text) {
   EXPECT_EQ(text.find('\n'), text.size() - 1) << text;
 }
 
-TEST(Docuvendctl, ExplainsItself) {
+TEST(Docuvendctl, ExplainsItselfAndACommandInBothWays) {
   const Ending help = run({"--help"});
   EXPECT_EQ(help.status, 0);
   EXPECT_EQ(help.errors, "");
   EXPECT_THAT(help.output, StartsWith("docuvendctl [--as BUNDLE] [--json] [--timeout SECONDS] COMMAND [OPERAND...]\n"));
-  for (const char* command : {"wake", "providers", "grant", "start", "bookmark", "resolve", "cat", "put"}) {
-    EXPECT_THAT(help.output, HasSubstr("\n  " + std::string(command) + " ")) << command;
+  EXPECT_EQ(run({"help"}).output, help.output);
+  const Ending grant = run({"grant", "--help"});
+  EXPECT_EQ(grant.status, 0);
+  EXPECT_THAT(grant.output, StartsWith("docuvendctl grant URL PROVIDER CONSUMER\n"));
+  EXPECT_EQ(run({"help", "grant"}).output, grant.output);
+  EXPECT_THAT(run({"--json", "grant", "--help"}).output, StartsWith("{\"help\":\"docuvendctl grant "));
+}
+
+TEST(Docuvendctl, TellsItsVersion) {
+  for (const char* word : {"version", "--version"}) {
+    const Ending version = run({word});
+    EXPECT_EQ(version.status, 0);
+    EXPECT_THAT(version.output, MatchesRegex("[0-9]+\\.[0-9]+\\.[0-9]+\n"));
   }
+  EXPECT_THAT(run({"version", "--json"}).output, MatchesRegex("\\{\"version\":\"[0-9.]+\"\\}\n"));
 }
 
 TEST(Docuvendctl, AWrongCommandLineIsOneLineAndStatus2) {
-  for (const auto& arguments : std::vector<std::vector<std::string>>{
-           {}, {"--what"}, {"dance"}, {"wake", "up"}, {"grant", "/x", "p"}, {"cat"}, {"--timeout", "0", "wake"}}) {
+  for (const auto& arguments : std::vector<std::vector<std::string>>{{},
+                                                                     {"--what"},
+                                                                     {"dance"},
+                                                                     {"wake", "up"},
+                                                                     {"grant", "/x", "p"},
+                                                                     {"cat"},
+                                                                     {"--timeout", "0", "wake"},
+                                                                     {"help", "dance"},
+                                                                     {"platform"},
+                                                                     {"wake", "--what"}}) {
     const Ending ending = run(arguments);
     EXPECT_EQ(ending.status, 2) << ending.errors;
     EXPECT_EQ(ending.output, "");
@@ -61,6 +81,16 @@ TEST(Docuvendctl, WithoutADaemonItSaysSoWithStatus7) {
     expectOneLine(ending.errors);
   }
   std::filesystem::remove(place);
+}
+
+TEST(Docuvendctl, AWrongCommandLineInJSONIsOneObject) {
+  const Ending ending = run({"dance", "--json"});
+  EXPECT_EQ(ending.status, 2);
+  EXPECT_EQ(ending.output, "");
+  EXPECT_EQ(
+      ending.errors,
+      "{\"error\":{\"domain\":\"DVControlErrorDomain\",\"code\":1,\"description\":\"DVControlErrorDomain 1: unknown command dance; --help "
+      "lists them\"}}\n");
 }
 
 TEST(Docuvendctl, AFailureInJSONIsOneObject) {

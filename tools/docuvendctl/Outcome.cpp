@@ -1,11 +1,42 @@
 #include "tools/docuvendctl/Outcome.h"
 
+#include <utility>
+
 #include "common/DVErrors.h"
+#include "platform/linux/bundles/BundleErrors.h"
 #include "platform/linux/wire/SandboxProtocol.h"
-#include "sdk/Consumer.h"
+#include "sdk/ConsumerErrors.h"
 
 namespace docuvend::ctl {
 namespace {
+
+using linux_platform::BundleErrorCode;
+
+ExitStatus statusOfBundleError(BundleErrorCode code) {
+  switch (code) {
+    case BundleErrorCode::noBundle:
+    case BundleErrorCode::forbidden:
+    case BundleErrorCode::tooLarge:
+      return ExitStatus::invalidInput;
+    case BundleErrorCode::notPermitted:
+      return ExitStatus::notPermitted;
+    case BundleErrorCode::notFound:
+      return ExitStatus::notFound;
+    case BundleErrorCode::inTheWay:
+      return ExitStatus::fileError;
+  }
+  return ExitStatus::other;
+}
+
+ExitStatus statusOfControlError(ControlErrorCode code) {
+  switch (code) {
+    case ControlErrorCode::usage:
+      return ExitStatus::usage;
+    case ControlErrorCode::confined:
+      return ExitStatus::notPermitted;
+  }
+  return ExitStatus::other;
+}
 
 ExitStatus statusOfSystemError(DVErrorCode code, const QXError& error) {
   switch (code) {
@@ -31,6 +62,10 @@ ExitStatus statusOfSystemError(DVErrorCode code, const QXError& error) {
 
 }  // namespace
 
+QXError makeControlError(ControlErrorCode code, std::string description) {
+  return QXError::make(kControlErrorDomain, static_cast<std::int64_t>(code), std::move(description));
+}
+
 ExitStatus statusOf(const QXError& error) {
   if (error.domain == kDVErrorDomain) return statusOfSystemError(static_cast<DVErrorCode>(error.code), error);
   if (error.domain == kConsumerErrorDomain) {
@@ -48,8 +83,15 @@ ExitStatus statusOf(const QXError& error) {
         return ExitStatus::notPermitted;
     }
   }
+  if (error.domain == kControlErrorDomain) return statusOfControlError(static_cast<ControlErrorCode>(error.code));
+  if (error.domain == linux_platform::kBundleErrorDomain) return statusOfBundleError(static_cast<BundleErrorCode>(error.code));
   if (error.domain == linux_platform::kQXSandboxErrorDomain || error.domain == kQXSystemErrorDomain) return ExitStatus::fileError;
   return ExitStatus::other;
+}
+
+std::string messageOf(const QXError& error) {
+  const auto description = error.texts.find("description");
+  return error.domain == kControlErrorDomain && description != error.texts.end() ? description->second : error.description();
 }
 
 }  // namespace docuvend::ctl

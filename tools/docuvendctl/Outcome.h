@@ -1,5 +1,8 @@
-// How a command ends: what it prints and the exit status that says what kind of failure it was.
+// How a command ends: the exit status that says what kind of failure it was, and the failures that are docuvendctl's own.
 #pragma once
+
+#include <cstdint>
+#include <string>
 
 #include "platform/QXError.h"
 
@@ -19,6 +22,17 @@ enum class ExitStatus {
   other = 10,
 };
 
+inline constexpr const char* kControlErrorDomain = "DVControlErrorDomain";
+enum class ControlErrorCode : std::int64_t {
+  usage = 1,     // the command line is wrong
+  confined = 2,  // asked from inside a confinement, where it cannot be done
+};
+
+[[nodiscard]] QXError makeControlError(ControlErrorCode code, std::string description);
+
 [[nodiscard]] ExitStatus statusOf(const QXError& error);
+
+// One line for a person: docuvendctl's own failures need no domain and no code.
+[[nodiscard]] std::string messageOf(const QXError& error);
 
 }  // namespace docuvend::ctl
