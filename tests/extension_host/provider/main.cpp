@@ -12,6 +12,7 @@
 //                       suspend      stops the process as a whole
 //                       spin         keeps the thread busy that reads the connection
 //                       anything     succeeds
+//   performInitialSetup as the file "setup" in its container says: "hang" never answers, a number fails that often
 //   itemURL             the URL of a file of that name in its container
 #include <fcntl.h>
 #include <signal.h>
@@ -23,6 +24,7 @@
 #include <cstdio>
 #include <cstdlib>
 #include <filesystem>
+#include <fstream>
 #include <string>
 #include <thread>
 #include <vector>
@@ -66,7 +68,15 @@ void spinReader() {
 
 class TestProvider : public Provider {
  public:
-  [[nodiscard]] Failure performInitialSetup() override { return std::nullopt; }
+  [[nodiscard]] Failure performInitialSetup() override {
+    std::string what = "0";
+    std::ifstream("setup") >> what;
+    if (what == "hang") waitForever();
+    const int failures = std::stoi(what);
+    if (failures == 0) return std::nullopt;
+    std::ofstream("setup") << failures - 1;
+    return QXError::make("TestProvider", 2, "not yet");
+  }
   [[nodiscard]] Failure providePlaceholder(const QXURL&) override { return std::nullopt; }
 
   [[nodiscard]] Failure startProviding(const QXURL& url) override {
