@@ -94,6 +94,12 @@ TEST(DVGrantPage, FitsIntoAMessageWhateverItHolds) {
   EXPECT_TRUE(fitsIntoAMessage(page));
 }
 
+TEST(DVGrantPage, IsAsLongAsTheProtocolsPageSays) {
+  EXPECT_EQ(kDVMaximumGrantsOfPage, 1000U);
+  EXPECT_EQ(kDVMaximumTextBytesOfPage, 524288U);
+  EXPECT_EQ(kDVLongestIdentifier, 65536U);
+}
+
 TEST(DVGrantPage, ALongestIdentifierIsWhatAMessageCarriesAndALongerOneIsLeftOut) {
   EXPECT_EQ(kDVLongestIdentifier, linux_platform::kMaximumTextBytes);
   const std::string longest(kDVLongestIdentifier, 'x');

@@ -11,6 +11,7 @@
 #include "platform/rpc_errors.h"
 #include "platform/rpc_protocol.h"
 #include "providers/_QXDocuvendVendor.h"
+#include "service/DVAdministration.h"
 #include "service/DVDaemon.h"
 #include "tests/wire/ProtocolRows.h"
 #include "tests/wire/WorkedExchange.h"
@@ -90,6 +91,10 @@ TEST_F(ProtocolPageTest, ShowsTheBytesOfAPingAndAPong) {
 
 TEST_F(ProtocolPageTest, ListsTheOperationsOfTheDaemonInOrder) {
   EXPECT_EQ(rows("Operations: `DVDaemon`"), protocolRows(qxInterfaceOf<DVDaemon>()));
+}
+
+TEST_F(ProtocolPageTest, ListsTheOperationsOfTheAdministrationInOrder) {
+  EXPECT_EQ(rows("Operations: `DVAdministration`"), protocolRows(qxInterfaceOf<DVAdministration>()));
 }
 
 TEST_F(ProtocolPageTest, ListsTheOperationsOfThePlatformsServicesInOrder) {
