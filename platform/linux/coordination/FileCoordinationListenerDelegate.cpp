@@ -7,10 +7,8 @@ namespace docuvend::linux_platform {
 
 bool FileCoordinationListenerDelegate::listener(QXRpcListener& /*listener*/,
                                                 const std::shared_ptr<QXRpcConnection>& shouldAcceptNewConnection) {
-  auto servicer = std::make_shared<FileCoordinationServicer>(coordinator_, sandbox_, shouldAcceptNewConnection);
-  shouldAcceptNewConnection->setExportedInterface(qxInterfaceOf<QXFileCoordination>());
-  shouldAcceptNewConnection->setExportedObject(std::make_shared<QXRpcExport<QXFileCoordination>>(std::move(servicer)));
-  shouldAcceptNewConnection->resume();
+  qxServe<QXFileCoordination>(*shouldAcceptNewConnection,
+                              std::make_shared<FileCoordinationServicer>(coordinator_, sandbox_, shouldAcceptNewConnection));
   return true;
 }
 

@@ -6,10 +6,7 @@
 namespace docuvend::linux_platform {
 
 bool SandboxListenerDelegate::listener(QXRpcListener& /*listener*/, const std::shared_ptr<QXRpcConnection>& shouldAcceptNewConnection) {
-  auto servicer = std::make_shared<SandboxServicer>(sandbox_, log_, shouldAcceptNewConnection);
-  shouldAcceptNewConnection->setExportedInterface(qxInterfaceOf<QXSandboxRedemption>());
-  shouldAcceptNewConnection->setExportedObject(std::make_shared<QXRpcExport<QXSandboxRedemption>>(std::move(servicer)));
-  shouldAcceptNewConnection->resume();
+  qxServe<QXSandboxRedemption>(*shouldAcceptNewConnection, std::make_shared<SandboxServicer>(sandbox_, log_, shouldAcceptNewConnection));
   return true;
 }
 
