@@ -1,5 +1,6 @@
 // A provider that does what the name of an item says, and takes any name below its storage for an item.
 //
+//   at the start                 if the file "flood" lies in its container, removes it, floods the daemon with frames and ends
 //   performInitialSetup          waits while the file "hang" lies in its container
 //
 //   identifierForItem  control   an identifier with the character U+0001
@@ -7,8 +8,12 @@
 //                      garbage   bytes that are no frame, to the daemon
 //                      abort     abort()
 //                      knock     what the administration answers at the socket "door" in its group's container
+//                      hoard     has as many descriptors on their way as the kernel allows it, and says so
 //                      anything  the name
 //   startProviding     stuck     says so, and waits until the file "free" lies in its container
+//                      forks     starts as many processes as it may, says so, and waits in the same way
+//                      memory    allocates memory until there is none, which ends it
+//                      chatter   writes 20,000 lines
 //                      anything  succeeds
 //   itemURL            outside   a file of the system
 //                      cellar    a file where another provider has its documents
@@ -28,11 +33,13 @@
 
 #include "sdk/Provider.h"
 #include "tests/system/knock.h"
+#include "tests/system/provider/excess.h"
 
 namespace docuvend {
 namespace {
 
 constexpr int kDaemonSocket = 3;
+constexpr int kManyLines = 20'000;
 
 QXError refusal() { return QXError::make("TricksterErrorDomain", 1, "No."); }
 
@@ -54,23 +61,27 @@ class Trickster : public Provider {
     if (error) return QXError::system(error.value(), "cannot make the storage");
     return std::nullopt;
   }
-  [[nodiscard]] Failure providePlaceholder(const QXURL&) override { return std::nullopt; }
+  [[nodiscard]] Failure providePlaceholder(const QXURL& url) override { return performAsNamed(url); }
 
   [[nodiscard]] Failure startProviding(const QXURL& url) override {
-    if (nameOf(url) != "stuck") return std::nullopt;
-    std::fputs("is stuck\n", stderr);
-    while (access("free", F_OK) != 0) std::this_thread::sleep_for(std::chrono::milliseconds(1));
+    const std::string name = nameOf(url);
+    if (name == "memory") tests::allocateWithoutEnd();
+    if (name == "chatter") tests::chatter(kManyLines);
+    if (name == "stuck") std::fputs("is stuck\n", stderr);
+    if (name == "forks") std::fprintf(stderr, "has started %d processes\n", tests::forkWithoutEnd());
+    while ((name == "stuck" || name == "forks") && access("free", F_OK) != 0) std::this_thread::sleep_for(std::chrono::milliseconds(1));
     return std::nullopt;
   }
 
   [[nodiscard]] Failure itemChanged(const QXURL&) override { return std::nullopt; }
-  [[nodiscard]] Failure stopProviding(const QXURL&) override { return std::nullopt; }
+  [[nodiscard]] Failure stopProviding(const QXURL& url) override { return performAsNamed(url); }
 
   [[nodiscard]] Result<ItemID> identifierForItem(const QXURL& url) override {
     const std::string name = nameOf(url);
     if (name == "control") return ItemID{"one\x01two"};
     if (name == "refused") return refusal();
     if (name == "abort") std::abort();
+    if (name == "hoard") std::fprintf(stderr, "has hoarded %d descriptors\n", tests::hoardDescriptors());
     if (name == "knock") return ItemID{tests::knock(storage() + "/../door", {"first-unlock"})};
     if (name == "garbage") {
       std::array<unsigned char, 64> bytes{};
@@ -88,12 +99,23 @@ class Trickster : public Provider {
     if (name == "storage") return QXURL::fileURL(storage(), QXURLKind::directory);
     return QXURL::fileURL(storage() + "/" + name, QXURLKind::file);
   }
+
+ private:
+  static Failure performAsNamed(const QXURL& url) {
+    if (nameOf(url) == "sour") return refusal();
+    if (nameOf(url) == "bomb") std::abort();
+    return std::nullopt;
+  }
 };
 
 }  // namespace
 }  // namespace docuvend
 
 int main() {
+  if (unlink("flood") == 0) {
+    docuvend::tests::floodWithFrames(docuvend::kDaemonSocket);
+    return 0;
+  }
   docuvend::Trickster provider;
   return docuvend::runProvider(provider);
 }
