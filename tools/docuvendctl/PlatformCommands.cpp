@@ -1,4 +1,6 @@
+#include <cerrno>
 #include <charconv>
+#include <cstdint>
 #include <memory>
 
 #include "platform/linux/files/LinuxDeviceLock.h"
@@ -50,7 +52,14 @@ Result<Answer> lockState(const Call& call) {
   return done(write(paths, std::get<LockState>(wanted)));
 }
 
-// The file comes first: a daemon that starts meanwhile reads it.
+// Nobody listens, so that no daemon of this user runs.
+bool isNotRunning(const QXError& error) {
+  if (error.domain != kConsumerErrorDomain || error.code != static_cast<std::int64_t>(ConsumerErrorCode::unreachable)) return false;
+  const QXError* reason = error.underlying.get();
+  return reason != nullptr && reason->domain == kQXSystemErrorDomain && (reason->code == ENOENT || reason->code == ECONNREFUSED);
+}
+
+// The file comes first: a daemon that cannot be told yet reads it later in its start.
 Result<Answer> firstUnlock(const Call& call) {
   auto found = unconfinedPaths();
   if (auto* error = std::get_if<QXError>(&found)) return *error;
@@ -62,8 +71,7 @@ Result<Answer> firstUnlock(const Call& call) {
   Administrator::Options options;
   if (call.deadline) options.deadline = *call.deadline;
   auto connected = Administrator::connect(options);
-  // Who does not run yet needs no announcement.
-  if (std::holds_alternative<QXError>(connected)) return Answer(Nothing{});
+  if (const auto* error = std::get_if<QXError>(&connected)) return done(isNotRunning(*error) ? std::nullopt : Failure(*error));
   return done(std::get<std::unique_ptr<Administrator>>(connected)->announceFirstUnlock());
 }
 
