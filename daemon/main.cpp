@@ -26,9 +26,10 @@ int main(int, char** arguments) {
   platform.publishServices();
   const auto server = std::make_shared<DVServer>();
   server->setAccessControlStore(DVAccessControlStore::sharedStore());
-  server->startCompletion(/*completion=*/{});
+  // Before the server looks whether the device has been unlocked: whoever unlocks it and finds nobody to tell has been seen then.
   const auto administration = std::make_shared<DVAdministrationService>();
   administration->start();
+  server->startCompletion(/*completion=*/{});
   QXPlatform::current().queues.mainRunLoop().run();
   return EXIT_SUCCESS;
 }
