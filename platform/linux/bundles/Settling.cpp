@@ -8,7 +8,9 @@ namespace docuvend::linux_platform {
 void Settling::changed(Time now) {
   if (!pending_) pending_ = Span{now, now};
   pending_->last = now;
-  if (lastFind_ && now - *lastFind_ > kBusy) quiet_ = kShortestQuiet;
+  if (!lastFind_ || now - *lastFind_ <= kBusy) return;
+  quiet_ = kShortestQuiet;
+  wait_ = kFirstWait;
 }
 
 void Settling::wasWritten(const std::string& bundle, Time now) { written_.try_emplace(bundle, Span{now, now}).first->second.last = now; }
@@ -40,6 +42,7 @@ void Settling::looked(Time began, Found found) {
   std::erase_if(written_, [began](const auto& entry) { return endOf(entry.second) <= began; });
   if (found == Found::nothingNew) return;
   quiet_ = std::min(quiet_ * 2, kLongestQuiet);
+  wait_ = std::min(wait_ * 2, kLongestWait);
   lastFind_ = began;
 }
 

@@ -1,7 +1,8 @@
 // Decides when the registry looks at its directories, and which bundles it does not judge yet. A value without clock: it is told the time.
 //
 // An installation is many changes: a look waits until nothing has changed for a moment, but never for long. While looks keep finding
-// something new, the moment grows, so that a hundred changes in a row are seen in few looks and a single one at once.
+// something new, both grow, so that a hundred changes in a row are seen in few looks and a single one at once. (Whatever a look finds has a
+// price: a provider that was there for a moment only is tried to be set up for seconds.)
 //
 // A bundle that is written in place (copied into the directory, or edited there) is looked at when nothing has been written there for
 // longer, and meanwhile counts as what it was. One that is renamed into place is whole.
@@ -24,8 +25,9 @@ class Settling {
 
   static constexpr Duration kShortestQuiet{20};
   static constexpr Duration kLongestQuiet{160};
-  static constexpr Duration kLongestWait{1'000};      // for quiet, after the first change
-  static constexpr Duration kBusy{2'000};             // after a look that found changes; then the moment is short again
+  static constexpr Duration kFirstWait{1'000};  // at most, after the first change, also when there is no quiet
+  static constexpr Duration kLongestWait{4'000};
+  static constexpr Duration kBusy{5'000};             // after a look that found changes; then both are short again
   static constexpr Duration kQuietInPlace{200};       // of one bundle
   static constexpr Duration kLongestInPlace{10'000};  // a bundle that is written to for ever is looked at so often
 
@@ -48,7 +50,7 @@ class Settling {
     Time last;
   };
 
-  [[nodiscard]] Time lookAfter(const Span& changes) const { return std::min<Time>(changes.last + quiet_, changes.first + kLongestWait); }
+  [[nodiscard]] Time lookAfter(const Span& changes) const { return std::min<Time>(changes.last + quiet_, changes.first + wait_); }
   [[nodiscard]] static Time endOf(const Span& written) {
     return std::min<Time>(written.last + kQuietInPlace, written.first + kLongestInPlace);
   }
@@ -57,6 +59,7 @@ class Settling {
   std::map<std::string, Span> written_;  // bundles that were written in place, until they are judged
   std::optional<Time> lastFind_;         // when a look last found changes
   Duration quiet_ = kShortestQuiet;
+  Duration wait_ = kFirstWait;
 };
 
 }  // namespace docuvend::linux_platform
