@@ -2,6 +2,7 @@
 
 #include <algorithm>
 #include <cassert>
+#include <system_error>
 #include <utility>
 
 namespace docuvend {
@@ -15,10 +16,17 @@ void WorkerThreads::perform(std::function<void()> work) {
   const std::lock_guard lock(mutex_);
   if (isFinished_) return;
   waiting_.push_back(std::move(work));
-  if (idle_ < waiting_.size() && threads_.size() < limit_) {
-    threads_.emplace_back([this] { run(); });  // joined before this object goes
-  }
+  if (idle_ < waiting_.size() && threads_.size() < limit_) addThread();
   changed_.notify_one();
+}
+
+// A process at its limit of threads goes on with those that it has.
+void WorkerThreads::addThread() {
+  try {
+    threads_.emplace_back([this] { run(); });  // joined before this object goes
+  } catch (const std::system_error&) {
+    if (threads_.empty()) throw;
+  }
 }
 
 bool WorkerThreads::finish(std::chrono::milliseconds patience) {

@@ -33,6 +33,7 @@ class WorkerThreads {
 
  private:
   void run();
+  void addThread();
 
   const std::size_t limit_;
   std::mutex mutex_;  // guards all below

@@ -9,7 +9,7 @@ namespace docuvend::tests {
 [[noreturn]] void allocateWithoutEnd();
 // Makes children, which wait for ever, until it is refused; how many there are.
 int forkWithoutEnd();
-// Leaves descriptors in sockets of its own until the kernel passes no more on for this process; how many there are.
+// Leaves thousands of descriptors in sockets of its own, as far as the kernel passes them on for this process; how many there are.
 int hoardDescriptors();
 // Writes this many lines to the standard error output.
 void chatter(int lines);
