@@ -1,6 +1,8 @@
-#include <string>
+#include "tools/docuvendctl/FlatRecord.h"
 
-#include "tools/docuvendctl/AnswerText.h"
+#include <cstddef>
+#include <utility>
+#include <variant>
 
 namespace docuvend::ctl {
 namespace {

@@ -1,7 +1,9 @@
+#include "tools/docuvendctl/JSONText.h"
+
 #include <nlohmann/json.hpp>
 #include <string>
 
-#include "tools/docuvendctl/AnswerText.h"
+#include "tools/docuvendctl/FlatRecord.h"
 
 namespace docuvend::ctl {
 namespace {

@@ -1,4 +1,6 @@
-#include "tools/docuvendctl/AnswerText.h"
+#include "tools/docuvendctl/PlainText.h"
+
+#include "tools/docuvendctl/FlatRecord.h"
 
 namespace docuvend::ctl {
 namespace {

@@ -5,10 +5,12 @@
 #include <string>
 
 #include "platform/linux/log/LogText.h"
-#include "tools/docuvendctl/AnswerText.h"
 #include "tools/docuvendctl/Copy.h"
+#include "tools/docuvendctl/JSONText.h"
 #include "tools/docuvendctl/Outcome.h"
+#include "tools/docuvendctl/PlainText.h"
 #include "tools/docuvendctl/Terminal.h"
+#include "tools/docuvendctl/TerminalText.h"
 
 namespace docuvend::ctl {
 namespace {

@@ -1,9 +1,11 @@
+#include "tools/docuvendctl/TerminalText.h"
+
 #include <algorithm>
 #include <cctype>
 #include <numeric>
 
 #include "platform/linux/log/LogText.h"
-#include "tools/docuvendctl/AnswerText.h"
+#include "tools/docuvendctl/FlatRecord.h"
 #include "tools/docuvendctl/TextWidth.h"
 
 namespace docuvend::ctl {
