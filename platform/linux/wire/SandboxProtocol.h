@@ -21,7 +21,7 @@ inline constexpr const char* kSandboxServiceName = "com.orvane.Sandbox";
 inline constexpr const char* kQXSandboxErrorDomain = "QXSandboxErrorDomain";
 
 enum class SandboxErrorCode : std::int64_t {
-  badToken = 1,        // absent, malformed, changed, or issued under another key: ask for a new one
+  badToken = 1,        // absent, malformed, changed, taken back, or issued under another key: ask for a new one
   notRegularFile = 2,  // no longer a regular file with one link, or the way to it leads through a symbolic link
   gone = 3,            // the file, its directory, or the container is not there
   busy = 4,            // somebody holds the file in a way that an open would wait for: try again
