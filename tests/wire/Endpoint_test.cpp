@@ -3,6 +3,7 @@
 #include <fcntl.h>
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
+#include <sys/resource.h>
 #include <sys/stat.h>
 #include <sys/un.h>
 
@@ -421,6 +422,24 @@ TEST_F(EndpointTest, AnEndpointAwaitsAnswersUntilTheLastHasCome) {
   EXPECT_FALSE(client.endpoint->awaitsAnswers());
 }
 
+TEST_F(EndpointTest, WhenTheSystemPassesNoMoreDescriptorsOnTheConnectionEndsAndNobodyWaitsForEver) {
+  auto raw = connectRaw(nullptr);
+  raw.sayHello();
+  rlimit usual{};
+  ASSERT_EQ(::getrlimit(RLIMIT_NOFILE, &usual), 0);
+  const rlimit tight{64, usual.rlim_max};
+  ASSERT_EQ(::setrlimit(RLIMIT_NOFILE, &tight), 0);
+  // What lies in the socket counts, and the peer takes nothing.
+  const auto remote = server.endpoint->remoteObjectProxy([this](const QXError& error) { errors.put(error); });
+  for (int i = 0; i < 200 && server.closed->count() == 0; ++i) {
+    remote->send(kOpen, {toValue(UniqueDescriptor(::open("/dev/null", O_RDWR | O_CLOEXEC)))}, intoReplies());
+  }
+  EXPECT_EQ(::setrlimit(RLIMIT_NOFILE, &usual), 0);
+  EXPECT_THAT(server.closed->take(), IsSystemError(ETOOMANYREFS));
+  EXPECT_THAT(errors.take(), IsSystemError(ETOOMANYREFS));
+  EXPECT_EQ(server.blamed->count(), 0U);
+}
+
 TEST_F(EndpointTest, DescriptorsTravelInBothDirections) {
   connect(recorder);
   UniqueDescriptor file(::open("/dev/null", O_RDWR | O_CLOEXEC));
@@ -569,6 +588,36 @@ TEST_F(EndpointTest, AMessageToAPeerThatHasLeftIsUnsentAlsoBeforeItsLeavingIsSee
   server.endpoint->remoteObjectProxy([&fates](const QXError&, MessageFate fate) { fates.put(fate); })->send(kList, {}, intoReplies());
   server.endpoint->resume();
   EXPECT_EQ(fates.take(), MessageFate::unsent);
+}
+
+TEST_F(EndpointTest, AMessageToAPeerThatLeavesWithoutItsHelloWasNotTaken) {
+  auto raw = connectRaw(nullptr);
+  Mailbox<MessageFate> fates;
+  const auto remote = server.endpoint->remoteObjectProxy([&fates](const QXError&, MessageFate fate) { fates.put(fate); });
+  remote->send(kList, {}, intoReplies());
+  ASSERT_TRUE(raw.read<Hello>());
+  ASSERT_TRUE(raw.read<RequestFrame>());
+  raw.leave();
+  EXPECT_EQ(fates.take(), MessageFate::unsent);
+}
+
+TEST_F(EndpointTest, AMessageThatIsRefusedWithTheConnectionWasNotTaken) {
+  auto raw = connectRaw(nullptr);
+  Mailbox<MessageFate> fates;
+  const auto remote = server.endpoint->remoteObjectProxy([&fates](const QXError&, MessageFate fate) { fates.put(fate); });
+  remote->send(kList, {}, intoReplies());
+  raw.write(tests::bytesOf(EndFrame{QXError::make("Test", 1, "no")}));
+  EXPECT_EQ(fates.take(), MessageFate::unsent);
+}
+
+TEST_F(EndpointTest, AMessageToAPeerThatLeavesAfterItsHelloMayHaveBeenRun) {
+  auto raw = connectRaw(nullptr);
+  raw.sayHello();
+  Mailbox<MessageFate> fates;
+  const auto remote = server.endpoint->remoteObjectProxy([&fates](const QXError&, MessageFate fate) { fates.put(fate); });
+  remote->send(kList, {}, intoReplies());
+  raw.leave();
+  EXPECT_EQ(fates.take(), MessageFate::unanswered);
 }
 
 TEST_F(EndpointTest, CloseTellsThePeerWhy) {

@@ -46,7 +46,11 @@ QXError failure(QXRpcErrorCode code, std::string description) {
 }
 
 enum class Farewell { tellPeer, silent };
-enum class Cause { ordinary, misbehaviour };
+enum class Cause {
+  ordinary,
+  neverTaken,  // the peer left without its hello, which it says before all else: it has run nothing
+  misbehaviour,
+};
 
 }  // namespace
 
@@ -70,7 +74,7 @@ class Endpoint::State final : public AnswerSink, public std::enable_shared_from_
   IncomingCalls incoming;
 
  private:
-  enum class Delivery { underway, overBound };
+  enum class Delivery { underway, overBound, refused };
 
   // On the reading thread.
   std::uint32_t ready(std::uint32_t events);
@@ -80,18 +84,21 @@ class Endpoint::State final : public AnswerSink, public std::enable_shared_from_
   void run(RequestFrame request);
   void run(ReplyFrame reply);
   void run(FailureFrame failure);
-  void run(EndFrame end) { close(end.error, Farewell::silent); }
+  void run(EndFrame end) { closeForPeer(end.error); }
   void run(PingFrame ping);
   void run(PongFrame pong);
   // The message that an answer is for, taken out. None when it has been answered before, or was never sent: then the connection ends.
   std::optional<OutgoingCalls::Call> settle(std::uint64_t callID);
   void closeMalformed(const Malformed& malformed);
+  // The peer has ended the connection.
+  void closeForPeer(const QXError& reason);
 
   // With the mutex held.
   Delivery write();
 
   void write(const Frame& frame);
-  void dropSlowPeer();
+  // Ends the connection when the peer cannot be given what is due to it; it would wait for ever.
+  void closeUnlessUnderway(Delivery delivery);
   std::shared_ptr<const UniqueDescriptor> openSocket();
   void postFailure(std::shared_ptr<const FailureHandler> failureHandler, QXError error, MessageFate fate) const;
 
@@ -158,10 +165,16 @@ std::uint32_t Endpoint::State::ready(std::uint32_t events) {
   const auto socket = openSocket();
   if (!socket) return 0;
   if ((events & ~kWritable) != 0) read(socket->get());
-  const std::lock_guard lock(mutex_);
-  if (closed_) return 0;
-  if (write() == Delivery::overBound) return kReadable;  // whoever wrote last sees to it
-  return kReadable | (writer_.pendingBytes() > 0 && !writingIsOver_ ? kWritable : 0);
+  Delivery delivery = Delivery::underway;
+  std::uint32_t wanted = kReadable;
+  {
+    const std::lock_guard lock(mutex_);
+    if (closed_) return 0;
+    delivery = write();
+    if (writer_.pendingBytes() > 0 && !writingIsOver_) wanted |= kWritable;
+  }
+  closeUnlessUnderway(delivery);
+  return wanted;
 }
 
 void Endpoint::State::read(int socket) {
@@ -171,12 +184,12 @@ void Endpoint::State::read(int socket) {
   } else if (const auto* malformed = std::get_if<Malformed>(&reading)) {
     closeMalformed(*malformed);
   } else if (const auto* failed = std::get_if<FrameReader::Failed>(&reading)) {
-    close(QXError::system(failed->errnoValue, failed->errnoValue == ECONNRESET ? "the peer left" : "cannot read"), Farewell::silent);
+    closeForPeer(QXError::system(failed->errnoValue, failed->errnoValue == ECONNRESET ? "the peer left" : "cannot read"));
   } else if (std::holds_alternative<FrameReader::Ended>(reading)) {
     if (reader_.insideFrame()) {
       closeMalformed({"the connection ended inside a frame"});
     } else {
-      close(QXError::system(ECONNRESET, "the peer left"), Farewell::silent);
+      closeForPeer(QXError::system(ECONNRESET, "the peer left"));
     }
   }
 }
@@ -266,7 +279,7 @@ void Endpoint::State::run(PingFrame) {
     }
   }
   if (isTooEarly) closeMalformed({"a ping before the last one's answer was taken"});
-  if (delivery == Delivery::overBound) dropSlowPeer();
+  closeUnlessUnderway(delivery);
 }
 
 void Endpoint::State::run(PongFrame) {
@@ -296,6 +309,10 @@ void Endpoint::State::ping(std::function<void()> onPong) {
 bool Endpoint::State::awaitsAnswers() {
   const std::lock_guard lock(mutex_);
   return outgoing_.awaitsReplies();
+}
+
+void Endpoint::State::closeForPeer(const QXError& reason) {
+  close(reason, Farewell::silent, peerSaidHello_ ? Cause::ordinary : Cause::neverTaken);
 }
 
 void Endpoint::State::closeMalformed(const Malformed& malformed) {
@@ -330,7 +347,7 @@ void Endpoint::State::send(const QXRpcOperation& operation, QXArray arguments, Q
     }
   }
   if (problem) postFailure(std::move(failureHandler), *std::move(problem), fate);
-  if (delivery == Delivery::overBound) dropSlowPeer();
+  closeUnlessUnderway(delivery);
 }
 
 void Endpoint::State::sendReply(ReplyFrame reply) {
@@ -347,7 +364,7 @@ void Endpoint::State::sendReply(ReplyFrame reply) {
     writer_.add(std::get<EncodedFrame>(std::move(encoded)));
     delivery = write();
   }
-  if (delivery == Delivery::overBound) dropSlowPeer();
+  closeUnlessUnderway(delivery);
 }
 
 void Endpoint::State::sendFailure(FailureFrame failure) { write(Frame(std::move(failure))); }
@@ -367,20 +384,25 @@ void Endpoint::State::write(const Frame& frame) {
     writer_.add(std::move(*bytes));
     delivery = write();
   }
-  if (delivery == Delivery::overBound) dropSlowPeer();
+  closeUnlessUnderway(delivery);
 }
 
 Endpoint::State::Delivery Endpoint::State::write() {
   if (!writingIsOver_) {
     const auto progress = writer_.write(socket_->get());
     writingIsOver_ = progress == FrameWriter::Progress::broken;
+    if (progress == FrameWriter::Progress::refused) return Delivery::refused;
     if (progress == FrameWriter::Progress::blocked && registration_) registration_->rearm(kWritable);
   }
   return writer_.pendingBytes() > kMaximumOutputBytes ? Delivery::overBound : Delivery::underway;
 }
 
-void Endpoint::State::dropSlowPeer() {
-  close(failure(QXRpcErrorCode::peerDoesNotRead, "the peer does not read what is sent to it"), Farewell::silent, Cause::misbehaviour);
+void Endpoint::State::closeUnlessUnderway(Delivery delivery) {
+  if (delivery == Delivery::overBound) {
+    close(failure(QXRpcErrorCode::peerDoesNotRead, "the peer does not read what is sent to it"), Farewell::silent, Cause::misbehaviour);
+  } else if (delivery == Delivery::refused) {
+    close(QXError::system(ETOOMANYREFS, "the system passes no more descriptors on"), Farewell::silent);
+  }
 }
 
 void Endpoint::State::postFailure(std::shared_ptr<const FailureHandler> failureHandler, QXError error, MessageFate fate) const {
@@ -400,6 +422,9 @@ void Endpoint::State::close(const QXError& reason, Farewell farewell, Cause caus
     closed_ = reason;
     unheardPong.swap(onPong_);
     failed = outgoing_.settleAll(writer_.unwritten(), forgotten);
+    if (cause == Cause::neverTaken) {
+      for (auto& lost : failed) lost.fate = MessageFate::unsent;
+    }
     if (farewell == Farewell::tellPeer && !writingIsOver_) {
       auto encoded = encodeFrame(EndFrame{reason});
       if (auto* bytes = std::get_if<EncodedFrame>(&encoded)) {

@@ -19,7 +19,7 @@ namespace docuvend::linux_platform {
 // How far a message came that failed.
 enum class MessageFate {
   refused,     // this end would not send it, or the peer would not run it; the connection goes on
-  unsent,      // the connection ended before it had left whole: the peer has not run it
+  unsent,      // the connection ended before it had left whole, or before the peer had taken the connection: the peer has not run it
   unanswered,  // the connection ended after it had left: the peer may have run it
 };
 using FailureHandler = std::function<void(const QXError&, MessageFate)>;
