@@ -42,6 +42,10 @@ bool isSandboxError(const QXError& error, SandboxErrorCode code) {
   return error.domain == linux_platform::kQXSandboxErrorDomain && error.code == static_cast<std::int64_t>(code);
 }
 
+bool isDeadline(const QXError& error) {
+  return error.domain == kConsumerErrorDomain && error.code == static_cast<std::int64_t>(ConsumerErrorCode::deadlinePassed);
+}
+
 std::chrono::milliseconds timeLeft(TimePoint until) {
   return std::max(std::chrono::milliseconds(0), std::chrono::ceil<std::chrono::milliseconds>(until - std::chrono::steady_clock::now()));
 }
@@ -118,15 +122,20 @@ QXError noTokens(const Document& document) {
 
 Result<QXDescriptor> Consumer::redeem(const QXData& token, Access access) {
   const TimePoint until = after(options_.deadline);
-  for (;;) {
+  std::optional<QXError> busy;
+  do {
     auto file =
         valueOf<QXDescriptor>(services_->ask<&QXSandboxRedemption::redeemToken>(linux_platform::kSandboxServiceName, {until},
                                                                                 Repeat::harmless, token, access == Access::readWrite),
                               "a file");
     const auto* error = std::get_if<QXError>(&file);
-    if (error == nullptr || !isSandboxError(*error, SandboxErrorCode::busy)) return file;
-    if (!pauseUntil(until)) return makeConsumerError(ConsumerErrorCode::deadlinePassed, "Somebody held the file all the time.", *error);
-  }
+    if (error == nullptr) return file;
+    // Its time may also pass in a try that is not answered any more.
+    if (busy && isDeadline(*error)) break;
+    if (!isSandboxError(*error, SandboxErrorCode::busy)) return file;
+    busy = *error;
+  } while (pauseUntil(until));
+  return makeConsumerError(ConsumerErrorCode::deadlinePassed, "Somebody held the file all the time.", busy);
 }
 
 Result<QXDescriptor> Consumer::open(const Document& document, const ProviderID& provider, Access access, const ProgressHandler& progress) {

@@ -47,6 +47,19 @@ class ScriptedService {
   ScriptedService(const ScriptedService&) = delete;
   ScriptedService& operator=(const ScriptedService&) = delete;
 
+  // Ends the connections that there are; may be called by an operation.
+  void endConnections() {
+    std::vector<std::shared_ptr<linux_platform::Endpoint>> ended;
+    const std::lock_guard lock(mutex_);
+    ended.swap(endpoints_);
+  }
+
+  // Ends every further connection with that error.
+  void refuse(const QXError& error) {
+    const std::lock_guard lock(mutex_);
+    refusal_ = error;
+  }
+
   // What the clients so far declared, in the order of their hellos.
   [[nodiscard]] std::vector<std::optional<std::string>> declared() {
     const std::lock_guard lock(mutex_);
@@ -61,7 +74,7 @@ class ScriptedService {
     handlers.onHello = [this](const linux_platform::Hello& hello) -> std::optional<QXError> {
       const std::lock_guard lock(mutex_);
       declared_.push_back(hello.declaredBundle);
-      return std::nullopt;
+      return refusal_;
     };
     auto endpoint = linux_platform::Endpoint::create(*reactor_, std::move(client), {}, std::move(handlers));
     endpoint->setExportedInterface(qxInterfaceOf<Protocol>());
@@ -74,7 +87,8 @@ class ScriptedService {
   }
 
   const std::shared_ptr<Protocol> object_;
-  std::mutex mutex_;  // guards the two below
+  std::mutex mutex_;  // guards the three below
+  std::optional<QXError> refusal_;
   std::vector<std::optional<std::string>> declared_;
   std::vector<std::shared_ptr<linux_platform::Endpoint>> endpoints_;
   std::unique_ptr<linux_platform::BoundSocket> socket_;
