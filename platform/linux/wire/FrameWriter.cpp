@@ -48,7 +48,10 @@ FrameWriter::Progress FrameWriter::write(int socket) {
   while (!queue_.empty()) {
     Waiting& first = queue_.front();
     const long count = writePart(socket, first);
-    if (count < 0) return errno == EAGAIN || errno == EWOULDBLOCK ? Progress::blocked : Progress::broken;
+    if (count < 0) {
+      if (errno == ETOOMANYREFS) return Progress::refused;
+      return errno == EAGAIN || errno == EWOULDBLOCK ? Progress::blocked : Progress::broken;
+    }
     first.written += static_cast<std::size_t>(count);
     taken_ += static_cast<std::uint64_t>(count);
     if (first.written == first.frame.bytes.size()) queue_.pop_front();

@@ -19,6 +19,7 @@ class FrameWriter {
     drained,
     blocked,  // the socket takes no more for now
     broken,   // it never will
+    refused,  // the system passes no descriptors on: too many of this user's lie in sockets unread
   };
   // Writes without waiting and without a signal.
   [[nodiscard]] Progress write(int socket);
