@@ -55,7 +55,7 @@ Process::Process(const Command& command) : output_(memoryFile("output")), errors
   posix_spawn_file_actions_t actions;
   ::posix_spawn_file_actions_init(&actions);
   ::posix_spawn_file_actions_adddup2(&actions, input.get(), STDIN_FILENO);
-  ::posix_spawn_file_actions_adddup2(&actions, output_.get(), STDOUT_FILENO);
+  ::posix_spawn_file_actions_adddup2(&actions, command.output < 0 ? output_.get() : command.output, STDOUT_FILENO);
   ::posix_spawn_file_actions_adddup2(&actions, command.errors < 0 ? errors_.get() : command.errors, STDERR_FILENO);
   auto words = command.words;
   auto environment = command.environment;

@@ -15,8 +15,9 @@ struct Command {
   std::vector<std::string> words;  // the absolute path of the program, then its arguments
   std::vector<std::string> environment;
   std::string input;
-  // Where its standard error goes; a file of its own when there is none.
+  // Where its standard error and its standard output go; files of their own when there are none.
   int errors = -1;
+  int output = -1;
 };
 
 struct Ending {
