@@ -1,9 +1,13 @@
 // The program itself, where it needs no daemon.
+#include <fcntl.h>
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
+#include <unistd.h>
 
+#include <csignal>
 #include <filesystem>
 
+#include "platform/linux/base/UniqueDescriptor.h"
 #include "tests/system/house/Process.h"
 
 namespace docuvend::ctl {
@@ -91,6 +95,28 @@ TEST(Docuvendctl, AWrongCommandLineInJSONIsOneObject) {
       ending.errors,
       "{\"error\":{\"domain\":\"DVControlErrorDomain\",\"code\":1,\"description\":\"DVControlErrorDomain 1: unknown command dance; --help "
       "lists them\"}}\n");
+}
+
+// What it ends with when its output goes there.
+Ending runInto(const linux_platform::UniqueDescriptor& output) {
+  tests::Command command{{std::string(DOCUVEND_BIN) + "/docuvendctl", "version"}, {}, {}};
+  command.output = output.get();
+  return tests::Process(command).wait();
+}
+
+TEST(Docuvendctl, AnAnswerThatCannotBeWrittenIsAFailure) {
+  const Ending ending = runInto(linux_platform::UniqueDescriptor(::open("/dev/full", O_WRONLY | O_CLOEXEC)));
+  EXPECT_EQ(ending.status, 9);
+  EXPECT_THAT(ending.errors, StartsWith("docuvendctl: QXSystemErrorDomain 28: cannot write"));
+}
+
+TEST(Docuvendctl, EndsQuietlyWhenNobodyReadsOn) {
+  int ends[2] = {-1, -1};
+  ASSERT_EQ(::pipe2(ends, O_CLOEXEC), 0);
+  ::close(ends[0]);
+  const Ending ending = runInto(linux_platform::UniqueDescriptor(ends[1]));
+  EXPECT_EQ(ending.status, 128 + SIGPIPE);
+  EXPECT_EQ(ending.errors, "");
 }
 
 TEST(Docuvendctl, AFailureInJSONIsOneObject) {
