@@ -55,6 +55,7 @@ TEST_F(GroupContainersTest, SpellADirectoryWithAndWithoutTheLinksOfEachPartOfIts
   EXPECT_EQ(containers.spellingsOf(storage), Spellings{storage + "/"});
   EXPECT_EQ(containers.spellingsOf("/" + storage + "//"), Spellings{storage + "/"});
   EXPECT_EQ(containers.spellingsOf(storage + "/missing/deeper"), Spellings{storage + "/missing/deeper/"});
+  EXPECT_EQ(containers.spellingsOf("/no such directory/x"), Spellings{"/no such directory/x/"});
   ASSERT_EQ(::symlink(group.c_str(), (home + "/a").c_str()), 0);
   ASSERT_EQ(::symlink(outside.c_str(), (group + "/b").c_str()), 0);
   EXPECT_EQ(containers.spellingsOf(home + "/a/b/c"), (Spellings{home + "/a/b/c/", group + "/b/c/", outside + "/c/"}));

@@ -247,7 +247,7 @@ TEST_F(TakingTokensBack, RefusesToReplaceByOldTokens) {
 }
 
 TEST_F(TakingTokensBack, LetsNoOldTokenOpenAnythingOnceItIsDone) {
-  constexpr int kRounds = 100;
+  constexpr int kRounds = 30;
   constexpr int kRedeemers = 3;
   for (int round = 0; round < kRounds; ++round) {
     const std::string token = issued(document);
@@ -279,7 +279,7 @@ TEST_F(TakingTokensBack, LetsNoOldTokenOpenAnythingOnceItIsDone) {
 }
 
 TEST_F(TakingTokensBack, LetsNoOldTokenChangeTheDirectoryOnceItIsDone) {
-  constexpr int kRounds = 100;
+  constexpr int kRounds = 30;
   for (int round = 0; round < kRounds; ++round) {
     const std::string item = issued(document);
     const std::string by = issued(sibling);

@@ -66,6 +66,17 @@ TYPED_TEST(QXSandboxTest, TakesBackWhatItIssuedAndGoesOnIssuing) {
   }
 }
 
+TEST(FakeSandbox, RemembersWhatWasTakenBackAndAnswersAsItWasTold) {
+  fake_platform::FakeSandbox sandbox;
+  const QXError error = QXError::system(28, "no room");
+  EXPECT_EQ(sandbox.invalidateReadWriteExtensions("/a"), std::nullopt);
+  sandbox.setInvalidationError(error);
+  EXPECT_EQ(sandbox.invalidateReadWriteExtensions(std::nullopt), error);
+  sandbox.setInvalidationError(std::nullopt);
+  EXPECT_EQ(sandbox.invalidateReadWriteExtensions("/b"), std::nullopt);
+  EXPECT_EQ(sandbox.invalidations(), (std::vector<std::optional<std::string>>{"/a", std::nullopt, "/b"}));
+}
+
 TYPED_TEST(QXSandboxTest, AllowsTheWriterToWriteAndNothingElse) {
   const QXAuditToken writer = this->writer();
   EXPECT_EQ(this->sandbox().checkWithoutReport(writer, kQXSandboxFileWriteData, this->document), 0);

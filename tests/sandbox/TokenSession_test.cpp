@@ -269,7 +269,7 @@ TEST_F(TokenSessionTest, WritesEarlierCutsWithTheNextThatCanBeWritten) {
 }
 
 TEST_F(TokenSessionTest, WaitsForWhoeverActsOnAnOldToken) {
-  constexpr int kRounds = 100;
+  constexpr int kRounds = 50;
   const auto session = loaded();
   std::string token = issued(*session, "/a/b");
   for (int round = 0; round < kRounds; ++round) {
@@ -295,7 +295,7 @@ TEST_F(TokenSessionTest, WaitsForWhoeverActsOnAnOldToken) {
 }
 
 TEST_F(TokenSessionTest, IssuesGoodTokensWhileOthersCut) {
-  constexpr int kRounds = 60;
+  constexpr int kRounds = 30;
   const auto session = loaded();
   std::atomic<bool> stop{false};
   std::vector<std::thread> cutters;
