@@ -5,6 +5,8 @@
 namespace docuvend {
 namespace {
 
+static_assert(3 * kDVLongestIdentifier <= kDVMaximumTextBytesOfPage, "every page has room for one grant at least");
+
 QXDictionary entryOf(const DVGrant& grant) {
   return {{"providerIdentifier", grant.provider.value}, {"consumerIdentifier", grant.consumer.value}, {"itemIdentifier", grant.item.value}};
 }
@@ -28,8 +30,7 @@ DVGrantPage DVGrantPage::of(const std::vector<DVGrant>& list, const DVGrantFilte
     const DVGrant& grant = list[i];
     if (!filter.admits(grant) || !isCarried(grant)) continue;
     bytes += textBytes(grant);
-    const bool isFull = page.grants.size() == kDVMaximumGrantsOfPage || bytes > kDVMaximumTextBytesOfPage;
-    if (isFull && !page.grants.empty()) {
+    if (page.grants.size() == kDVMaximumGrantsOfPage || bytes > kDVMaximumTextBytesOfPage) {
       page.next = i;
       break;
     }

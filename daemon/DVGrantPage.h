@@ -16,7 +16,7 @@
 namespace docuvend {
 
 inline constexpr std::size_t kDVMaximumGrantsOfPage = 1000;
-inline constexpr std::size_t kDVMaximumTextBytesOfPage = std::size_t{1} << 19U;  // identifiers; a page of one grant may have what it has
+inline constexpr std::size_t kDVMaximumTextBytesOfPage = std::size_t{1} << 19U;  // of identifiers
 inline constexpr std::size_t kDVLongestIdentifier = std::size_t{1} << 16U;       // bytes: the longest text that a message carries
 
 // All that are of the provider and of the consumer, where these are given.

@@ -70,6 +70,12 @@ TEST(DVGrantTree, ListsNothingForWhatHoldsNoGrant) {
   EXPECT_TRUE(tree.grants().empty());
 }
 
+TEST(DVGrantTree, ListsTheGrantsThatFollowWhatHoldsNone) {
+  const DVGrantTree tree = treeOf({{kAttic.value, QXDictionary{{kEditor.value, QXDictionary()}, {kPicker.value, consumerWith({"1"})}}},
+                                   {kCellar.value, QXDictionary{{kEditor.value, consumerWith({"2"})}}}});
+  EXPECT_EQ(tree.grants(), (std::vector<DVGrant>{{kAttic, kPicker, ItemID{"1"}}, {kCellar, kEditor, ItemID{"2"}}}));
+}
+
 TEST(DVGrantTree, GrantingTwiceChangesNothing) {
   DVGrantTree tree;
   EXPECT_TRUE(tree.allow(kCellar, ItemID{"1"}, kEditor));

@@ -393,6 +393,8 @@ TEST_F(UnconfinedServiceTest, ServesAnUnconfinedPeerThatActsForABundle) {
   Hello hello;
   hello.declaredBundle = "com.example.App";
   EXPECT_TRUE(roundTrip(driver.connect(hello)));
+  driver.peers.setNextPeer(Standing::unconfined, "com.example.App", {});
+  EXPECT_TRUE(roundTrip(driver.connect()));
 }
 
 TEST_F(UnconfinedServiceTest, AConfinedPeerIsRefusedWithAReasonAndNoDelegateHears) {
