@@ -195,6 +195,69 @@ TEST_F(RefreshPassTest, AKeptProviderThatASecondExtensionDisplacesIsNotUnregiste
   EXPECT_EQ(platform.fileCoordinator.calls(), (std::vector<Call>{{Action::add, displaced}, {Action::add, present}}));
 }
 
+TEST_F(RefreshPassTest, OfTwoThatStayTheFirstIsMadeAnewByEachPassAndRegisteredWithoutEnteringTheRegistry) {
+  const auto earlier = installReady(kCellar, 1);
+  const auto later = installReady(kCellar, 2);
+  refresh({earlier, later});
+  const auto present = provider(kCellar);
+  const auto before = platform.fileCoordinator.providers().size();
+  refresh({earlier, later});
+  EXPECT_EQ(provider(kCellar), present) << "the later one is kept";
+  EXPECT_EQ(earlier->beginCount(), 2);
+  EXPECT_EQ(later->beginCount(), 1);
+  EXPECT_EQ(platform.fileCoordinator.providers().size(), before + 1) << "nothing is unregistered";
+}
+
+TEST_F(RefreshPassTest, EveryExtensionWithoutIdentifierIsLogged) {
+  refresh({std::make_shared<TracingExtension>(platform, std::nullopt, 1), std::make_shared<TracingExtension>(platform, std::nullopt, 2)});
+  EXPECT_EQ(written(), (Lines{kUpdating, "default: [NOTICE] Docuvend extension <FakeExtension (null) 1> has no identifier. Ignoring.",
+                              "default: [NOTICE] Docuvend extension <FakeExtension (null) 2> has no identifier. Ignoring.", "~ started"}));
+}
+
+TEST_F(RefreshPassTest, AProviderWhoseIdentifierWasSetIsStillFoundByTheRegistrysKey) {
+  const auto cellar = installReady(kCellar);
+  refresh({cellar});
+  const auto before = provider(kCellar);
+  before->setIdentifier(ProviderID{kAttic});
+  refresh({cellar, installReady(kAttic)});
+  EXPECT_EQ(provider(kCellar), before);
+  ASSERT_NE(provider(kAttic), nullptr);
+  EXPECT_NE(provider(kAttic), before);
+  refresh({});
+  EXPECT_TRUE(platform.fileCoordinator.providers().empty());
+}
+
+TEST_F(RefreshPassTest, AnExtensionThatLosesItsIdentifierLosesItsProvider) {
+  refresh({installReady(kCellar)});
+  const auto before = provider(kCellar);
+  refresh({std::make_shared<TracingExtension>(platform, std::nullopt, 1)});
+  EXPECT_EQ(provider(kCellar), nullptr);
+  EXPECT_EQ(platform.fileCoordinator.calls().back(), (Call{Action::remove, before}));
+}
+
+TEST_F(RefreshPassTest, AReinstalledExtensionGetsANewProvider) {
+  const auto cellar = installReady(kCellar);
+  refresh({cellar});
+  const auto before = provider(kCellar);
+  refresh({});
+  refresh({cellar});
+  ASSERT_NE(provider(kCellar), nullptr);
+  EXPECT_NE(provider(kCellar), before);
+  EXPECT_EQ(cellar->beginCount(), 2) << "set up again";
+}
+
+TEST_F(RefreshPassTest, EveryLeftoverIsUnregisteredBeforeAnyNewProviderIsRegistered) {
+  refresh({installReady(kCellar, 1), installReady(kAttic)});
+  const auto oldCellar = provider(kCellar);
+  const auto attic = provider(kAttic);
+  const auto before = platform.fileCoordinator.calls().size();
+  refresh({installReady(kShed), installReady(kCellar, 2)});
+  const auto calls = platform.fileCoordinator.calls();
+  EXPECT_EQ(std::vector<Call>(calls.begin() + static_cast<std::ptrdiff_t>(before), calls.end()),
+            (std::vector<Call>{
+                {Action::remove, attic}, {Action::remove, oldCellar}, {Action::add, provider(kShed)}, {Action::add, provider(kCellar)}}));
+}
+
 TEST_F(RefreshPassTest, AnErrorOfTheMatchIsNotLookedAtAndItsEmptySetRemovesEveryProvider) {
   refresh({installReady(kCellar), installReady(kAttic)});
   written();
@@ -255,6 +318,40 @@ TEST_F(RefreshPassTest, AProviderWhoseRegistrationFailsStaysAndThePassEnds) {
   const Lines lines = written();
   EXPECT_EQ(lines[lines.size() - 2], "fault: [ERROR] Could not register docuvend com.orvane.cellar. Error: TestDomain 7: broken");
   EXPECT_EQ(lines.back(), "~ started");
+}
+
+TEST_F(RefreshPassTest, AProviderWhoseRegistrationFailedIsNotTriedAgainByTheNextPass) {
+  const auto cellar = install(kCellar);
+  cellar->failBegins(broken);
+  refresh({cellar});
+  for (int pause = 0; pause < 2; ++pause) {
+    platform.queues.advance(std::chrono::seconds(2));
+    platform.queues.runAll();
+  }
+  ASSERT_FALSE(passIsUnderWay());
+  const auto before = provider(kCellar);
+  written();
+  refresh({cellar});
+  EXPECT_EQ(written(), Lines{kUpdating});
+  EXPECT_EQ(provider(kCellar), before);
+  EXPECT_EQ(cellar->beginCount(), 3);
+}
+
+TEST_F(RefreshPassTest, AProviderThatVanishesWhileItsRegistrationIsTriedIsTriedToTheEndAndThenUnregistered) {
+  const auto cellar = install(kCellar);
+  cellar->failBegins(broken);
+  refresh({cellar});
+  const auto before = provider(kCellar);
+  refresh({});
+  EXPECT_EQ(provider(kCellar), before) << "the next pass waits";
+  EXPECT_TRUE(platform.fileCoordinator.calls().empty());
+  for (int pause = 0; pause < 2; ++pause) {
+    platform.queues.advance(std::chrono::seconds(2));
+    platform.queues.runAll();
+  }
+  EXPECT_EQ(cellar->beginCount(), 3);
+  EXPECT_EQ(provider(kCellar), nullptr);
+  EXPECT_EQ(platform.fileCoordinator.calls(), (std::vector<Call>{{Action::remove, before}})) << "also one that never was registered";
 }
 
 TEST_F(RefreshPassTest, ARegistrationThatReportsTwiceEndsThePassOnce) {
