@@ -15,6 +15,10 @@
 //                      memory    allocates memory until there is none, which ends it
 //                      chatter   writes 20,000 lines
 //                      anything  succeeds
+//   providePlaceholder, startProviding, stopProviding
+//                      sour      an error
+//                      bomb      abort()
+//                      anything  succeeds
 //   itemURL            outside   a file of the system
 //                      cellar    a file where another provider has its documents
 //                      storage   the storage itself
@@ -61,6 +65,7 @@ class Trickster : public Provider {
     if (error) return QXError::system(error.value(), "cannot make the storage");
     return std::nullopt;
   }
+
   [[nodiscard]] Failure providePlaceholder(const QXURL& url) override { return performAsNamed(url); }
 
   [[nodiscard]] Failure startProviding(const QXURL& url) override {
@@ -70,7 +75,7 @@ class Trickster : public Provider {
     if (name == "stuck") std::fputs("is stuck\n", stderr);
     if (name == "forks") std::fprintf(stderr, "has started %d processes\n", tests::forkWithoutEnd());
     while ((name == "stuck" || name == "forks") && access("free", F_OK) != 0) std::this_thread::sleep_for(std::chrono::milliseconds(1));
-    return std::nullopt;
+    return performAsNamed(url);
   }
 
   [[nodiscard]] Failure itemChanged(const QXURL&) override { return std::nullopt; }

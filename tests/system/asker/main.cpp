@@ -1,0 +1,145 @@
+// A confined application that does what its words say, one thing after another, in one launch.
+//
+//   placeholder URL PROVIDER CONSUMER
+//   start URL PROVIDER CONSUMER
+//   stop URL PROVIDER CONSUMER
+//   extend URL CONSUMER          passes a document on
+//   read STRING                  opens a document for reading, as it is, and keeps it open
+//   write STRING                 the same for writing
+//   map STRING                   maps a document for reading, and closes it
+//   make PATH                    makes a file, with its directories
+//   hold                         makes the file "holding" in its container, and waits until the file "go" lies there
+//
+// Prints a line for each: "ok", a string, or the domains and codes of an error and of what stands beneath it.
+#include <fcntl.h>
+#include <sys/mman.h>
+#include <unistd.h>
+
+#include <cerrno>
+#include <chrono>
+#include <deque>
+#include <filesystem>
+#include <fstream>
+#include <iostream>
+#include <memory>
+#include <string>
+#include <thread>
+#include <vector>
+
+#include "sdk/Consumer.h"
+
+namespace docuvend {
+namespace {
+
+constexpr auto kPatience = std::chrono::seconds(60);
+constexpr auto kBetweenLooks = std::chrono::milliseconds(2);
+constexpr std::size_t kMapped = 1;
+
+std::string text(const QXError& error) {
+  const std::string own = error.domain + " " + std::to_string(error.code);
+  return error.underlying ? own + " < " + text(*error.underlying) : own;
+}
+std::string text(const Failure& failure) { return failure ? text(*failure) : "ok"; }
+
+class Words {
+ public:
+  Words(int count, char** words) : words_(words + 1, words + count) {}
+  [[nodiscard]] bool isEmpty() const { return words_.empty(); }
+  // Empty when there is no more.
+  std::string next() {
+    if (words_.empty()) return {};
+    std::string word = std::move(words_.front());
+    words_.pop_front();
+    return word;
+  }
+  QXURL nextURL() { return QXURL::fromString(next()).value_or(QXURL::fileURL("/", QXURLKind::directory)); }
+
+ private:
+  std::deque<std::string> words_;
+};
+
+class Asker {
+ public:
+  explicit Asker(Consumer& consumer) : consumer_(consumer) {}
+
+  std::string perform(Words& words) {
+    const std::string verb = words.next();
+    if (verb == "placeholder" || verb == "start" || verb == "stop") return text(askForItem(verb, words));
+    if (verb == "extend") return extend(words);
+    if (verb == "read") return keep(open(words, Access::read));
+    if (verb == "write") return keep(open(words, Access::readWrite));
+    if (verb == "map") return map(open(words, Access::read));
+    if (verb == "make") return make(words.next());
+    if (verb == "hold") return hold();
+    return "no such word: " + verb;
+  }
+
+ private:
+  Failure askForItem(const std::string& verb, Words& words) {
+    const QXURL url = words.nextURL();
+    const ProviderID provider{words.next()};
+    const ConsumerID consumer{words.next()};
+    if (verb == "placeholder") return consumer_.providePlaceholder(url, provider, consumer);
+    if (verb == "start") return consumer_.startProviding(url, provider, consumer);
+    return consumer_.stopProviding(url, provider, consumer);
+  }
+
+  std::string extend(Words& words) {
+    const QXURL url = words.nextURL();
+    const auto result = consumer_.extendBookmark(url, ConsumerID{words.next()});
+    const auto* error = std::get_if<QXError>(&result);
+    return error != nullptr ? text(*error) : std::get<std::string>(result);
+  }
+
+  Result<QXDescriptor> open(Words& words, Access access) {
+    const auto resolved = consumer_.documentURL(words.next());
+    if (const auto* error = std::get_if<QXError>(&resolved)) return *error;
+    return consumer_.redeem(std::get<Document>(resolved).itemToken.value_or(QXData{}), access);
+  }
+  std::string keep(Result<QXDescriptor> opened) {
+    if (const auto* error = std::get_if<QXError>(&opened)) return text(*error);
+    kept_.push_back(std::get<QXDescriptor>(std::move(opened)));
+    return "ok";
+  }
+  static std::string map(Result<QXDescriptor> opened) {
+    if (const auto* error = std::get_if<QXError>(&opened)) return text(*error);
+    const void* mapped = ::mmap(nullptr, kMapped, PROT_READ, MAP_SHARED, std::get<QXDescriptor>(opened).number, 0);
+    return mapped == MAP_FAILED ? text(QXError::system(errno, "cannot map")) : "ok";
+  }
+
+  static std::string make(const std::string& path) {
+    std::error_code error;
+    std::filesystem::create_directories(std::filesystem::path(path).parent_path(), error);
+    if (error) return text(QXError::system(error.value(), "cannot make the directories"));
+    std::ofstream file(path);
+    return file << "mine" << std::flush ? "ok" : "cannot make the file";
+  }
+  static std::string hold() {
+    std::ofstream("holding").close();
+    const auto deadline = std::chrono::steady_clock::now() + kPatience;
+    while (::access("go", F_OK) != 0) {
+      if (std::chrono::steady_clock::now() > deadline) return "in vain";
+      std::this_thread::sleep_for(kBetweenLooks);
+    }
+    return "ok";
+  }
+
+  Consumer& consumer_;
+  std::vector<QXDescriptor> kept_;
+};
+
+int run(Words words) {
+  auto connected = Consumer::connect({});
+  if (const auto* error = std::get_if<QXError>(&connected)) {
+    std::cout << text(*error) << "\n";
+    return 1;
+  }
+  Asker asker(*std::get<std::unique_ptr<Consumer>>(connected));
+  while (!words.isEmpty()) std::cout << asker.perform(words) << std::endl;
+  return 0;
+}
+
+}  // namespace
+}  // namespace docuvend
+
+int main(int count, char** words) { return docuvend::run(docuvend::Words(count, words)); }
