@@ -18,6 +18,7 @@
 #include <vector>
 
 #include "tests/sandbox/SandboxHouse.h"
+#include "tests/sandbox/SystemCalls.h"
 
 namespace docuvend::linux_platform {
 namespace {
@@ -246,6 +247,35 @@ TEST_F(TokenRedeemerTest, RefusesTokensThatWereTakenBackAndServesNewOnes) {
   expectReplaceError(newItem, by, SandboxErrorCode::badToken, "old sibling");
   EXPECT_EQ(read(document), "CONtents");
   EXPECT_TRUE(std::holds_alternative<ReplacedItem>(redeemer.replaceItem(newItem, newSibling)));
+}
+
+// The contents of the sibling may take as long as they like to get to disk.
+TEST_F(TokenRedeemerTest, RenamesNothingByATokenThatIsTakenBackWhileTheSiblingIsFlushed) {
+  ASSERT_EQ(::chmod(document.c_str(), 0640), 0);
+  static_cast<void>(redeemed(tokenFor(sibling), TokenUse::writing));
+  testing::SystemCalls calls;
+  calls.beforeFlush = [this](int) { EXPECT_EQ(session.takeBack({storage + "/"}), std::nullopt); };
+  expectReplaceError(tokenFor(document), tokenFor(sibling), SandboxErrorCode::badToken, "taken back meanwhile");
+  EXPECT_EQ(read(document), "contents");
+  EXPECT_EQ(modeOf(sibling), 0600U);
+}
+
+TEST_F(TokenRedeemerTest, ForcesContentsBeforeTheRenameAndModeAndDirectoryAfterIt) {
+  ASSERT_EQ(::chmod(document.c_str(), 0640), 0);
+  ASSERT_TRUE(puts(redeemed(tokenFor(sibling), TokenUse::writing), "new"));
+  std::vector<std::string> flushed;
+  testing::SystemCalls calls;
+  calls.beforeFlush = [this, &flushed](int descriptor) {
+    const auto object = kernelPath(descriptor);
+    struct stat status {};
+    ASSERT_EQ(::fstat(descriptor, &status), 0);
+    flushed.push_back(object.value_or("") + (S_ISDIR(status.st_mode) ? "/" : "") + (read(document) == "new" ? " after it" : " before it"));
+    if (object == document) {
+      EXPECT_EQ(status.st_mode & 0777U, 0640U);
+    }
+  };
+  ASSERT_TRUE(std::holds_alternative<ReplacedItem>(redeemer.replaceItem(tokenFor(document), tokenFor(sibling))));
+  EXPECT_EQ(flushed, (std::vector<std::string>{sibling + " before it", document + " after it", storage + "/ after it"}));
 }
 
 TEST_F(TokenRedeemerTest, RenamesNothingButAHiddenSiblingOverItsItem) {

@@ -208,12 +208,16 @@ TEST_F(TokenSessionTest, IsAnErrorWithoutAKeyThatCanBeUsedOrFilesThatCanBeMade) 
 
 // A session that cannot get rid of an old key has none.
 TEST_F(TokenSessionTest, IsAnErrorWhenItsKeyCannotBeRenewed) {
-  static_cast<void>(loaded());
-  std::filesystem::remove(paths.tokenFloors);
+  const std::string elsewhere = directory.path() + "/elsewhere";
+  std::filesystem::create_directory(elsewhere);
+  Paths apart = paths;
+  apart.tokenFloors = elsewhere + "/token-floors";
+  static_cast<void>(TokenSession::load(apart, log.defaultLog()));
+  std::filesystem::remove(apart.tokenFloors);
   lockDirectory();
-  EXPECT_TRUE(std::holds_alternative<QXError>(TokenSession::load(paths, log.defaultLog())));
+  EXPECT_TRUE(std::holds_alternative<QXError>(TokenSession::load(apart, log.defaultLog())));
   unlockDirectory();
-  EXPECT_FALSE(std::filesystem::exists(paths.tokenFloors));
+  EXPECT_FALSE(std::filesystem::exists(apart.tokenFloors)) << "the next start would trust the old key again";
 }
 
 TEST_F(TokenSessionTest, HoldsACutThatCannotBeWrittenAndSaysSo) {
