@@ -1,111 +1,11 @@
-// The provider itself, in this process, over a throw-away container.
 #include "examples/cellar/CellarProvider.h"
 
-#include <fcntl.h>
-#include <gtest/gtest.h>
-#include <sys/stat.h>
-#include <time.h>
-#include <unistd.h>
-
-#include <algorithm>
-#include <cstdlib>
-#include <filesystem>
-#include <fstream>
-#include <iterator>
-#include <memory>
-#include <stdexcept>
-#include <string>
-#include <vector>
+#include "tests/cellar/CellarHouse.h"
 
 namespace docuvend::cellar {
 namespace {
 
-namespace fs = std::filesystem;
-
-class CellarProviderTest : public ::testing::Test {
- protected:
-  CellarProviderTest() {
-    std::string pattern = (fs::temp_directory_path() / "cellar-XXXXXX").string();
-    if (mkdtemp(pattern.data()) == nullptr) throw std::runtime_error("no directory for a test");
-    root = fs::canonical(pattern).string();
-    container = root + "/containers/com.orvane.cellar";
-    cloud = container + "/cloud";
-    storage = root + "/groups/" + kGroup + "/Docuvend Storage";
-    fs::create_directories(cloud);
-    fs::create_directories(root + "/groups/" + kGroup);
-    setenv("HOME", container.c_str(), 1);
-    restart();
-  }
-  ~CellarProviderTest() override {
-    std::error_code ignored;
-    fs::remove_all(root, ignored);
-  }
-
-  void restart() { provider = std::make_unique<CellarProvider>(); }
-
-  static void write(const std::string& path, const std::string& text) { std::ofstream(path, std::ios::trunc) << text; }
-  static std::string read(const std::string& path) {
-    std::ifstream file(path);
-    return {std::istreambuf_iterator<char>(file), std::istreambuf_iterator<char>()};
-  }
-  // As a program saves: a hidden sibling, renamed over the file.
-  void save(const std::string& name, const std::string& text) const {
-    write(storage + "/." + name, text);
-    fs::rename(storage + "/." + name, storage + "/" + name);
-  }
-  static bool hasNoBlocks(const std::string& path) {
-    struct stat status {};
-    return stat(path.c_str(), &status) == 0 && status.st_blocks == 0;
-  }
-  static std::int64_t nanoseconds(const timespec& time) { return time.tv_sec * 1'000'000'000 + time.tv_nsec; }
-  static std::int64_t modified(const std::string& path) {
-    struct stat status {};
-    return stat(path.c_str(), &status) == 0 ? nanoseconds(status.st_mtim) : -1;
-  }
-  static void setModified(const std::string& path, std::int64_t time) {
-    const timespec times[2] = {{0, UTIME_OMIT}, {time / 1'000'000'000, time % 1'000'000'000}};
-    ASSERT_EQ(utimensat(AT_FDCWD, path.c_str(), times, 0), 0);
-  }
-  static std::int64_t coarseClock() {
-    timespec now{};
-    clock_gettime(CLOCK_REALTIME_COARSE, &now);
-    return nanoseconds(now);
-  }
-  [[nodiscard]] std::string local(const std::string& name) const { return storage + "/" + name; }
-  [[nodiscard]] QXURL url(const std::string& name) const { return QXURL::fileURL(local(name), QXURLKind::file); }
-  [[nodiscard]] std::string identifier(const std::string& name) const {
-    const auto result = provider->identifierForItem(url(name));
-    const auto* identifier = std::get_if<ItemID>(&result);
-    return identifier != nullptr ? identifier->value : "";
-  }
-  void setUp() const {
-    const auto error = provider->performInitialSetup();
-    ASSERT_FALSE(error) << error->description();
-  }
-  void start(const std::string& name) const {
-    const auto error = provider->startProviding(url(name));
-    ASSERT_FALSE(error) << error->description();
-  }
-  void change(const std::string& name) const {
-    const auto error = provider->itemChanged(url(name));
-    ASSERT_FALSE(error) << error->description();
-  }
-  [[nodiscard]] std::vector<std::string> names(const std::string& directory) const {
-    std::vector<std::string> result;
-    for (const auto& entry : fs::directory_iterator(directory)) result.push_back(entry.path().filename().string());
-    std::sort(result.begin(), result.end());
-    return result;
-  }
-  static bool isKind(const Provider::Failure& error, CellarErrorCode code) {
-    return error && error->domain == kErrorDomain && error->code == static_cast<std::int64_t>(code);
-  }
-
-  std::string root;
-  std::string container;
-  std::string cloud;
-  std::string storage;
-  std::unique_ptr<CellarProvider> provider;
-};
+using CellarProviderTest = CellarHouse;
 
 TEST_F(CellarProviderTest, SetupMakesPlaceholdersOfTheRightSizeWithoutBlocks) {
   write(cloud + "/a.txt", "hello");
@@ -349,155 +249,6 @@ TEST_F(CellarProviderTest, WhatIsNoDocumentIsRefusedByEveryOperation) {
   }
 }
 
-TEST_F(CellarProviderTest, StoppingLeavesAPlaceholder) {
-  write(cloud + "/a.txt", "hello");
-  setUp();
-  start("a.txt");
-  EXPECT_FALSE(provider->stopProviding(url("a.txt")));
-  EXPECT_EQ(fs::file_size(local("a.txt")), 5U);
-  EXPECT_TRUE(hasNoBlocks(local("a.txt")));
-  EXPECT_FALSE(provider->stopProviding(url("a.txt")));
-  start("a.txt");
-  EXPECT_EQ(read(local("a.txt")), "hello");
-}
-
-TEST_F(CellarProviderTest, StoppingDoesNotGiveUpWhatIsNotSaved) {
-  write(cloud + "/a.txt", "hello");
-  setUp();
-  start("a.txt");
-  save("a.txt", "mine!");
-  EXPECT_TRUE(isKind(provider->stopProviding(url("a.txt")), CellarErrorCode::notSaved));
-  EXPECT_EQ(read(local("a.txt")), "mine!");
-  change("a.txt");
-  fs::remove(cloud + "/a.txt");
-  EXPECT_TRUE(isKind(provider->stopProviding(url("a.txt")), CellarErrorCode::notSaved));
-  EXPECT_EQ(read(local("a.txt")), "mine!");
-}
-
-TEST_F(CellarProviderTest, StoppingDoesNotGiveUpWhatWasWrittenOverAPlaceholder) {
-  write(cloud + "/a.txt", "hello");
-  setUp();
-  write(local("a.txt"), "mine!");
-  EXPECT_TRUE(isKind(provider->stopProviding(url("a.txt")), CellarErrorCode::notSaved));
-  EXPECT_EQ(read(local("a.txt")), "mine!");
-}
-
-TEST_F(CellarProviderTest, StoppingDoesNotTakeTheContentsFromWhoHasThemOpen) {
-  write(cloud + "/a.txt", "hello");
-  setUp();
-  start("a.txt");
-  {
-    const std::ifstream reader(local("a.txt"));
-    EXPECT_TRUE(isKind(provider->stopProviding(url("a.txt")), CellarErrorCode::inUse));
-    EXPECT_EQ(read(local("a.txt")), "hello");
-  }
-  EXPECT_FALSE(provider->stopProviding(url("a.txt")));
-  EXPECT_TRUE(hasNoBlocks(local("a.txt")));
-}
-
-TEST_F(CellarProviderTest, StoppingLeavesNoOtherFile) {
-  write(cloud + "/a.txt", "hello");
-  setUp();
-  start("a.txt");
-  EXPECT_FALSE(provider->stopProviding(url("a.txt")));
-  start("a.txt");
-  {
-    const std::ifstream reader(local("a.txt"));
-    EXPECT_TRUE(provider->stopProviding(url("a.txt")));
-  }
-  save("a.txt", "mine!");
-  EXPECT_TRUE(provider->stopProviding(url("a.txt")));
-  EXPECT_EQ(names(storage), std::vector<std::string>{"a.txt"});
-}
-
-TEST_F(CellarProviderTest, AWriteAfterStoppingIsAChangeLikeAnyOther) {
-  write(cloud + "/a.txt", "hello");
-  setUp();
-  start("a.txt");
-  EXPECT_FALSE(provider->stopProviding(url("a.txt")));
-  save("a.txt", "mine!");
-  start("a.txt");
-  EXPECT_EQ(read(local("a.txt")), "mine!");
-  change("a.txt");
-  EXPECT_EQ(read(cloud + "/a.txt"), "mine!");
-}
-
-TEST_F(CellarProviderTest, TheKernelsClockHidesNoWrite) {
-  // Two writes in one tick may have the same time. What is fetched has an old one, and what is sent is read when a tick has passed.
-  write(cloud + "/a.txt", "hello");
-  setUp();
-  start("a.txt");
-  EXPECT_EQ(modified(local("a.txt")), modified(cloud + "/a.txt"));
-  for (const char* text : {"one  ", "two  ", "three"}) {
-    write(local("a.txt"), text);
-    setModified(local("a.txt"), coarseClock() + 20'000'000);
-    change("a.txt");
-    EXPECT_GT(coarseClock(), modified(local("a.txt"))) << "the next write could hide behind this one";
-    EXPECT_EQ(read(cloud + "/a.txt"), text);
-  }
-}
-
-// --- Ended between putting a file in its place and saving the index
-
-TEST_F(CellarProviderTest, APlaceholderOfStoppingIsOneAlsoIfTheIndexDoesNotSaySo) {
-  write(cloud + "/a.txt", "hello");
-  setUp();
-  start("a.txt");
-  const std::string index = read(container + "/index");
-  EXPECT_FALSE(provider->stopProviding(url("a.txt")));
-  write(container + "/index", index);
-  restart();
-  change("a.txt");
-  EXPECT_EQ(read(cloud + "/a.txt"), "hello") << "zeros were taken for a change";
-  start("a.txt");
-  EXPECT_EQ(read(local("a.txt")), "hello");
-}
-
-TEST_F(CellarProviderTest, APlaceholderOfTheFirstSetupIsOneAlsoIfTheIndexDoesNotSaySo) {
-  write(cloud + "/a.txt", "hello");
-  const std::string before = identifier("a.txt");  // makes the index, with no file
-  const std::string index = read(container + "/index");
-  setUp();
-  write(container + "/index", index);
-  restart();
-  EXPECT_EQ(identifier("a.txt"), before);
-  start("a.txt");
-  EXPECT_EQ(read(local("a.txt")), "hello");
-}
-
-TEST_F(CellarProviderTest, APlaceholderOfANewerVersionIsOneAlsoIfTheIndexDoesNotSaySo) {
-  write(cloud + "/a.txt", "hello");
-  setUp();
-  const std::string index = read(container + "/index");
-  write(cloud + "/a.txt", "hello again");
-  setUp();
-  EXPECT_EQ(fs::file_size(local("a.txt")), 11U);
-  write(container + "/index", index);
-  restart();
-  start("a.txt");
-  EXPECT_EQ(read(local("a.txt")), "hello again");
-}
-
-TEST_F(CellarProviderTest, ContentsOfAStartStayAlsoIfTheIndexDoesNotSaySo) {
-  write(cloud + "/a.txt", "hello");
-  setUp();
-  const std::string index = read(container + "/index");
-  start("a.txt");
-  write(container + "/index", index);
-  restart();
-  start("a.txt");
-  EXPECT_EQ(read(local("a.txt")), "hello");
-}
-
-TEST_F(CellarProviderTest, ACopyOfAPlaceholderIsNotTheProvidersToRemove) {
-  write(cloud + "/a.txt", "hello");
-  setUp();
-  write(local("copy.txt"), std::string(5, '\0'));
-  setModified(local("copy.txt"), modified(local("a.txt")));
-  setUp();
-  EXPECT_EQ(names(storage), (std::vector<std::string>{"a.txt", "copy.txt"}));
-}
-
 TEST_F(CellarProviderTest, APlaceholderIsMadeForADocumentWithoutAFile) {
   write(cloud + "/a.txt", "hello");
   setUp();
@@ -555,6 +306,37 @@ TEST_F(CellarProviderTest, WithoutAContainerSetupFails) {
   unsetenv("HOME");
   restart();
   EXPECT_TRUE(isKind(provider->performInitialSetup(), CellarErrorCode::noDirectory));
+}
+
+TEST_F(CellarProviderTest, SetupTakesNoContentsForANewerVersionInTheCloud) {
+  write(cloud + "/a.txt", "hello");
+  write(cloud + "/b.txt", "hello");
+  setUp();
+  start("a.txt");
+  start("b.txt");
+  write(local("b.txt"), "mine!");
+  write(cloud + "/a.txt", "hello again");
+  write(cloud + "/b.txt", "hello again");
+  setUp();
+  EXPECT_EQ(read(local("a.txt")), "hello");
+  EXPECT_EQ(read(local("b.txt")), "mine!");
+  start("a.txt");
+  EXPECT_EQ(read(local("a.txt")), "hello again");
+}
+
+TEST_F(CellarProviderTest, TheKernelsClockHidesNoWrite) {
+  // Two writes in one tick may have the same time. What is fetched has an old one, and what is sent is read when a tick has passed.
+  write(cloud + "/a.txt", "hello");
+  setUp();
+  start("a.txt");
+  EXPECT_EQ(modified(local("a.txt")), modified(cloud + "/a.txt"));
+  for (const char* text : {"one  ", "two  ", "three"}) {
+    write(local("a.txt"), text);
+    setModified(local("a.txt"), coarseClock() + 80'000'000);
+    change("a.txt");
+    EXPECT_GT(coarseClock(), modified(local("a.txt"))) << "the next write could hide behind this one";
+    EXPECT_EQ(read(cloud + "/a.txt"), text);
+  }
 }
 
 }  // namespace
