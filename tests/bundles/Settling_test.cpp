@@ -163,9 +163,39 @@ TEST_F(SettlingTest, ABundleThatIsWrittenForEverIsLookedAtNowAndThen) {
   EXPECT_THAT(settling_.unsettled(now_), ElementsAre(kBundle)) << "and then left alone again";
 }
 
+TEST_F(SettlingTest, ABundleThatComesAndGoesIsUnsettledUntilItStays) {
+  const auto rename = [this] {
+    settling_.changed(now_);
+    settling_.wasRenamed(kBundle, now_);
+  };
+  rename();
+  rename();
+  EXPECT_THAT(settling_.unsettled(now_), IsEmpty()) << "one exchange is told as two renames";
+  for (int i = 0; i < 5; ++i) {
+    pass(150ms);
+    rename();
+    EXPECT_THAT(settling_.unsettled(now_), ElementsAre(kBundle));
+    look(Found::nothingNew);
+  }
+  pass(Settling::kQuietInPlace);
+  EXPECT_THAT(settling_.unsettled(now_), IsEmpty());
+  pass(*untilNextLook());
+  look(Found::changes);
+  pass(Settling::kComesAndGoes + 1ms);
+  rename();
+  EXPECT_THAT(settling_.unsettled(now_), IsEmpty()) << "whole at once again";
+}
+
+TEST_F(SettlingTest, RenamesOfDifferentBundlesHoldNoneOfThemUp) {
+  settling_.wasRenamed("/bundles/b", now_);
+  pass(10ms);
+  settling_.wasRenamed(kBundle, now_);
+  EXPECT_THAT(settling_.unsettled(now_), IsEmpty());
+}
+
 TEST_F(SettlingTest, ABundleThatIsRenamedIsWhole) {
   write();
-  settling_.wasRenamed(kBundle);
+  settling_.wasRenamed(kBundle, now_);
   EXPECT_THAT(settling_.unsettled(now_), IsEmpty());
   EXPECT_EQ(untilNextLook(), Settling::kShortestQuiet);
 }

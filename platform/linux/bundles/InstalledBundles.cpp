@@ -103,7 +103,7 @@ void InstalledBundles::takeChanges() {
     isToBeWatchedAnew = isToBeWatchedAnew || change.isOfDirectory;
     if (bundle.empty()) continue;
     if (path == bundle && change.kind == DirectoryChange::Kind::cameOrWent) {
-      settling_.wasRenamed(bundle);
+      settling_.wasRenamed(bundle, now);
     } else {
       settling_.wasWritten(bundle, now);
     }

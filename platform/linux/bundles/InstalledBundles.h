@@ -1,10 +1,11 @@
 // The installed bundles of this machine and this user, looked at again whenever their directories change.
 //
-// What is renamed into place is seen as a whole. What is written in place is seen when nothing was written anywhere in its directory for a
-// moment (Settling.h): a copy that goes on without pauses is never seen in part, and one that pauses longer is seen as it then is, and
-// again when it goes on; so is one that was under way when the registry was made. As long as a bundle that was seen is written to, it
-// counts as it was; its files are those on disk, so a process started from it meanwhile may find a program that does not run yet, and the
-// process of the version after that is another. Changes deeper in a bundle than kMostBundleDirectories reach are not noticed.
+// What is renamed into place is seen as a whole, at once unless it keeps coming and going. What is written in place is seen when nothing
+// was written anywhere in its directory for a moment (Settling.h): a copy that goes on without pauses is never seen in part, and one that
+// pauses longer is seen as it then is, and again when it goes on; so is one that was under way when the registry was made. As long as a
+// bundle that was seen is written to, it counts as it was; its files are those on disk, so a process started from it meanwhile may find a
+// program that does not run yet, and the process of the version after that is another. Changes deeper in a bundle than
+// kMostBundleDirectories reach are not noticed.
 #pragma once
 
 #include <array>

@@ -15,6 +15,17 @@ void Settling::changed(Time now) {
 
 void Settling::wasWritten(const std::string& bundle, Time now) { written_.try_emplace(bundle, Span{now, now}).first->second.last = now; }
 
+// One exchange is told as several renames at one time.
+void Settling::wasRenamed(const std::string& bundle, Time now) {
+  const auto [last, isFirst] = renamed_.try_emplace(bundle, now);
+  if (isFirst || now - last->second > kComesAndGoes) {
+    written_.erase(bundle);
+  } else if (now > last->second) {
+    wasWritten(bundle, now);
+  }
+  last->second = now;
+}
+
 // A bundle that has been quiet for long enough is a change like any other.
 std::optional<Settling::Time> Settling::nextLook() const {
   std::vector<Time> ends;
@@ -40,6 +51,7 @@ std::set<std::string> Settling::unsettled(Time now) const {
 void Settling::looked(Time began, Found found) {
   pending_.reset();
   std::erase_if(written_, [began](const auto& entry) { return endOf(entry.second) <= began; });
+  std::erase_if(renamed_, [began](const auto& entry) { return began - entry.second > kComesAndGoes; });
   if (found == Found::nothingNew) return;
   quiet_ = std::min(quiet_ * 2, kLongestQuiet);
   wait_ = std::min(wait_ * 2, kLongestWait);

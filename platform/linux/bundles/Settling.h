@@ -5,7 +5,8 @@
 // price: a provider that was there for a moment only is tried to be set up for seconds.)
 //
 // A bundle that is written in place (copied into the directory, or edited there) is looked at when nothing has been written there for
-// longer, and meanwhile counts as what it was. One that is renamed into place is whole.
+// longer, and meanwhile counts as what it was. One that is renamed into place is whole; but one that comes and goes again and again is
+// treated as if it were written: it counts as what it was, or as nothing once it was seen to be gone, until it stays.
 #pragma once
 
 #include <algorithm>
@@ -29,13 +30,14 @@ class Settling {
   static constexpr Duration kLongestWait{4'000};
   static constexpr Duration kBusy{5'000};             // after a look that found changes; then both are short again
   static constexpr Duration kQuietInPlace{200};       // of one bundle
+  static constexpr Duration kComesAndGoes{1'000};     // between two renames of one bundle
   static constexpr Duration kLongestInPlace{10'000};  // a bundle that is written to for ever is looked at so often
 
   // Something changed that may have to do with bundles.
   void changed(Time now);
   // The bundle is being written to in its place. It came or went as a whole.
   void wasWritten(const std::string& bundle, Time now);
-  void wasRenamed(const std::string& bundle) { written_.erase(bundle); }
+  void wasRenamed(const std::string& bundle, Time now);
 
   // When to look next; none: there is nothing to look for.
   [[nodiscard]] std::optional<Time> nextLook() const;
@@ -57,6 +59,7 @@ class Settling {
 
   std::optional<Span> pending_;          // the changes that no look has seen
   std::map<std::string, Span> written_;  // bundles that were written in place, until they are judged
+  std::map<std::string, Time> renamed_;  // bundles that came or went a short while ago
   std::optional<Time> lastFind_;         // when a look last found changes
   Duration quiet_ = kShortestQuiet;
   Duration wait_ = kFirstWait;
