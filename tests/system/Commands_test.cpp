@@ -332,6 +332,12 @@ TEST_F(Commands, GrantsOfAnUninstalledBundleAreShownAsProvidersAndAsConsumers) {
   EXPECT_NE(house_.ctl({"grants"}).output, "");
 }
 
+TEST_F(Commands, AGrantThatNamesABundleTwiceIsShownOnce) {
+  const std::string item = itemOf(house_.granted(letter_, kCellar));
+  expectPrinted(house_.ctl({"uninstall", kCellar}),
+                "bundle\t" + kCellar + "\nremainingGrants\t" + kCellar + "\t" + item + "\t" + kCellar + "\n");
+}
+
 TEST_F(Commands, GrantsOfAnUninstalledBundleAreRemovedOnRequest) {
   const std::string item = itemOf(house_.granted(letter_, kStranger));
   (void)house_.granted(letter_, kPicker);

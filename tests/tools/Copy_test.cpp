@@ -76,6 +76,15 @@ TEST(Copy, Base64HasPaddingAtTheEndOnlyAlsoWhenBytesTrickle) {
   EXPECT_EQ(contentsOf(to), "ZmZmZmZmZg==");
 }
 
+TEST(Copy, Base64OfALargeFileIsOneText) {
+  const auto from = fileWith(std::string(100'000, 'f'));
+  const auto to = fileWith("");
+  EXPECT_EQ(copyAllAsBase64(from.get(), to.get()), std::nullopt);
+  std::string expected;
+  for (int i = 0; i < 33'333; ++i) expected += "ZmZm";
+  EXPECT_EQ(contentsOf(to), expected + "Zg==");
+}
+
 TEST(Copy, AFailureSaysOnWhichSideItWas) {
   const auto file = fileWith("x");
   const UniqueDescriptor directory(::open("/", O_RDONLY | O_CLOEXEC));

@@ -9,6 +9,7 @@
 #include <vector>
 
 #include "platform/linux/base/UniqueDescriptor.h"
+#include "tests/tools/PseudoTerminal.h"
 
 namespace docuvend::ctl {
 namespace {
@@ -73,6 +74,22 @@ TEST_F(ProgressLineTest, AShorterTextCoversTheLongerOneBeforeIt) {
   EXPECT_EQ(written().substr(before.size()), "\r0 B" + std::string(before.size() - 1 - 3, ' '));
   line.clear();
   EXPECT_THAT(written(), EndsWith("\r   \r"));
+}
+
+TEST_F(ProgressLineTest, WithoutNewBytesThereIsNoRate) {
+  ProgressLine line(terminal_.get());
+  line.show({500, 1000});
+  line.show({500, 1000});
+  line.show({400, 1000});
+  EXPECT_EQ(written(), "\r 50 %  500 B of 1.0 kB\r 50 %  500 B of 1.0 kB\r 40 %  400 B of 1.0 kB");
+}
+
+TEST_F(ProgressLineTest, OnANarrowTerminalItLeavesTheLastColumnFree) {
+  tests::PseudoTerminal terminal(12);
+  ProgressLine line(terminal.descriptor());
+  line.show({500, 1000});
+  line.clear();
+  EXPECT_EQ(terminal.finished(), "\r 50 %  500\u2026\r           \r");
 }
 
 TEST_F(ProgressLineTest, WritesNothingWhenNothingWasShownAndNothingMoreOnceItIsCleared) {

@@ -1,11 +1,10 @@
-#include <filesystem>
 #include <memory>
-#include <system_error>
 
 #include "common/DVErrorCodes.h"
 #include "platform/linux/bundles/BundleInstaller.h"
 #include "platform/linux/files/LinuxPropertyLists.h"
 #include "tools/docuvendctl/CommandTable.h"
+#include "tools/docuvendctl/Connect.h"
 #include "tools/docuvendctl/GrantList.h"
 #include "tools/docuvendctl/Place.h"
 
@@ -19,11 +18,8 @@ using linux_platform::Paths;
 Result<Answer> install(const Call& call) {
   auto paths = unconfinedPaths();
   if (auto* error = std::get_if<QXError>(&paths)) return *error;
-  std::error_code failed;
-  const std::string directory = std::filesystem::absolute(call.operands[0], failed).string();
-  if (failed) return QXError::system(failed.value(), "cannot find " + call.operands[0]);
   LinuxPropertyLists propertyLists;
-  auto installed = linux_platform::installBundle(directory, std::get<Paths>(paths), propertyLists);
+  auto installed = linux_platform::installBundle(call.operands[0], std::get<Paths>(paths), propertyLists);
   if (auto* error = std::get_if<QXError>(&installed)) return *error;
   const auto& bundle = std::get<InstalledBundle>(installed);
   return Answer(Record{{{"bundle", QXValue(bundle.identifier)},
@@ -55,15 +51,9 @@ Failure revokeAll(Administrator& administrator, const std::vector<Grant>& grants
   return std::nullopt;
 }
 
-Result<std::unique_ptr<Administrator>> connect(const Call& call) {
-  Administrator::Options options;
-  if (call.deadline) options.deadline = *call.deadline;
-  return Administrator::connect(options);
-}
-
 Result<Answer> uninstallAndRevoke(const Call& call, const Paths& paths) {
   const std::string& identifier = call.operands[0];
-  auto connected = connect(call);
+  auto connected = connectAdministrator(call.deadline);
   if (auto* error = std::get_if<QXError>(&connected)) return *error;
   auto& administrator = *std::get<std::unique_ptr<Administrator>>(connected);
   // Connecting succeeds also where nobody answers.
@@ -84,7 +74,7 @@ Result<Answer> uninstallAlone(const Call& call, const Paths& paths) {
   if (auto failure = linux_platform::uninstallBundle(identifier, paths, propertyLists)) return *failure;
   Record record{{{"bundle", QXValue(identifier)}}};
   Record::Value remaining = QXValue();
-  auto connected = connect(call);
+  auto connected = connectAdministrator(call.deadline);
   if (auto* administrator = std::get_if<std::unique_ptr<Administrator>>(&connected)) {
     auto grants = grantsNaming(**administrator, identifier);
     if (auto* listed = std::get_if<std::vector<Grant>>(&grants)) remaining = listOf(*listed);

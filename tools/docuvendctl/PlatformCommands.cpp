@@ -5,6 +5,7 @@
 
 #include "platform/linux/files/LinuxDeviceLock.h"
 #include "tools/docuvendctl/CommandTable.h"
+#include "tools/docuvendctl/Connect.h"
 #include "tools/docuvendctl/Operands.h"
 #include "tools/docuvendctl/Outcome.h"
 #include "tools/docuvendctl/Place.h"
@@ -68,9 +69,7 @@ Result<Answer> firstUnlock(const Call& call) {
   state.unlockedSinceBoot = true;
   if (auto failure = write(paths, state)) return *failure;
 
-  Administrator::Options options;
-  if (call.deadline) options.deadline = *call.deadline;
-  auto connected = Administrator::connect(options);
+  auto connected = connectAdministrator(call.deadline);
   if (const auto* error = std::get_if<QXError>(&connected)) return done(isNotRunning(*error) ? std::nullopt : Failure(*error));
   return done(std::get<std::unique_ptr<Administrator>>(connected)->announceFirstUnlock());
 }

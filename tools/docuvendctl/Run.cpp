@@ -7,6 +7,7 @@
 
 #include "tools/docuvendctl/CommandLine.h"
 #include "tools/docuvendctl/CommandTable.h"
+#include "tools/docuvendctl/Connect.h"
 #include "tools/docuvendctl/Printer.h"
 #include "tools/docuvendctl/ProgressLine.h"
 #include "tools/docuvendctl/Terminal.h"
@@ -22,18 +23,13 @@ class Runner {
   Result<Answer> operator()(LocalCommand command) const { return command(line_.call); }
 
   Result<Answer> operator()(AdministratorCommand command) const {
-    Administrator::Options options;
-    if (line_.call.deadline) options.deadline = *line_.call.deadline;
-    auto connected = Administrator::connect(options);
+    auto connected = connectAdministrator(line_.call.deadline);
     if (auto* error = std::get_if<QXError>(&connected)) return *error;
     return command(*std::get<std::unique_ptr<Administrator>>(connected), line_.call);
   }
 
   Result<Answer> operator()(ConsumerCommand command) const {
-    Consumer::Options options;
-    options.actAs = line_.actAs;
-    if (line_.call.deadline) options.deadline = options.materialisingDeadline = *line_.call.deadline;
-    auto connected = Consumer::connect(std::move(options));
+    auto connected = connectConsumer(line_.actAs, line_.call.deadline);
     if (auto* error = std::get_if<QXError>(&connected)) return *error;
     return command(*std::get<std::unique_ptr<Consumer>>(connected), line_.call);
   }
