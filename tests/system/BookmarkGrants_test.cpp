@@ -119,6 +119,13 @@ TEST_F(BookmarkGrants, OneThatBuiltTheSamePathInItsOwnDirectoriesDoesNotPass) {
   EXPECT_EQ(house_.accessControl(), "");
 }
 
+TEST_F(BookmarkGrants, OneWhosePathLeadsIntoItsOwnContainerDoesNotPass) {
+  const std::string own = house_.container(kAuthor) + "/own.txt";
+  EXPECT_THAT(say(kAuthor, {"make", own, "link", letter_.fileSystemPath(), own, "extend", letter_.absoluteString(), kFriend}),
+              ElementsAre("ok", "ok", kNotPermitted));
+  EXPECT_EQ(house_.accessControl(), "");
+}
+
 TEST_F(BookmarkGrants, AFileOfItsOwnBelongsToNoProvider) {
   const QXURL own = url(house_.container(kAuthor) + "/own.txt");
   const auto answers = say(kAuthor, {"make", own.fileSystemPath(), "extend", own.absoluteString(), kFriend});

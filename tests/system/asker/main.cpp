@@ -8,6 +8,7 @@
 //   write STRING                 the same for writing
 //   map STRING                   maps a document for reading, and closes it
 //   make PATH                    makes a file, with its directories
+//   link PATH TARGET             makes a symbolic link, with its directories
 //   hold                         makes the file "holding" in its container, and waits until the file "go" lies there
 //
 // Prints a line for each: "ok", a string, or the domains and codes of an error and of what stands beneath it.
@@ -70,6 +71,7 @@ class Asker {
     if (verb == "write") return keep(open(words, Access::readWrite));
     if (verb == "map") return map(open(words, Access::read));
     if (verb == "make") return make(words.next());
+    if (verb == "link") return link(words);
     if (verb == "hold") return hold();
     return "no such word: " + verb;
   }
@@ -107,12 +109,21 @@ class Asker {
     return mapped == MAP_FAILED ? text(QXError::system(errno, "cannot map")) : "ok";
   }
 
-  static std::string make(const std::string& path) {
+  static std::error_code makeDirectoriesOf(const std::filesystem::path& path) {
     std::error_code error;
-    std::filesystem::create_directories(std::filesystem::path(path).parent_path(), error);
-    if (error) return text(QXError::system(error.value(), "cannot make the directories"));
+    std::filesystem::create_directories(path.parent_path(), error);
+    return error;
+  }
+  static std::string make(const std::string& path) {
+    if (const auto error = makeDirectoriesOf(path)) return text(QXError::system(error.value(), "cannot make the directories"));
     std::ofstream file(path);
     return file << "mine" << std::flush ? "ok" : "cannot make the file";
+  }
+  static std::string link(Words& words) {
+    const std::filesystem::path path = words.next();
+    auto error = makeDirectoriesOf(path);
+    if (!error) std::filesystem::create_symlink(words.next(), path, error);
+    return error ? text(QXError::system(error.value(), "cannot make the link")) : "ok";
   }
   static std::string hold() {
     std::ofstream("holding").close();
