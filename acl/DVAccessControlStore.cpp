@@ -95,6 +95,12 @@ bool DVAccessControlStore::hasUnwrittenChanges() const {
   return qxSync(*syncQueue_, [&] { return syncQueueHasUnwrittenChanges_; });
 }
 
+void DVAccessControlStore::writeUnwrittenChanges() {
+  syncQueue_->sync([&] {
+    if (syncQueueHasUnwrittenChanges_) syncQueueCommitAccessControl();
+  });
+}
+
 void DVAccessControlStore::allowProviderWithIdentifier(const ProviderID& provider, const ItemID& toProvideItemID,
                                                        const ConsumerID& toConsumerWithIdentifier) {
   syncQueue_->sync([&] {

@@ -42,6 +42,8 @@ class DVAccessControlStore final : public DVAccessControl, public std::enable_sh
   [[nodiscard]] std::vector<DVGrant> grants() const;
   // The file says less or more than the list: the latest change could not be written.
   [[nodiscard]] bool hasUnwrittenChanges() const;
+  // Writes the list once more if that is so.
+  void writeUnwrittenChanges();
 
   void allowProviderWithIdentifier(const ProviderID& provider, const ItemID& toProvideItemID, const ConsumerID& toConsumerWithIdentifier);
   void disallowProviderWithIdentifier(const ProviderID& provider, const ItemID& fromProvidingItemWithID,

@@ -30,15 +30,21 @@ std::optional<std::string> directoryOf(const ProviderID& providerID) {
   return directory->fileSystemPath();
 }
 
-// The list first: whoever asks for a new token from then on is refused one, and the old ones go after that. When the list could not be
-// written they go all the same, for it holds in memory.
+// The list first: from then on it entitles nobody to a new token, and the old ones go after that. When the list could not be written they
+// go all the same, for it holds in memory. Then the same revocation, asked for again, finds no grant but has the list written: it is not
+// told that there was nothing to revoke.
 std::optional<QXError> revoke(const ProviderID& providerID, const ItemID& itemID, const ConsumerID& consumerID) {
   DVAccessControlStore& store = *DVAccessControlStore::sharedStore();
-  if (!store.isProviderWithIdentifier(providerID, itemID, consumerID)) return DVNotFoundError(itemID);
-  store.disallowProviderWithIdentifier(providerID, itemID, consumerID);
+  if (store.isProviderWithIdentifier(providerID, itemID, consumerID)) {
+    store.disallowProviderWithIdentifier(providerID, itemID, consumerID);
+  } else if (store.hasUnwrittenChanges()) {
+    store.writeUnwrittenChanges();
+  } else {
+    return DVNotFoundError(itemID);
+  }
   const bool isOnDisk = !store.hasUnwrittenChanges();
   auto tokensError = QXPlatform::current().sandbox.invalidateReadWriteExtensions(directoryOf(providerID));
-  if (!isOnDisk) return QXError::system(EIO, "the access control list could not be written; the grant is back after a restart");
+  if (!isOnDisk) return QXError::system(EIO, "the access control list could not be written; when it is read again the grant is back");
   return tokensError;
 }
 

@@ -43,7 +43,8 @@ class DVAdministration {
   // Takes the grant from the list, which is on disk before the answer, and makes the sandbox tokens worthless that were issued for files of
   // that provider, to whomever: who still has a grant gets new ones. DVInvalidParameterError for the first argument that is absent,
   // DVNotFoundError when there is no such grant. An error of the system says that the list or the tokens' end could not be written: both
-  // hold all the same while this daemon runs.
+  // hold all the same, the list until it is read again (at a first unlock, and after a restart), the tokens' end until a restart. Asking
+  // again writes the list again.
   virtual void revokeItemID(std::optional<ItemID> itemID, std::optional<ProviderID> fromProviderID, std::optional<ConsumerID> toConsumerID,
                             ErrorReply completionHandler) = 0;
 

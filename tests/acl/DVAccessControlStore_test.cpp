@@ -368,6 +368,17 @@ TEST_F(DVAccessControlStoreTest, AChangeThatCouldNotBeWrittenIsUnwrittenUntilALa
   EXPECT_FALSE(store().hasUnwrittenChanges());
 }
 
+TEST_F(DVAccessControlStoreTest, AnUnwrittenChangeIsWrittenOnDemandAndNothingElseIs) {
+  platform_.propertyLists.failWrite(1, FakeWriteFailure::once);
+  grant(kReport);
+  platform_.log.clear();
+  store().writeUnwrittenChanges();
+  EXPECT_FALSE(store().hasUnwrittenChanges());
+  EXPECT_EQ(platform_.log.entries().size(), 1U) << "the list was committed once";
+  store().writeUnwrittenChanges();
+  EXPECT_EQ(platform_.log.entries().size(), 1U);
+}
+
 TEST_F(DVAccessControlStoreTest, ARereadThatTakesTheFilesListLeavesNothingUnwritten) {
   grant(kReport);
   platform_.propertyLists.failWrite(2, FakeWriteFailure::once);

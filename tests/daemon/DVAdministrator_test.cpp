@@ -252,9 +252,19 @@ TEST_F(DVAdministratorTest, ARevocationThatCannotBeWrittenIsAnErrorAndTheTokensA
   platform_.propertyLists.failWrite(2, FakeWriteFailure::once);
   const auto error = revoke(kReport, kCellar, kEditor);
   ASSERT_TRUE(error);
-  EXPECT_EQ(*error, QXError::system(EIO, "the access control list could not be written; the grant is back after a restart"));
+  EXPECT_EQ(*error, QXError::system(EIO, "the access control list could not be written; when it is read again the grant is back"));
   EXPECT_EQ(platform_.sandbox.invalidations().size(), 1U);
   EXPECT_FALSE(store().isProviderWithIdentifier(kCellar, kReport, kEditor));
+}
+
+TEST_F(DVAdministratorTest, ARevocationThatCouldNotBeWrittenIsWrittenWhenItIsAskedForAgain) {
+  grant(kCellar, kReport, kEditor);
+  platform_.propertyLists.failWrite(2, FakeWriteFailure::once);
+  ASSERT_TRUE(revoke(kReport, kCellar, kEditor));
+  EXPECT_EQ(revoke(kReport, kCellar, kEditor), std::nullopt);
+  EXPECT_FALSE(store().hasUnwrittenChanges());
+  EXPECT_EQ(platform_.sandbox.invalidations().size(), 2U);
+  EXPECT_EQ(revoke(kReport, kCellar, kEditor), DVNotFoundError(kReport)) << "now there is nothing left to do";
 }
 
 // --- The first unlock
