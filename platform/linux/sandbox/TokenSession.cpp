@@ -71,8 +71,8 @@ std::variant<std::unique_ptr<TokenSession>, QXError> TokenSession::load(const Pa
   return std::make_unique<TokenSession>(paths.tokenFloors, std::get<TokenKey>(key), TokenFloors());
 }
 
-TokenSession::TokenSession(std::string floorsFile, TokenKey key, TokenFloors floors)
-    : floorsFile_(std::move(floorsFile)), key_(std::move(key)), floors_(std::move(floors)), numberOnDisk_(floors_.number()) {}
+TokenSession::TokenSession(std::string floorsFile, const TokenKey& key, TokenFloors floors)
+    : floorsFile_(std::move(floorsFile)), key_(key), floors_(std::move(floors)), numberOnDisk_(floors_.number()) {}
 
 // The number that a new token for the path may have: a good one that is on disk.
 std::optional<TokenNumber> TokenSession::issuableNumber(const std::string& path) {

@@ -28,7 +28,7 @@ class TokenSession {
   // are missing or cannot be trusted is renewed, with one line in the log: what had been taken back is not known any more. An error when
   // the key's file is not one, or a file cannot be written.
   [[nodiscard]] static std::variant<std::unique_ptr<TokenSession>, QXError> load(const Paths& paths, QXLogHandle& log);
-  TokenSession(std::string floorsFile, TokenKey key, TokenFloors floors);
+  TokenSession(std::string floorsFile, const TokenKey& key, TokenFloors floors);
 
   // For a path free of links. None when tokens for it were taken back and that can still not be written down: after a restart such a
   // token could not be told from those that were taken back.
