@@ -169,6 +169,28 @@ TEST_F(TokenRedeemerTest, AnswersBusyInsteadOfWaitingForALease) {
   ::alarm(0);
 }
 
+TEST_F(TokenRedeemerTest, AFileThatIsBeingReplacedIsTheOldOneOrTheNewOneAndNeverGone) {
+  const std::string token = tokenFor(document);
+  std::atomic<bool> stop{false};
+  std::thread saver([this, &stop] {
+    while (!stop.load()) {
+      write(document + ".new", "contents");
+      EXPECT_EQ(::rename((document + ".new").c_str(), document.c_str()), 0);
+    }
+  });
+  for (int round = 0; round < kRaceRounds && !HasFailure(); ++round) {
+    const auto result = redeemer.redeem(token, TokenUse::reading);
+    if (const auto* file = std::get_if<RedeemedFile>(&result)) {
+      EXPECT_EQ(contentsOf(file->file), "contents");
+    } else {
+      EXPECT_EQ(std::get<QXError>(result).code, static_cast<std::int64_t>(SandboxErrorCode::busy))
+          << std::get<QXError>(result).description();
+    }
+  }
+  stop.store(true);
+  saver.join();
+}
+
 TEST_F(TokenRedeemerTest, MakesAMissingHiddenSiblingForWriting) {
   expectError(tokenFor(sibling), TokenUse::reading, SandboxErrorCode::gone, "reading makes nothing");
   EXPECT_FALSE(std::filesystem::exists(sibling));

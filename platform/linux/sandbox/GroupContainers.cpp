@@ -11,6 +11,9 @@
 namespace docuvend::linux_platform {
 namespace {
 
+// What has the name was removed that often while it was looked at: somebody does it on purpose.
+constexpr int kLooks = 8;
+
 PathRefusal refusalFor(int code) {
   switch (code) {
     case ELOOP:
@@ -164,19 +167,22 @@ std::vector<std::string> GroupContainers::spellingsOf(const std::string& directo
 }
 
 std::variant<std::optional<PlacedFile>, PathRefusal> placeEntry(int directory, const std::string& name) {
-  auto opened = openBeneath(directory, name, Expecting::anything);
-  if (const auto* failure = std::get_if<SystemFailure>(&opened)) {
-    if (failure->code == ENOENT) return std::optional<PlacedFile>();
-    return refusalFor(failure->code);
+  for (int look = 0; look < kLooks; ++look) {
+    auto opened = openBeneath(directory, name, Expecting::anything);
+    if (const auto* failure = std::get_if<SystemFailure>(&opened)) {
+      if (failure->code == ENOENT) return std::optional<PlacedFile>();
+      return refusalFor(failure->code);
+    }
+    auto& path = std::get<UniqueDescriptor>(opened);
+    const auto examined = statusOf(path.get());
+    if (std::holds_alternative<SystemFailure>(examined)) return PathRefusal::unreachable;
+    const auto& status = std::get<ObjectStatus>(examined);
+    if (!S_ISREG(status.mode)) return PathRefusal::notRegularFile;
+    if (status.links == 0) continue;  // removed since; if it was by an atomic save, another file has the name
+    if (status.links != 1) return PathRefusal::severalLinks;
+    return std::optional<PlacedFile>(PlacedFile{std::move(path), status.identity});
   }
-  auto& path = std::get<UniqueDescriptor>(opened);
-  const auto examined = statusOf(path.get());
-  if (std::holds_alternative<SystemFailure>(examined)) return PathRefusal::unreachable;
-  const auto& status = std::get<ObjectStatus>(examined);
-  if (!S_ISREG(status.mode)) return PathRefusal::notRegularFile;
-  if (status.links == 0) return std::optional<PlacedFile>();  // removed since
-  if (status.links != 1) return PathRefusal::severalLinks;
-  return std::optional<PlacedFile>(PlacedFile{std::move(path), status.identity});
+  return PathRefusal::unsteady;
 }
 
 }  // namespace docuvend::linux_platform

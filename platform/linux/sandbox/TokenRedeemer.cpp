@@ -24,8 +24,8 @@
 namespace docuvend::linux_platform {
 namespace {
 
-// The sibling vanished or appeared in between that often: somebody does it on purpose.
-constexpr int kCreationTries = 8;
+// What has the name was another file that often: somebody does it on purpose.
+constexpr int kTries = 8;
 constexpr mode_t kSiblingMode = 0600;
 constexpr mode_t kPermissionBits = 0777;
 constexpr int kNeverWaiting = O_NONBLOCK | O_NOCTTY | O_CLOEXEC;
@@ -43,15 +43,18 @@ struct OpenFile {
   ObjectIdentity identity;
 };
 
+// The name has come to mean another file meanwhile, as when somebody saves atomically.
+struct Exchanged {};
+
 // Opens the object itself and makes sure that it is still a regular file with one link.
-std::variant<OpenFile, QXError> openPlaced(const PlacedFile& placed, int access) {
+std::variant<OpenFile, Exchanged, QXError> openPlaced(const PlacedFile& placed, int access) {
   UniqueDescriptor file(::open(descriptorPath(placed.path.get()).c_str(), access | kNeverWaiting));
   if (!file) return sandboxErrorFor(SystemFailure{errno}, "the file cannot be opened");
   const auto examined = statusOf(file.get());
   if (const auto* failure = std::get_if<SystemFailure>(&examined)) return sandboxErrorFor(*failure, "the file cannot be examined");
   const auto& status = std::get<ObjectStatus>(examined);
   if (status.identity != placed.identity || !S_ISREG(status.mode)) return sandboxErrorFor(PathRefusal::notRegularFile);
-  if (status.links == 0) return sandboxError(SandboxErrorCode::gone, "the file was removed");
+  if (status.links == 0) return Exchanged{};
   if (status.links != 1) return sandboxErrorFor(PathRefusal::severalLinks);
   const int flags = ::fcntl(file.get(), F_GETFL);
   if (flags < 0 || ::fcntl(file.get(), F_SETFL, flags & ~O_NONBLOCK) != 0) {
@@ -60,14 +63,12 @@ std::variant<OpenFile, QXError> openPlaced(const PlacedFile& placed, int access)
   return OpenFile{std::move(file), placed.identity};
 }
 
-struct NameTaken {};
-
 // Makes the missing sibling, unless something has its name by now.
-std::variant<OpenFile, NameTaken, QXError> createSibling(const PlacedItem& sibling) {
+std::variant<OpenFile, Exchanged, QXError> createSibling(const PlacedItem& sibling) {
   UniqueDescriptor file(
       ::openat(sibling.directory.get(), sibling.name.c_str(), O_RDWR | O_CREAT | O_EXCL | O_NOFOLLOW | O_NOCTTY | O_CLOEXEC, kSiblingMode));
   if (!file) {
-    if (errno == EEXIST) return NameTaken{};
+    if (errno == EEXIST) return Exchanged{};
     return sandboxErrorFor(SystemFailure{errno}, "the hidden sibling cannot be created");
   }
   const auto examined = statusOf(file.get());
@@ -132,7 +133,7 @@ std::variant<PlacedItem, QXError> TokenRedeemer::placed(std::string_view token) 
 }
 
 std::variant<RedeemedFile, QXError> TokenRedeemer::redeem(std::string_view token, TokenUse tokenUse) const {
-  for (int attempt = 0; attempt < kCreationTries; ++attempt) {
+  for (int attempt = 0; attempt < kTries; ++attempt) {
     auto use = session_.beginUse();
     auto place = placed(token);
     if (auto* error = std::get_if<QXError>(&place)) return std::move(*error);
@@ -140,6 +141,7 @@ std::variant<RedeemedFile, QXError> TokenRedeemer::redeem(std::string_view token
     if (item.file) {
       auto opened = openPlaced(*item.file, accessMode(tokenUse));
       if (auto* error = std::get_if<QXError>(&opened)) return std::move(*error);
+      if (std::holds_alternative<Exchanged>(opened)) continue;
       auto& [file, identity] = std::get<OpenFile>(opened);
       return RedeemedFile{std::move(file), identity, std::move(use)};
     }
@@ -172,6 +174,7 @@ std::variant<ReplacedItem, QXError> TokenRedeemer::replaceItem(std::string_view 
 
   auto opened = openPlaced(*source, O_RDONLY);
   if (auto* error = std::get_if<QXError>(&opened)) return std::move(*error);
+  if (std::holds_alternative<Exchanged>(opened)) return goneError();
   const int file = std::get<OpenFile>(opened).file.get();
   if (auto error = flush(file, "the hidden sibling cannot be written")) return *std::move(error);
 
