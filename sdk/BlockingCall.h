@@ -42,6 +42,23 @@ struct NotDelivered {
 };
 struct NotInTime {};
 
+// A call that nobody has settled yet; it is settled once. What it holds goes before the caller knows, so that the caller's own is the last.
+template <class Outcome>
+class PendingCall {
+ public:
+  explicit PendingCall(std::shared_ptr<const void> held) : held_(std::move(held)) {}
+
+  [[nodiscard]] std::future<Outcome> outcome() { return promise_.get_future(); }
+  void settle(Outcome outcome) {
+    held_.reset();
+    promise_.set_value(std::move(outcome));
+  }
+
+ private:
+  std::promise<Outcome> promise_;
+  std::shared_ptr<const void> held_;
+};
+
 template <class Completion>
 struct AnswerOf;
 template <class... Replies>
@@ -49,11 +66,8 @@ struct AnswerOf<std::function<void(std::optional<Replies>...)>> {
   using Values = std::tuple<std::optional<Replies>...>;
   using Outcome = std::variant<Values, NotDelivered, NotInTime>;
 
-  static std::function<void(std::optional<Replies>...)> fulfil(std::shared_ptr<std::promise<Outcome>> promise,
-                                                               std::shared_ptr<const void> held) {
-    return [promise = std::move(promise), held = std::move(held)](std::optional<Replies>... replies) {
-      promise->set_value(Values(std::move(replies)...));
-    };
+  static std::function<void(std::optional<Replies>...)> settle(std::shared_ptr<PendingCall<Outcome>> call) {
+    return [call = std::move(call)](std::optional<Replies>... replies) { call->settle(Values(std::move(replies)...)); };
   }
 };
 
@@ -68,14 +82,13 @@ using Outcome = typename AnswerOf<typename rpc_detail::Traits<Method>::Completio
 template <auto Method, class... Arguments>
 [[nodiscard]] Outcome<Method> callAndWait(linux_platform::Endpoint& endpoint, const Waiting& waiting, Arguments&&... arguments) {
   using Traits = rpc_detail::Traits<Method>;
-  auto promise = std::make_shared<std::promise<Outcome<Method>>>();
-  auto answer = promise->get_future();
+  const auto call = std::make_shared<PendingCall<Outcome<Method>>>(waiting.held);
+  auto answer = call->outcome();
   const QXRemote<typename Traits::ProtocolType> remote(
-      endpoint.remoteObjectProxy([promise](const QXError& error, linux_platform::MessageFate fate) {
-        promise->set_value(NotDelivered{error, fate});
+      endpoint.remoteObjectProxy([call](const QXError& error, linux_platform::MessageFate fate) {
+        call->settle(NotDelivered{error, fate});
       }));
-  remote.template call<Method>(std::forward<Arguments>(arguments)...,
-                               AnswerOf<typename Traits::CompletionType>::fulfil(promise, waiting.held));
+  remote.template call<Method>(std::forward<Arguments>(arguments)..., AnswerOf<typename Traits::CompletionType>::settle(call));
   for (;;) {
     const TimePoint wakeUp = waiting.meanwhile ? std::min(waiting.until, after(waiting.interval)) : waiting.until;
     if (answer.wait_until(wakeUp) == std::future_status::ready) return answer.get();

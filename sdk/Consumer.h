@@ -140,13 +140,14 @@ class Consumer {
                                           const ProgressHandler& progress = {});
 
   // Saves so that a reader sees the old contents or the new, also after a power failure: `write` fills an empty file beside the item (its
-  // hidden sibling), which then takes the item's place, and the provider is told. The time that `write` takes does not count. The new file
-  // has mode 600.
+  // hidden sibling), which then takes the item's place with its permissions, and the provider is told. The time that `write` takes does
+  // not count.
   //
   // Of several who save one item through this library at once each waits for the one before it, so the last one's contents stay. The
-  // others need not be in this process, but a program that writes the sibling without taking its lock (flock) is not kept out.
+  // others need not be in this process, but a program that writes the sibling without taking the locks (flock, of the item and of the
+  // sibling) is not kept out, and a process that is killed within the last step leaves that to the daemon without them.
   //
-  // Failures. `noToken`; `deadlinePassed` above the reason while somebody else is saving; an error of redeem, of emptying the sibling, or
+  // Failures. `noToken`; `deadlinePassed` while somebody else is saving; an error of redeem, of emptying the sibling, or
   // what `write` returns to give up: the item is untouched. Then, of putting the sibling in its place: `unreachable` and of
   // QXSandboxErrorDomain badToken (1), notRegularFile (2), notPermitted (5) and notSiblings (6) leave it untouched; after anything else
   // it has the old contents or the new. `notTold`: it has the new ones; call finishedWriting again.

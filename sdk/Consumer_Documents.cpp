@@ -1,12 +1,12 @@
 // Documents as open files, and their saving.
 //
-// Several may save one item at once, and they share its hidden sibling. Who writes it holds its lock (flock), from before it is emptied
-// until it has taken the item's place or given up. The lock belongs to a file, not to a name, and the saver before may have renamed the
-// file away between opening and locking it: it is now the item itself, which nobody may write into. So who has the lock opens the sibling's
-// token again and goes on only if that is still the same file.
+// Several may save one item at once, and they share its hidden sibling. So a saver first locks (flock) the item, then the sibling, and
+// keeps both until it is done. A lock belongs to a file, not to a name, and a save exchanges the file: the item is what was the sibling,
+// whose lock its saver still holds, and the next saver finds it locked under its new name. The file that somebody has waited for is the old
+// item then, so who gets a lock opens the token again and goes on only if that is still the same file.
 //
 // When no answer tells whether the sibling has taken the item's place, the request may still be on its way, and the next saver must not
-// begin to write what may become the item at any moment: the lock is held until the answer comes or can come no more.
+// begin to write what may become the item at any moment: the locks are held until the answer comes or can come no more.
 #include <sys/file.h>
 #include <sys/stat.h>
 #include <unistd.h>
@@ -85,23 +85,30 @@ class LockedFile {
   const QXDescriptor file_;
 };
 
-// The hidden sibling, this saver's alone.
-Result<std::shared_ptr<const LockedFile>> lockSibling(Consumer& consumer, const QXData& token, TimePoint until) {
+using Lock = std::shared_ptr<const LockedFile>;
+
+// The file that the token opens, this saver's alone.
+Result<Lock> lock(Consumer& consumer, const QXData& token, Access access, TimePoint until) {
   do {
-    auto opened = consumer.within(timeLeft(until)).redeem(token, Access::readWrite);
+    auto opened = consumer.within(timeLeft(until)).redeem(token, access);
     if (auto* error = std::get_if<QXError>(&opened)) return std::move(*error);
     auto locked = LockedFile::lock(std::get<QXDescriptor>(std::move(opened)));
     if (const auto* errnoValue = std::get_if<int>(&locked)) {
-      if (*errnoValue != EWOULDBLOCK) return QXError::system(*errnoValue, "cannot lock the hidden sibling");
+      if (*errnoValue != EWOULDBLOCK) return QXError::system(*errnoValue, "cannot lock a file to be saved");
       continue;
     }
-    auto& sibling = std::get<std::shared_ptr<const LockedFile>>(locked);
-    auto again = consumer.within(timeLeft(until)).redeem(token, Access::readWrite);
+    auto& file = std::get<Lock>(locked);
+    auto again = consumer.within(timeLeft(until)).redeem(token, access);
     if (auto* error = std::get_if<QXError>(&again)) return std::move(*error);
-    if (isSameFile(sibling->file(), std::get<QXDescriptor>(again))) return std::move(sibling);
+    if (isSameFile(file->file(), std::get<QXDescriptor>(again))) return std::move(file);
   } while (pauseUntil(until));
   return makeConsumerError(ConsumerErrorCode::deadlinePassed, "Somebody else was saving the document all the time.");
 }
+
+struct Locks {
+  Lock item;
+  Lock sibling;
+};
 
 // Does `act` with the document; once more with new tokens when these have become worthless and the library can ask for others.
 template <class Act>
@@ -160,26 +167,28 @@ Result<QXDescriptor> Consumer::open(const Document& document, const ProviderID& 
 }
 
 Failure Consumer::replace(const Document& document, const std::function<Failure(const QXDescriptor&)>& write) {
-  struct Ready {
+  struct Locked {
     Document document;
-    std::shared_ptr<const LockedFile> sibling;
+    Locks locks;
   };
   const TimePoint until = after(options_.deadline);
-  auto prepared = withLiveTokens(*this, document, until, [&](const Document& live) -> Result<Ready> {
+  auto prepared = withLiveTokens(*this, document, until, [&](const Document& live) -> Result<Locked> {
     if (!live.itemToken || !live.siblingToken) return noTokens(live);
-    auto sibling = lockSibling(*this, *live.siblingToken, until);
+    auto item = lock(*this, *live.itemToken, Access::read, until);
+    if (auto* error = std::get_if<QXError>(&item)) return std::move(*error);
+    auto sibling = lock(*this, *live.siblingToken, Access::readWrite, until);
     if (auto* error = std::get_if<QXError>(&sibling)) return std::move(*error);
-    return Ready{live, std::get<0>(std::move(sibling))};
+    return Locked{live, {std::get<Lock>(item), std::get<Lock>(sibling)}};
   });
   if (auto* error = std::get_if<QXError>(&prepared)) return std::move(*error);
-  const auto& [live, sibling] = std::get<Ready>(prepared);
+  const auto& [live, locks] = std::get<Locked>(prepared);
   // It may hold what an earlier attempt left.
-  if (::ftruncate(sibling->file().number, 0) != 0) return QXError::system(errno, "cannot empty the hidden sibling");
-  if (auto failure = write(sibling->file())) return failure;
+  if (::ftruncate(locks.sibling->file().number, 0) != 0) return QXError::system(errno, "cannot empty the hidden sibling");
+  if (auto failure = write(locks.sibling->file())) return failure;
 
-  const auto replaced = services_->ask<&QXSandboxRedemption::replaceItemWithToken>(linux_platform::kSandboxServiceName,
-                                                                                   {.until = after(options_.deadline), .held = sibling},
-                                                                                   Repeat::never, *live.itemToken, *live.siblingToken);
+  const auto replaced = services_->ask<&QXSandboxRedemption::replaceItemWithToken>(
+      linux_platform::kSandboxServiceName, {.until = after(options_.deadline), .held = std::make_shared<const Locks>(locks)}, Repeat::never,
+      *live.itemToken, *live.siblingToken);
   if (auto error = errorOf(replaced)) return error;
   if (auto error = finishedWriting(live.url)) {
     return makeConsumerError(ConsumerErrorCode::notTold, "The document is saved, but its provider could not be told.", error);

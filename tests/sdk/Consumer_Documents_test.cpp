@@ -122,7 +122,7 @@ TEST_F(ConsumerDocumentsTest, AFileThatSomebodyHoldsAllTheTimeIsTheDeadlinesErro
   put("item", "contents");
   failRedemptions(1'000'000, sandboxError(SandboxErrorCode::busy));
   startServices();
-  const auto redeemed = consumer().within(50ms).redeem(QXData::fromText("item"), Access::read);
+  const auto redeemed = consumer().within(1s).redeem(QXData::fromText("item"), Access::read);
   EXPECT_EQ(errorIn(redeemed), own(ConsumerErrorCode::deadlinePassed));
   ASSERT_TRUE(std::get<QXError>(redeemed).underlying);
   EXPECT_EQ(*std::get<QXError>(redeemed).underlying, sandboxError(SandboxErrorCode::busy));
@@ -262,21 +262,26 @@ TEST_F(ConsumerDocumentsTest, ProvidingTellsWhatThisProcessSeesAtThePath) {
 // Replacing.
 
 TEST_F(ConsumerDocumentsTest, ReplacingWritesTheEmptiedSiblingReplacesAndTells) {
+  put("item", "old");
   put("sibling", "left by an earlier attempt");
   startServices();
   EXPECT_EQ(consumer().replace(document(), writeNew), std::nullopt);
   EXPECT_EQ(contentsOf("sibling"), "new");
-  EXPECT_THAT(calls_.all(), ElementsAre("redeem sibling for writing", "redeem sibling for writing", "replace item by sibling",
-                                        "finished file:///storage/letter.txt"));
+  EXPECT_THAT(calls_.all(), ElementsAre("redeem item for reading", "redeem item for reading", "redeem sibling for writing",
+                                        "redeem sibling for writing", "replace item by sibling", "finished file:///storage/letter.txt"));
+  EXPECT_FALSE(isLocked("item"));
   EXPECT_FALSE(isLocked("sibling"));
 }
 
 TEST_F(ConsumerDocumentsTest, GivingUpReplacesNothingAndTellsNobody) {
+  put("item", "old");
   put("sibling", "");
   startServices();
   const QXError givenUp = QXError::make("Test", 1, "given up");
   EXPECT_EQ(consumer().replace(document(), [&givenUp](const QXDescriptor&) -> Failure { return givenUp; }), givenUp);
-  EXPECT_THAT(calls_.all(), ElementsAre("redeem sibling for writing", "redeem sibling for writing"));
+  EXPECT_THAT(calls_.all(), ElementsAre("redeem item for reading", "redeem item for reading", "redeem sibling for writing",
+                                        "redeem sibling for writing"));
+  EXPECT_FALSE(isLocked("item"));
   EXPECT_FALSE(isLocked("sibling"));
 }
 
@@ -288,11 +293,15 @@ TEST_F(ConsumerDocumentsTest, ASiblingThatCannotBeOpenedIsNotWritten) {
     return std::nullopt;
   };
   EXPECT_EQ(consumer().replace(document(), write), sandboxError(SandboxErrorCode::gone));
+  EXPECT_EQ(count("redeem item for reading"), 1U) << "there is no item";
+  put("item", "");
+  EXPECT_EQ(consumer().replace(document(), write), sandboxError(SandboxErrorCode::gone));
+  EXPECT_EQ(count("redeem sibling for writing"), 1U) << "there is no sibling";
   EXPECT_FALSE(isWritten);
-  EXPECT_EQ(calls_.all().size(), 1U);
 }
 
 TEST_F(ConsumerDocumentsTest, ASiblingThatCannotBeEmptiedIsNotWritten) {
+  put("item", "old");
   put("sibling", "old");
   script_.redeem = [this](const std::string& token) {
     return linux_platform::toValue(UniqueDescriptor(::open(path(token).c_str(), O_RDONLY | O_CLOEXEC)));
@@ -307,6 +316,7 @@ TEST_F(ConsumerDocumentsTest, ASiblingThatCannotBeEmptiedIsNotWritten) {
 }
 
 TEST_F(ConsumerDocumentsTest, AnItemThatCannotBeReplacedIsAnErrorAndNobodyIsTold) {
+  put("item", "old");
   put("sibling", "");
   script_.replaceError = sandboxError(SandboxErrorCode::gone);
   startServices();
@@ -316,6 +326,7 @@ TEST_F(ConsumerDocumentsTest, AnItemThatCannotBeReplacedIsAnErrorAndNobodyIsTold
 }
 
 TEST_F(ConsumerDocumentsTest, ADocumentWhoseProviderCannotBeToldIsSavedAllTheSame) {
+  put("item", "old");
   put("sibling", "");
   script_.finishedError = QXError::make(linux_platform::kQXFileCoordinationErrorDomain, 3, "no provider");
   startServices();
@@ -336,6 +347,7 @@ TEST_F(ConsumerDocumentsTest, ReplacingNeedsBothTokens) {
 }
 
 TEST_F(ConsumerDocumentsTest, ADocumentWithItsStringIsReplacedWithNewTokensWhenTheOldOnesAreWorthless) {
+  put("newer", "old");
   put("newer sibling", "");
   failRedemptions(1, sandboxError(SandboxErrorCode::badToken));
   startServices();
@@ -351,6 +363,7 @@ TEST_F(ConsumerDocumentsTest, ADocumentWithItsStringIsReplacedWithNewTokensWhenT
 }
 
 TEST_F(ConsumerDocumentsTest, TheLastStepIsNotRepeatedWhenTheDaemonEndsInIt) {
+  put("item", "old");
   put("sibling", "");
   script_.replacing = [this](const auto&) { sandbox_->endConnections(); };
   startServices();
@@ -360,90 +373,122 @@ TEST_F(ConsumerDocumentsTest, TheLastStepIsNotRepeatedWhenTheDaemonEndsInIt) {
 
 // Savers.
 
-TEST_F(ConsumerDocumentsTest, TheSiblingIsLockedWhileItIsWrittenAndReplaced) {
-  put("sibling", "");
+class SaversTest : public ConsumerDocumentsTest {
+ protected:
+  SaversTest() {
+    put("item", "old");
+    put("sibling", "of an earlier saver");
+  }
+  [[nodiscard]] UniqueDescriptor lock(const std::string& name) const {
+    UniqueDescriptor file(::open(path(name).c_str(), O_RDWR | O_CLOEXEC));
+    EXPECT_EQ(::flock(file.get(), LOCK_EX | LOCK_NB), 0);
+    return file;
+  }
+  // Before the token is redeemed for that many times.
+  void before(const std::string& token, int time, std::function<void()> act) {
+    script_.redeem = [token, time, act = std::move(act), redeem = script_.redeem](const std::string& given) mutable {
+      if (given == token && --time == 0) act();
+      return redeem(given);
+    };
+  }
+  [[nodiscard]] Failure saveWithin(std::chrono::milliseconds deadline) { return consumer().within(deadline).replace(document(), writeNew); }
+};
+
+TEST_F(SaversTest, ItemAndSiblingAreLockedWhileOneIsWrittenAndTheOtherReplaced) {
   script_.replacing = [this](const linux_platform::QXSandboxRedemption::ErrorReply& reply) {
+    EXPECT_TRUE(isLocked("item"));
     EXPECT_TRUE(isLocked("sibling"));
     reply(std::nullopt);
   };
   startServices();
   EXPECT_EQ(consumer().replace(document(),
                                [this](const QXDescriptor& file) {
+                                 EXPECT_TRUE(isLocked("item"));
                                  EXPECT_TRUE(isLocked("sibling"));
                                  return writeNew(file);
                                }),
             std::nullopt);
+  EXPECT_FALSE(isLocked("item"));
   EXPECT_FALSE(isLocked("sibling"));
 }
 
-TEST_F(ConsumerDocumentsTest, ASaverWaitsForTheOneBeforeIt) {
-  put("sibling", "of the other");
-  UniqueDescriptor other(::open(path("sibling").c_str(), O_RDWR | O_CLOEXEC));
-  ASSERT_EQ(::flock(other.get(), LOCK_EX), 0);
-  int tries = 0;
-  script_.redeem = [&, redeem = script_.redeem](const std::string& token) {
-    if (++tries == 3) other.reset();
-    if (tries <= 3) {
+TEST_F(SaversTest, ASaverWaitsForTheOneBeforeIt) {
+  for (const char* name : {"item", "sibling"}) {
+    put("sibling", "of the other");
+    UniqueDescriptor other = lock(name);
+    const auto redeem = script_.redeem;
+    before(name, 3, [&] {
       EXPECT_EQ(contentsOf("sibling"), "of the other");
-    }
-    return redeem(token);
-  };
-  startServices();
-  EXPECT_EQ(consumer().replace(document(), writeNew), std::nullopt);
-  EXPECT_EQ(contentsOf("sibling"), "new");
-  EXPECT_GE(tries, 4);
+      other.reset();
+    });
+    startServices();
+    EXPECT_EQ(saveWithin(kNever), std::nullopt);
+    EXPECT_EQ(contentsOf("sibling"), "new");
+    EXPECT_FALSE(other) << "it was not waited for";
+    consumer_.reset();
+    stopServices();
+    script_.redeem = redeem;
+  }
 }
 
-TEST_F(ConsumerDocumentsTest, ASaverWaitsNoLongerThanItsDeadline) {
-  put("sibling", "of the other");
-  const UniqueDescriptor other(::open(path("sibling").c_str(), O_RDWR | O_CLOEXEC));
-  ASSERT_EQ(::flock(other.get(), LOCK_EX), 0);
+TEST_F(SaversTest, ASaverWaitsNoLongerThanItsDeadline) {
   startServices();
-  EXPECT_EQ(errorIn(consumer().within(100ms).replace(document(), writeNew)), own(ConsumerErrorCode::deadlinePassed));
-  EXPECT_EQ(contentsOf("sibling"), "of the other");
+  for (const char* name : {"item", "sibling"}) {
+    const UniqueDescriptor other = lock(name);
+    EXPECT_EQ(errorIn(saveWithin(100ms)), own(ConsumerErrorCode::deadlinePassed));
+    EXPECT_EQ(contentsOf("sibling"), "of an earlier saver");
+  }
 }
 
-TEST_F(ConsumerDocumentsTest, TheTimeThatWritingTakesDoesNotCount) {
-  put("sibling", "");
+TEST_F(SaversTest, TheTimeThatWritingTakesDoesNotCount) {
+  static constexpr auto kDeadline = 2s;
   startServices();
-  EXPECT_EQ(consumer().within(200ms).replace(document(),
-                                             [](const QXDescriptor& file) {
-                                               const auto end = std::chrono::steady_clock::now() + 300ms;
-                                               while (std::chrono::steady_clock::now() < end) std::this_thread::yield();
-                                               return writeNew(file);
-                                             }),
+  EXPECT_EQ(consumer().within(kDeadline).replace(document(),
+                                                 [](const QXDescriptor& file) {
+                                                   const auto end = std::chrono::steady_clock::now() + kDeadline;
+                                                   while (std::chrono::steady_clock::now() < end) std::this_thread::yield();
+                                                   return writeNew(file);
+                                                 }),
             std::nullopt);
 }
 
-TEST_F(ConsumerDocumentsTest, ASiblingThatHasBecomeTheItemIsNotWritten) {
-  put("sibling", "the item by now");
-  put("next sibling", "");
-  int tries = 0;
-  script_.redeem = [&, redeem = script_.redeem](const std::string& token) {
-    // The saver before renames it between this saver's opening and locking.
-    if (++tries == 2) {
-      EXPECT_EQ(::rename(path("sibling").c_str(), path("item").c_str()), 0);
-      EXPECT_EQ(::rename(path("next sibling").c_str(), path("sibling").c_str()), 0);
-    }
-    return redeem(token);
-  };
+TEST_F(SaversTest, AnItemThatWasReplacedBeforeItWasLockedIsLockedAnew) {
+  UniqueDescriptor other;
+  // The saver before is at its end: the sibling is the item, which it still has locked.
+  before("item", 2, [&] {
+    EXPECT_EQ(::rename(path("sibling").c_str(), path("item").c_str()), 0);
+    put("sibling", "");
+    other = lock("item");
+  });
   startServices();
-  EXPECT_EQ(consumer().replace(document(), writeNew), std::nullopt);
-  EXPECT_EQ(contentsOf("item"), "the item by now");
+  EXPECT_EQ(errorIn(saveWithin(100ms)), own(ConsumerErrorCode::deadlinePassed)) << "the old item's lock is worth nothing";
+  EXPECT_EQ(count("redeem sibling for writing"), 0U);
+  other.reset();
+  EXPECT_EQ(saveWithin(kNever), std::nullopt);
+}
+
+TEST_F(SaversTest, ASiblingThatHasBecomeTheItemIsNotWritten) {
+  before("sibling", 2, [this] {
+    EXPECT_EQ(::rename(path("sibling").c_str(), path("item").c_str()), 0);
+    put("sibling", "");
+  });
+  startServices();
+  EXPECT_EQ(saveWithin(kNever), std::nullopt);
+  EXPECT_EQ(contentsOf("item"), "of an earlier saver");
   EXPECT_EQ(contentsOf("sibling"), "new");
 }
 
-TEST_F(ConsumerDocumentsTest, TheLockIsHeldUntilItIsKnownWhetherTheSiblingHasTakenTheItemsPlace) {
-  put("sibling", "");
+TEST_F(SaversTest, TheLocksAreHeldUntilItIsKnownWhetherTheSiblingHasTakenTheItemsPlace) {
   Mailbox<linux_platform::QXSandboxRedemption::ErrorReply> replaced;
   script_.replacing = [&replaced](linux_platform::QXSandboxRedemption::ErrorReply reply) { replaced.put(std::move(reply)); };
   startServices();
-  EXPECT_EQ(errorIn(consumer().within(500ms).replace(document(), writeNew)), own(ConsumerErrorCode::deadlinePassed));
-  EXPECT_TRUE(isLocked("sibling")) << "the daemon may rename it at any moment";
+  EXPECT_EQ(errorIn(saveWithin(2s)), own(ConsumerErrorCode::deadlinePassed));
+  EXPECT_TRUE(isLocked("item")) << "the daemon may rename at any moment";
+  EXPECT_TRUE(isLocked("sibling"));
   const auto late = replaced.take();
   ASSERT_TRUE(late);
   (*late)(std::nullopt);
-  eventually("the next saver may write", [this] { return !isLocked("sibling"); });
+  eventually("the next saver may write", [this] { return !isLocked("item") && !isLocked("sibling"); });
 }
 
 }  // namespace
