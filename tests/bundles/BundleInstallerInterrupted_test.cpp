@@ -143,5 +143,22 @@ TEST_F(BundleInstallerInterrupted, ARemovalLeavesTheBundleOrNone) {
       "new", "none", [this] { install("new"); }, [this] { (void)uninstallBundle("org.a", house_.paths, house_.propertyLists); });
 }
 
+TEST_F(BundleInstallerInterrupted, ARemovalOfSeveralCopiesNeverBringsAnotherToLight) {
+  const auto copy = [this](const std::string& text, const std::string& name) {
+    const std::string place = house_.paths.userBundles + "/" + name;
+    fs::create_directories(house_.paths.userBundles);
+    fs::copy(source(text), place, fs::copy_options::recursive);
+  };
+  expectOnly(
+      "new", "none",
+      [this, &copy] {
+        fs::remove_all(house_.paths.userBundles);
+        copy("old", "second");
+        copy("new", "first");
+        copy("old", "third");
+      },
+      [this] { (void)uninstallBundle("org.a", house_.paths, house_.propertyLists); });
+}
+
 }  // namespace
 }  // namespace docuvend::linux_platform

@@ -169,6 +169,29 @@ TEST_F(BundleInstallerTest, WhatIsNoBundleIsRefusedWithTheReason) {
   EXPECT_FALSE(fs::exists(house_.paths.userBundles)) << "refused before anything is made";
 }
 
+// Spoils a file as soon as a property list was read.
+class SpoilingPropertyLists : public LinuxPropertyLists {
+ public:
+  explicit SpoilingPropertyLists(std::string path) : path_(std::move(path)) {}
+
+  ReadResult read(std::istream& stream) override {
+    auto result = LinuxPropertyLists::read(stream);
+    BundleHouse::write(path_, "no list");
+    return result;
+  }
+
+ private:
+  const std::string path_;
+};
+
+TEST_F(BundleInstallerTest, WhatCountsIsTheCopyAndNotWhatTheSourceWas) {
+  SpoilingPropertyLists spoiling(source_ + "/Info.plist");
+  const auto result = installBundle(source_, house_.paths, spoiling);
+  ASSERT_TRUE(std::holds_alternative<QXError>(result));
+  EXPECT_THAT(std::get<QXError>(result).description(), HasSubstr("Info.plist is no property list"));
+  EXPECT_THAT(entries(), IsEmpty());
+}
+
 TEST_F(BundleInstallerTest, TheBundleMayBeNamedThroughALink) {
   fs::create_directory_symlink(source_, house_.root() + "/link");
   EXPECT_EQ(installed(house_.root() + "/link").outcome, Outcome::installed);
@@ -376,13 +399,17 @@ TEST_F(BundleInstallerTest, UninstallingABundleWithDirectoriesThatItsOwnerMayNot
 
 TEST_F(BundleInstallerTest, UninstallingFollowsNoLink) {
   installed(source_);
-  BundleHouse::write(house_.root() + "/outside/file", "x");
-  ::chmod((house_.root() + "/outside").c_str(), 0500);
-  fs::create_directory_symlink(house_.root() + "/outside", user("org.a") + "/link");
+  const std::string outside = house_.root() + "/outside";
+  BundleHouse::write(outside + "/sub/file", "x");
+  ::chmod((outside + "/sub").c_str(), 0500);
+  ::chmod(outside.c_str(), 0500);
+  fs::create_directory_symlink(outside, user("org.a") + "/link");
   EXPECT_EQ(uninstall("org.a"), std::nullopt);
-  EXPECT_EQ(contentsOf(house_.root() + "/outside/file"), "x");
-  EXPECT_EQ(fs::status(house_.root() + "/outside").permissions(), fs::perms::owner_read | fs::perms::owner_exec);
-  ::chmod((house_.root() + "/outside").c_str(), 0700);
+  EXPECT_EQ(contentsOf(outside + "/sub/file"), "x");
+  for (const std::string& directory : {outside, outside + "/sub"}) {
+    EXPECT_EQ(fs::status(directory).permissions(), fs::perms::owner_read | fs::perms::owner_exec) << directory;
+    ::chmod(directory.c_str(), 0700);
+  }
 }
 
 TEST_F(BundleInstallerTest, WhatIsNotInstalledIsNotFound) {
