@@ -6,7 +6,7 @@
 
 namespace docuvend::linux_platform {
 
-inline constexpr std::uint32_t kProtocolVersion = 1;
+inline constexpr std::uint32_t kProtocolVersion = 2;
 
 inline constexpr std::size_t kMaximumFrameBytes = std::size_t{1} << 20U;   // all that follows the length
 inline constexpr std::size_t kMaximumTextBytes = std::size_t{1} << 16U;    // one string, URL, dictionary key or error text
