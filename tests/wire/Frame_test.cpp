@@ -66,12 +66,12 @@ TEST(FrameTest, AByteTooManyIsRefused) {
 }
 
 TEST(FrameTest, OfAnotherVersionsHelloOnlyTheNumberIsRead) {
-  const std::vector<std::uint8_t> contents = {1, 0, 2, 0, 0, 0, 'w', 'h', 'a', 't', 255};
+  const std::vector<std::uint8_t> contents = {1, 0, kProtocolVersion + 1, 0, 0, 0, 'w', 'h', 'a', 't', 255};
   const auto decoded = decodeFrame(contents, {});
   ASSERT_TRUE(std::holds_alternative<Frame>(decoded));
   const auto* hello = std::get_if<Hello>(&std::get<Frame>(decoded));
   ASSERT_NE(hello, nullptr);
-  EXPECT_EQ(hello->version, 2U);
+  EXPECT_EQ(hello->version, kProtocolVersion + 1);
 }
 
 TEST(FrameTest, AFrameIsNotLongerThanTheLimit) {
