@@ -4,7 +4,7 @@
 #include "platform/linux/bundles/BundleInstaller.h"
 #include "platform/linux/files/LinuxPropertyLists.h"
 #include "tools/docuvendctl/CommandTable.h"
-#include "tools/docuvendctl/Connect.h"
+#include "tools/docuvendctl/ConnectionOptions.h"
 #include "tools/docuvendctl/GrantList.h"
 #include "tools/docuvendctl/Place.h"
 
@@ -53,7 +53,7 @@ Failure revokeAll(Administrator& administrator, const std::vector<Grant>& grants
 
 Result<Answer> uninstallAndRevoke(const Call& call, const Paths& paths) {
   const std::string& identifier = call.operands[0];
-  auto connected = connectAdministrator(call.deadline);
+  auto connected = Administrator::connect(administratorOptions(call.deadline));
   if (auto* error = std::get_if<QXError>(&connected)) return *error;
   auto& administrator = *std::get<std::unique_ptr<Administrator>>(connected);
   // Connecting succeeds also where nobody answers.
@@ -74,7 +74,7 @@ Result<Answer> uninstallAlone(const Call& call, const Paths& paths) {
   if (auto failure = linux_platform::uninstallBundle(identifier, paths, propertyLists)) return *failure;
   Record record{{{"bundle", QXValue(identifier)}}};
   Record::Value remaining = QXValue();
-  auto connected = connectAdministrator(call.deadline);
+  auto connected = Administrator::connect(administratorOptions(call.deadline));
   if (auto* administrator = std::get_if<std::unique_ptr<Administrator>>(&connected)) {
     auto grants = grantsNaming(**administrator, identifier);
     if (auto* listed = std::get_if<std::vector<Grant>>(&grants)) remaining = listOf(*listed);

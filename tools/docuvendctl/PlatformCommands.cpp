@@ -5,7 +5,7 @@
 
 #include "platform/linux/files/LinuxDeviceLock.h"
 #include "tools/docuvendctl/CommandTable.h"
-#include "tools/docuvendctl/Connect.h"
+#include "tools/docuvendctl/ConnectionOptions.h"
 #include "tools/docuvendctl/Operands.h"
 #include "tools/docuvendctl/Outcome.h"
 #include "tools/docuvendctl/Place.h"
@@ -69,7 +69,7 @@ Result<Answer> firstUnlock(const Call& call) {
   state.unlockedSinceBoot = true;
   if (auto failure = write(paths, state)) return *failure;
 
-  auto connected = connectAdministrator(call.deadline);
+  auto connected = Administrator::connect(administratorOptions(call.deadline));
   if (const auto* error = std::get_if<QXError>(&connected)) return done(isNotRunning(*error) ? std::nullopt : Failure(*error));
   return done(std::get<std::unique_ptr<Administrator>>(connected)->announceFirstUnlock());
 }

@@ -7,7 +7,7 @@
 
 #include "tools/docuvendctl/CommandLine.h"
 #include "tools/docuvendctl/CommandTable.h"
-#include "tools/docuvendctl/Connect.h"
+#include "tools/docuvendctl/ConnectionOptions.h"
 #include "tools/docuvendctl/Printer.h"
 #include "tools/docuvendctl/ProgressLine.h"
 #include "tools/docuvendctl/Terminal.h"
@@ -23,13 +23,13 @@ class Runner {
   Result<Answer> operator()(LocalCommand command) const { return command(line_.call); }
 
   Result<Answer> operator()(AdministratorCommand command) const {
-    auto connected = connectAdministrator(line_.call.deadline);
+    auto connected = Administrator::connect(administratorOptions(line_.call.deadline));
     if (auto* error = std::get_if<QXError>(&connected)) return *error;
     return command(*std::get<std::unique_ptr<Administrator>>(connected), line_.call);
   }
 
   Result<Answer> operator()(ConsumerCommand command) const {
-    auto connected = connectConsumer(line_.actAs, line_.call.deadline);
+    auto connected = Consumer::connect(consumerOptions(line_.actAs, line_.call.deadline));
     if (auto* error = std::get_if<QXError>(&connected)) return *error;
     return command(*std::get<std::unique_ptr<Consumer>>(connected), line_.call);
   }
