@@ -1,6 +1,8 @@
 // Which processes are ended because they give no sign of life, and which are not, over real ones.
 #include <gtest/gtest.h>
 
+#include <filesystem>
+#include <fstream>
 #include <future>
 #include <vector>
 
@@ -86,6 +88,26 @@ TEST_F(ExtensionLivenessTest, AProcessThatOnlyWorksOrNeverAnswersLivesOnAndAnswe
     ASSERT_TRUE(answer);
     EXPECT_FALSE(answer->error) << answer->error->description();
   }
+}
+
+TEST_F(ExtensionLivenessTest, ARequestIsReasonEnoughToAskAlsoBeforeItsFirstMessage) {
+  const std::string container = real.home() + "/containers/com.orvane.bad";
+  std::filesystem::create_directories(container);
+  std::ofstream(container + "/suspend") << "at once";
+  const auto begun = begin(*set[0]);
+  ASSERT_TRUE(begun && begun->request);
+  EXPECT_TRUE(real.awaitLog("[NOTICE] The process of com.orvane.bad did not answer a ping in time."));
+}
+
+TEST_F(ExtensionLivenessTest, AProcessThatLingersIsAskedAgainWhenARequestJoinsIt) {
+  ASSERT_EQ(Conversation(set[0]).identifier("suspended"), "soon");
+  // While it lingers nothing is expected of it, and by the end of the other it has long been left alone.
+  expectNotAnswering(Conversation(set[1]).start("suspend"));
+  const auto joined = begin(*set[0]);
+  ASSERT_TRUE(joined && joined->request);
+  real.release("com.orvane.bad");
+  EXPECT_TRUE(real.awaitLog("[NOTICE] The process of com.orvane.bad did not answer a ping in time."));
+  EXPECT_EQ(set[0]->extensionContextForRequest(*joined->request), nullptr);
 }
 
 TEST(ExtensionsOfOneHost, OneThatHangsDelaysNoRequestOfAnother) {

@@ -3,6 +3,7 @@
 //   identifierForItem   process      which process this is: a text that differs for each
 //                       descriptors  the numbers of the descriptors that were open at its start
 //                       hang         never answers
+//                       suspended    answers, and stops the process as a whole when the file "release" lies in its container
 //                       say-TEXT     writes TEXT to both outputs, a line each
 //                       anything     refused
 //   startProviding      crash        abort()
@@ -12,6 +13,7 @@
 //                       suspend      stops the process as a whole
 //                       spin         keeps the thread busy that reads the connection
 //                       anything     succeeds
+//   at the start        stops the process as a whole if the file "suspend" lies in its container
 //   performInitialSetup as the file "setup" in its container says: "hang" never answers, a number fails that often
 //   itemURL             the URL of a file of that name in its container
 #include <fcntl.h>
@@ -19,7 +21,6 @@
 #include <sys/random.h>
 #include <unistd.h>
 
-#include <algorithm>
 #include <chrono>
 #include <cstdio>
 #include <cstdlib>
@@ -27,7 +28,6 @@
 #include <fstream>
 #include <string>
 #include <thread>
-#include <vector>
 
 #include "sdk/Provider.h"
 
@@ -54,16 +54,25 @@ std::string randomText() {
   for (;;) pause();
 }
 
-// The library makes the thread that reads before all others.
+void waitForRelease() {
+  while (access("release", F_OK) != 0) std::this_thread::sleep_for(std::chrono::milliseconds(1));
+}
+
+void suspendWhenReleased() {
+  waitForRelease();
+  raise(SIGSTOP);
+}
+
+// Keeps every thread busy but this one and the main one, which only waits: the one that reads is among them.
 void spinReader() {
-  std::vector<pid_t> threads;
-  for (const auto& entry : std::filesystem::directory_iterator("/proc/self/task")) threads.push_back(std::stoi(entry.path().filename()));
-  std::sort(threads.begin(), threads.end());
   signal(SIGUSR1, [](int) {
     for (volatile bool isOn = true; isOn;) {
     }
   });
-  if (tgkill(getpid(), threads.at(1), SIGUSR1) != 0) std::abort();
+  for (const auto& entry : std::filesystem::directory_iterator("/proc/self/task")) {
+    const pid_t thread = std::stoi(entry.path().filename());
+    if (thread != getpid() && thread != gettid() && tgkill(getpid(), thread, SIGUSR1) != 0) std::abort();
+  }
 }
 
 class TestProvider : public Provider {
@@ -86,7 +95,7 @@ class TestProvider : public Provider {
     if (what == "stay") std::atexit([] { waitForever(); });
     if (what == "suspend") raise(SIGSTOP);
     if (what == "spin") spinReader();
-    while (what == "wait" && access("release", F_OK) != 0) std::this_thread::sleep_for(std::chrono::milliseconds(1));
+    if (what == "wait") waitForRelease();
     return std::nullopt;
   }
 
@@ -98,6 +107,10 @@ class TestProvider : public Provider {
     if (what == "process") return ItemID{process_};
     if (what == "descriptors") return ItemID{descriptors_};
     if (what == "hang") waitForever();
+    if (what == "suspended") {
+      std::thread(suspendWhenReleased).detach();
+      return ItemID{"soon"};
+    }
     if (what.starts_with("say-")) {
       std::fprintf(stderr, "%s\n", what.c_str() + 4);
       std::printf("%s\n", what.c_str() + 4);
@@ -125,6 +138,7 @@ class TestProvider : public Provider {
 }  // namespace docuvend
 
 int main() {
+  if (access("suspend", F_OK) == 0) raise(SIGSTOP);
   docuvend::TestProvider provider;
   return docuvend::runProvider(provider);
 }
