@@ -195,7 +195,8 @@ std::optional<QXError> CellarIndex::Session::save() const {
   Replacement replacement(directory_ + kTemporaryName);
   const std::string text = indexText(items_);
   if (!replacement.file() || !writeAll(replacement.file(), text.data(), text.size())) return systemError("cannot write the index");
-  return replacement.commit(directory_ + kIndexName, Replacement::Over::anything);
+  if (auto error = replacement.sync()) return error;
+  return replacement.commit(directory_ + kIndexName);
 }
 
 }  // namespace docuvend::cellar

@@ -124,6 +124,7 @@ Provider::Failure CellarProvider::startProviding(const QXURL& url) {
   if (auto error = fetch(before.cloud.name, replacement.file(), version)) return error;
   // The document's own time, which has passed: whoever writes the file, however soon, gives it another.
   if (!setModified(replacement.file(), version.modified)) return systemError("cannot date " + before.local.name);
+  if (auto error = replacement.sync()) return error;
 
   auto index = openIndex();
   const auto found = find(index, ItemID{before.identifier});
@@ -131,7 +132,12 @@ Provider::Failure CellarProvider::startProviding(const QXURL& url) {
   Item& item = *std::get<Item*>(found);
   // Written meanwhile: what is here now is the document.
   if (item.isChangedHere()) return std::nullopt;
-  if (auto error = replacement.commit(localPath(item.local.name), Replacement::Over::anything)) return error;
+  const std::string path = localPath(item.local.name);
+  if (auto error = replacement.commitOver(path, item.local.present)) {
+    const auto now = fingerprintAt(path);
+    const bool isWrittenMeanwhile = error->code == EAGAIN && now && !now->isPlaceholder();
+    return isWrittenMeanwhile ? std::nullopt : error;
+  }
   const auto fingerprint = fingerprintOf(replacement.file());
   if (!fingerprint) return systemError("cannot examine " + item.local.name);
   item.local.fingerprint = *fingerprint;
@@ -154,6 +160,7 @@ Provider::Failure CellarProvider::itemChanged(const QXURL& url) {
   if (!replacement.file()) return systemError("cannot make a file in the cloud for " + before.local.name);
   Fingerprint version;
   if (auto error = copyForCloud(before.local.name, replacement.file(), version)) return error;
+  if (auto error = replacement.sync()) return error;
 
   auto index = openIndex();
   const auto found = find(index, ItemID{before.identifier});
@@ -163,7 +170,7 @@ Provider::Failure CellarProvider::itemChanged(const QXURL& url) {
     const bool isTaken = isNameTaken(index.items(), &Item::cloud, item.local.name);
     item.cloud.name = isTaken ? item.local.name + " " + item.identifier : item.local.name;
   }
-  if (auto error = replacement.commit(cloudPath(item.cloud.name), Replacement::Over::anything)) return error;
+  if (auto error = replacement.commit(cloudPath(item.cloud.name))) return error;
   const auto cloudFingerprint = fingerprintOf(replacement.file());
   if (!cloudFingerprint) return systemError("cannot examine " + item.cloud.name);
   // If it was written again meanwhile it differs from this version, and the next change will send it.
@@ -274,10 +281,9 @@ Provider::Result<Item*> CellarProvider::find(CellarIndex::Session& index, const 
 Provider::Failure CellarProvider::makePlaceholder(Item& item) const {
   Replacement placeholder(temporaryIn(storage_, item));
   if (auto error = placeholder.becomePlaceholder(item.cloud.present->size, item.cloud.present->modified)) return error;
-  const auto over = item.local.present ? Replacement::Over::anything : Replacement::Over::nothing;
-  if (auto error = placeholder.commit(localPath(item.local.name), over)) {
-    // Another document has the name now.
-    if (error->code == EEXIST) return std::nullopt;
+  if (auto error = placeholder.commitOver(localPath(item.local.name), item.local.present)) {
+    // Somebody has saved meanwhile, or another document has the name now.
+    if (error->code == EAGAIN) return std::nullopt;
     return error;
   }
   return notePlaceholder(item, placeholder);

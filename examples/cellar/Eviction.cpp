@@ -15,11 +15,17 @@ Eviction::Eviction(std::string path) : path_(std::move(path)), file_(openForRead
   }
 }
 
-std::optional<QXError> Eviction::commit(const Replacement& placeholder) const {
-  if (auto error = placeholder.exchange(path_)) return error;
+std::optional<QXError> Eviction::commit(Replacement& placeholder) const {
+  const auto leased = fingerprintOf(file_);
+  if (!leased) return systemError("cannot examine " + path_);
+  if (auto error = placeholder.exchange(path_, *leased)) return error;
   // Looked at only now: from here on the file's name leads to the placeholder, so nobody else can come to want the file.
-  if (fcntl(file_.get(), F_GETLEASE) == F_WRLCK) return std::nullopt;
-  if (auto error = placeholder.exchange(path_)) return error;
+  if (fcntl(file_.get(), F_GETLEASE) == F_WRLCK) {
+    // While the lease still holds off who found the file before the exchange: they get a file that says that it has no name.
+    placeholder.removeReplaced();
+    return std::nullopt;
+  }
+  if (auto error = placeholder.putBack(path_)) return error;
   return QXError::system(EAGAIN, "somebody opens " + path_);
 }
 

@@ -1,3 +1,7 @@
+// A look at a name and a rename over it are two steps, and whoever saves between them would lose what was saved. So names are exchanged,
+// and only then the file that came out is looked at: it has a name that nobody else uses, so it stays what it is. If it is not the one that
+// was meant, the names are exchanged back, which is again two steps: what comes out must be the file that was put there. If it is not,
+// somebody has saved meanwhile, and the newer file goes back to the place in the same way.
 #include "examples/cellar/Files.h"
 
 #include <dirent.h>
@@ -35,6 +39,24 @@ std::optional<Fingerprint> examine(int directory, const char* name, int flags) {
   return Fingerprint{{status.stx_ino, nanoseconds(status.stx_btime)}, status.stx_size, nanoseconds(status.stx_mtime)};
 }
 
+std::optional<FileKey> keyIn(const std::optional<Fingerprint>& fingerprint) {
+  return fingerprint ? std::optional(fingerprint->key) : std::nullopt;
+}
+
+bool exchangeNames(const std::string& a, const std::string& b) {
+  return renameat2(AT_FDCWD, a.c_str(), AT_FDCWD, b.c_str(), RENAME_EXCHANGE) == 0;
+}
+
+std::optional<QXError> syncDirectoryOf(const std::string& path) {
+  const UniqueDescriptor directory(open(path.substr(0, path.rfind('/')).c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC));
+  if (!directory || fsync(directory.get()) != 0) return systemError("cannot write the directory of " + path);
+  return std::nullopt;
+}
+
+QXError cannotPut(const std::string& path) { return systemError("cannot put a file at " + path); }
+
+QXError isAnother(const std::string& path) { return QXError::system(EAGAIN, "another file lies at " + path); }
+
 }  // namespace
 
 QXError systemError(const std::string& what) { return QXError::system(errno, what); }
@@ -56,6 +78,8 @@ std::vector<Entry> listFiles(const std::string& directory) {
 }
 
 std::optional<Fingerprint> fingerprintOf(const UniqueDescriptor& file) { return examine(file.get(), "", AT_EMPTY_PATH); }
+
+std::optional<Fingerprint> fingerprintAt(const std::string& path) { return examine(AT_FDCWD, path.c_str(), 0); }
 
 bool Fingerprint::isPlaceholder() const { return fractionOf(modified) == kPlaceholderFraction; }
 
@@ -88,28 +112,64 @@ Replacement::~Replacement() {
 
 std::optional<QXError> Replacement::becomePlaceholder(std::uint64_t size, std::int64_t modified) {
   const bool isMade = file_ && ftruncate(file_.get(), static_cast<off_t>(size)) == 0 &&
-                      setModified(file_, modified - fractionOf(modified) + kPlaceholderFraction) && fsync(file_.get()) == 0;
+                      setModified(file_, modified - fractionOf(modified) + kPlaceholderFraction);
   if (!isMade) return systemError("cannot make a placeholder");
+  if (auto error = sync()) return error;
   // A file system that keeps whole seconds would make every placeholder a document of zeros.
   const auto made = fingerprintOf(file_);
   if (!made || !made->isPlaceholder()) return QXError::system(ENOTSUP, "the file system does not keep a placeholder's time");
   return std::nullopt;
 }
 
-std::optional<QXError> Replacement::exchange(const std::string& path) const {
-  if (renameat2(AT_FDCWD, temporary_.c_str(), AT_FDCWD, path.c_str(), RENAME_EXCHANGE) == 0) return std::nullopt;
-  return systemError("cannot put a file at " + path);
-}
-
-std::optional<QXError> Replacement::commit(const std::string& path, Over over) {
-  if (fsync(file_.get()) != 0) return systemError("cannot write " + path);
-  const bool isInPlace = over == Over::anything ? rename(temporary_.c_str(), path.c_str()) == 0 : renameOverNothing(temporary_, path);
-  if (!isInPlace) return systemError("cannot put a file at " + path);
-  temporary_.clear();
-  const UniqueDescriptor directory(open(path.substr(0, path.rfind('/')).c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC));
-  if (!directory || fsync(directory.get()) != 0) return systemError("cannot write the directory of " + path);
+std::optional<QXError> Replacement::sync() const {
+  if (fsync(file_.get()) != 0) return systemError("cannot write " + temporary_);
   return std::nullopt;
 }
+
+std::optional<QXError> Replacement::commit(const std::string& path) {
+  if (rename(temporary_.c_str(), path.c_str()) != 0) return cannotPut(path);
+  temporary_.clear();
+  return syncDirectoryOf(path);
+}
+
+std::optional<QXError> Replacement::commitOver(const std::string& path, const std::optional<Fingerprint>& expected) {
+  if (expected) {
+    if (auto error = exchange(path, *expected)) return error;
+    removeReplaced();
+  } else {
+    if (!renameOverNothing(temporary_, path)) return errno == EEXIST ? isAnother(path) : cannotPut(path);
+    temporary_.clear();
+  }
+  return syncDirectoryOf(path);
+}
+
+std::optional<QXError> Replacement::exchange(const std::string& path, const Fingerprint& expected) {
+  if (!exchangeNames(temporary_, path)) return errno == ENOENT ? isAnother(path) : cannotPut(path);
+  if (fingerprintAt(temporary_) == expected) return std::nullopt;
+  if (auto error = putBack(path)) return error;
+  return isAnother(path);
+}
+
+std::optional<QXError> Replacement::putBack(const std::string& path) {
+  auto inPlace = keyIn(fingerprintOf(file_));
+  auto held = keyIn(fingerprintAt(temporary_));
+  for (;;) {
+    if (exchangeNames(temporary_, path)) {
+      const auto out = keyIn(fingerprintAt(temporary_));
+      if (out == inPlace) return std::nullopt;
+      inPlace = std::exchange(held, out);
+      continue;
+    }
+    // Somebody has renamed or removed what was put in the place.
+    const bool isBack = errno == ENOENT && renameOverNothing(temporary_, path);
+    if (!isBack && errno == EEXIST) continue;
+    auto error = isBack ? std::nullopt : std::optional(cannotPut(path));
+    temporary_.clear();  // on an error too: what lies there may be somebody's only copy
+    return error;
+  }
+}
+
+void Replacement::removeReplaced() { unlink(std::exchange(temporary_, {}).c_str()); }
 
 bool renameOverNothing(const std::string& from, const std::string& to) {
   return renameat2(AT_FDCWD, from.c_str(), AT_FDCWD, to.c_str(), RENAME_NOREPLACE) == 0;

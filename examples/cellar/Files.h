@@ -46,6 +46,8 @@ struct Entry {
 [[nodiscard]] std::vector<Entry> listFiles(const std::string& directory);
 // None when it is no regular file.
 [[nodiscard]] std::optional<Fingerprint> fingerprintOf(const UniqueDescriptor& file);
+// The same of what lies there, without opening it.
+[[nodiscard]] std::optional<Fingerprint> fingerprintAt(const std::string& path);
 // Gives the file a time of its last change.
 [[nodiscard]] bool setModified(const UniqueDescriptor& file, std::int64_t modified);
 // Returns when whatever is written from now on has another time than the file has now. Two changes within one tick of the kernel's clock
@@ -54,11 +56,9 @@ void awaitLaterTime(const Fingerprint& file);
 // Makes the directory if it is missing (mode 700).
 [[nodiscard]] std::optional<QXError> ensureDirectory(const std::string& path);
 
-// A file that is being written to take a place in its directory: nobody sees it before `commit`, and without `commit` it is removed.
+// A file that is being written to take a place in its directory: nobody sees it before it is there, and otherwise it is removed.
 class Replacement {
  public:
-  enum class Over { anything, nothing };
-
   explicit Replacement(std::string temporary);
   ~Replacement();
   Replacement(const Replacement&) = delete;
@@ -68,11 +68,23 @@ class Replacement {
   [[nodiscard]] const UniqueDescriptor& file() const { return file_; }
   // Makes it a placeholder of that size, for contents of that time, and puts it on disk.
   [[nodiscard]] std::optional<QXError> becomePlaceholder(std::uint64_t size, std::int64_t modified);
-  // Puts the file on disk, then in its place, which lies in the same directory. None: done. Over nothing, a place that is taken is EEXIST.
-  [[nodiscard]] std::optional<QXError> commit(const std::string& path, Over over);
-  // Has the file and the one at its place change names, and changes them back when called again: what is not in its place at the end is
-  // removed. Nothing is put on disk.
-  [[nodiscard]] std::optional<QXError> exchange(const std::string& path) const;
+  // Puts it on disk under its temporary name.
+  [[nodiscard]] std::optional<QXError> sync() const;
+
+  // Puts the file, which is on disk, in its place, which lies in the same directory, whatever is there.
+  [[nodiscard]] std::optional<QXError> commit(const std::string& path);
+  // The same in the place of that file only, if it has not changed; of none: if nothing is there. EAGAIN: something else is there, which
+  // stays.
+  [[nodiscard]] std::optional<QXError> commitOver(const std::string& path, const std::optional<Fingerprint>& expected);
+
+  // Has the file and that one change names, if the latter has not changed. EAGAIN: something else is there, which stays. Nothing is put on
+  // disk.
+  [[nodiscard]] std::optional<QXError> exchange(const std::string& path, const Fingerprint& expected);
+  // After `exchange`, has the two change names back; but what somebody else has put in the place since stays there. Then, or after an
+  // error, this can take no place any more.
+  [[nodiscard]] std::optional<QXError> putBack(const std::string& path);
+  // After `exchange`, removes the other file now.
+  void removeReplaced();
 
  private:
   std::string temporary_;

@@ -1,4 +1,5 @@
 // Contents are given up when nobody needs them, and only then; and a placeholder is one whatever was ended in the middle.
+#include "tests/cellar/BeforeExchange.h"
 #include "tests/cellar/CellarHouse.h"
 
 namespace docuvend::cellar {
@@ -59,6 +60,17 @@ TEST_F(CellarStoppingTest, WhatIsNotSavedIsSaidToBeSoAlsoWhileSomebodyHasItOpen)
   write(local("a.txt"), "mine!");
   const std::ifstream reader(local("a.txt"));
   EXPECT_TRUE(isKind(provider->stopProviding(url("a.txt")), CellarErrorCode::notSaved));
+}
+
+TEST_F(CellarStoppingTest, StoppingDoesNotTakeWhatIsSavedInTheMiddle) {
+  write(cloud + "/a.txt", "hello");
+  setUp();
+  start("a.txt");
+  const BeforeExchange middle({[this] { save("a.txt", "mine!"); }});
+  EXPECT_TRUE(isKind(provider->stopProviding(url("a.txt")), CellarErrorCode::inUse));
+  EXPECT_EQ(read(local("a.txt")), "mine!");
+  change("a.txt");
+  EXPECT_EQ(read(cloud + "/a.txt"), "mine!");
 }
 
 TEST_F(CellarStoppingTest, StoppingWhereThereAreNoContentsIsDoneAtOnce) {

@@ -1,5 +1,6 @@
 #include "examples/cellar/CellarProvider.h"
 
+#include "tests/cellar/BeforeExchange.h"
 #include "tests/cellar/CellarHouse.h"
 
 namespace docuvend::cellar {
@@ -100,6 +101,42 @@ TEST_F(CellarProviderTest, WhatIsWrittenHereIsNotOverwritten) {
   EXPECT_EQ(read(local("a.txt")), "mine!");
   setUp();
   EXPECT_EQ(read(local("a.txt")), "mine!");
+}
+
+TEST_F(CellarProviderTest, WhatIsSavedWhileTheContentsArriveIsNotOverwritten) {
+  write(cloud + "/a.txt", "hello");
+  setUp();
+  const BeforeExchange middle({[this] { save("a.txt", "mine!"); }});
+  start("a.txt");
+  EXPECT_EQ(middle.count(), 2U);
+  EXPECT_EQ(read(local("a.txt")), "mine!");
+  EXPECT_EQ(names(storage), std::vector<std::string>{"a.txt"});
+  change("a.txt");
+  EXPECT_EQ(read(cloud + "/a.txt"), "mine!");
+}
+
+TEST_F(CellarProviderTest, StartingFailsWhenTheItemGoesElsewhereMeanwhile) {
+  write(cloud + "/a.txt", "hello");
+  setUp();
+  {
+    const BeforeExchange middle({[this] { fs::rename(local("a.txt"), local("b.txt")); }});
+    EXPECT_TRUE(provider->startProviding(url("a.txt")));
+  }
+  EXPECT_EQ(names(storage), std::vector<std::string>{"b.txt"});
+  start("b.txt");
+  EXPECT_EQ(read(local("b.txt")), "hello");
+}
+
+TEST_F(CellarProviderTest, WhatIsSavedWhileAPlaceholderIsMadeIsNotOverwritten) {
+  write(cloud + "/a.txt", "hello");
+  setUp();
+  write(cloud + "/a.txt", "hello again");
+  const BeforeExchange middle({[this] { save("a.txt", "mine!"); }});
+  setUp();
+  EXPECT_EQ(middle.count(), 2U);
+  EXPECT_EQ(read(local("a.txt")), "mine!");
+  change("a.txt");
+  EXPECT_EQ(read(cloud + "/a.txt"), "mine!");
 }
 
 TEST_F(CellarProviderTest, WhatIsWrittenHereIsProvidedEvenIfItIsGoneInTheCloud) {

@@ -145,6 +145,30 @@ TEST_F(EvictionTest, WhoOpensItInTheMiddleWaitsAndReadsTheContents) {
   expectNothingTaken();
 }
 
+TEST_F(EvictionTest, WhatSomebodySavesOverItInTheMiddleStays) {
+  const Eviction eviction(path);
+  ASSERT_FALSE(eviction.error()) << eviction.error()->description();
+  std::ofstream(root + "/.saved") << "saved";
+  fs::rename(root + "/.saved", path);
+  const auto refused = eviction.commit(*placeholder);
+  ASSERT_TRUE(refused);
+  EXPECT_EQ(refused->code, EAGAIN);
+  placeholder.reset();
+  EXPECT_EQ(read(path), "saved");
+}
+
+TEST_F(EvictionTest, WhoFoundItBeforeAndOpensItAfterwardsSeesThatItHasNoNameAnyMore) {
+  const UniqueDescriptor found(open(path.c_str(), O_PATH | O_CLOEXEC));
+  const Eviction eviction(path);
+  ASSERT_FALSE(eviction.error()) << eviction.error()->description();
+  EXPECT_FALSE(eviction.commit(*placeholder));
+  // The lease still holds: nobody can have opened the file yet.
+  EXPECT_EQ(fcntl(eviction.file().get(), F_GETLEASE), F_WRLCK);
+  struct stat status {};
+  ASSERT_EQ(fstat(found.get(), &status), 0);
+  EXPECT_EQ(status.st_nlink, 0U);
+}
+
 TEST_F(EvictionTest, WhoOpensItAfterwardsFindsThePlaceholder) {
   const Eviction eviction(path);
   EXPECT_FALSE(eviction.commit(*placeholder));
