@@ -53,8 +53,8 @@ int hoardDescriptors() {
     while (true) {
       writer.add(std::get<EncodedFrame>(encodeFrame(ReplyFrame{1, values})));
       const auto progress = writer.write(ends[0]);
-      if (progress == FrameWriter::Progress::broken) return count;  // too many are on their way
-      if (progress == FrameWriter::Progress::blocked) break;        // this socket is full
+      if (progress == FrameWriter::Progress::blocked) break;         // this socket is full
+      if (progress != FrameWriter::Progress::drained) return count;  // too many are on their way
       count += static_cast<int>(kMaximumDescriptors);
     }
   }
