@@ -81,7 +81,7 @@ void floodWithFrames(int socket) {
       ::poll(&ready, 1, -1);
       progress = writer.write(socket);
     }
-    if (progress == FrameWriter::Progress::broken) return;
+    if (progress != FrameWriter::Progress::drained) return;
   }
 }
 
