@@ -350,6 +350,15 @@ TEST_F(Commands, GrantsOfAnUninstalledBundleAreRemovedOnRequest) {
   EXPECT_THAT(house_.accessControl(), ::testing::Not(HasSubstr(kPicker)));
 }
 
+TEST_F(Commands, GrantsOfABundleThatIsGoneAlreadyAreRemovedOnRequest) {
+  const std::string item = itemOf(house_.granted(letter_, kStranger));
+  EXPECT_EQ(house_.ctl({"uninstall", kStranger}).status, kDone);
+  expectPrinted(house_.ctl({"uninstall", "--remove-grants", kStranger}),
+                "bundle\t" + kStranger + "\nremovedGrants\t" + kCellar + "\t" + item + "\t" + kStranger + "\n");
+  EXPECT_EQ(house_.ctl({"grants"}).output, "");
+  EXPECT_EQ(house_.ctl({"uninstall", "--remove-grants", kStranger}).status, kNotFound) << "nothing is left of it";
+}
+
 TEST_F(Commands, WithoutADaemonABundleIsUninstalledAndItsGrantsAreUnknown) {
   (void)house_.granted(letter_, kStranger);
   house_.killDaemon();

@@ -1,6 +1,7 @@
 #include <memory>
 
 #include "common/DVErrorCodes.h"
+#include "platform/linux/bundles/BundleErrors.h"
 #include "platform/linux/bundles/BundleInstaller.h"
 #include "platform/linux/files/LinuxPropertyLists.h"
 #include "tools/docuvendctl/CommandTable.h"
@@ -51,6 +52,11 @@ Failure revokeAll(Administrator& administrator, const std::vector<Grant>& grants
   return std::nullopt;
 }
 
+bool isNotInstalled(const QXError& error) {
+  return error.domain == linux_platform::kBundleErrorDomain &&
+         error.code == static_cast<std::int64_t>(linux_platform::BundleErrorCode::notFound);
+}
+
 Result<Answer> uninstallAndRevoke(const Call& call, const Paths& paths) {
   const std::string& identifier = call.operands[0];
   auto connected = Administrator::connect(administratorOptions(call.deadline));
@@ -60,7 +66,10 @@ Result<Answer> uninstallAndRevoke(const Call& call, const Paths& paths) {
   auto before = grantsNaming(administrator, identifier);
   if (auto* error = std::get_if<QXError>(&before)) return *error;
   LinuxPropertyLists propertyLists;
-  if (auto failure = linux_platform::uninstallBundle(identifier, paths, propertyLists)) return *failure;
+  if (auto failure = linux_platform::uninstallBundle(identifier, paths, propertyLists)) {
+    // The bundle may have gone some time ago, and its grants be what is left of it.
+    if (!isNotInstalled(*failure) || std::get<std::vector<Grant>>(before).empty()) return *failure;
+  }
   // Again, now that nobody of that name can be given anything more on its own behalf.
   auto grants = grantsNaming(administrator, identifier);
   if (auto* error = std::get_if<QXError>(&grants)) return *error;
@@ -104,7 +113,7 @@ CommandGroup bundleCommands() {
                install},
               {"uninstall",
                "BUNDLE",
-               {{"--remove-grants", "", "take back all grants that name BUNDLE; needs the running daemon"}},
+               {{"--remove-grants", "", "take back all grants that name BUNDLE, also when it is gone already; needs the running daemon"}},
                "remove an installed bundle of this user",
                "Its containers stay. So do grants that name it, and a later bundle of that name inherits them, unless they are removed.\n"
                "Prints: bundle, and remainingGrants or removedGrants, a list: provider, item, consumer. Which grants remain is unknown\n"

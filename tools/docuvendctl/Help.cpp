@@ -77,6 +77,7 @@ std::string overview(const CommandTable& table) {
   }
   Entries options = entriesOf(commonOptions());
   options.emplace_back("--help", "explain a command, or all");
+  options.emplace_back("--version", "print this program's version");
   text.append("\nOptions\n").append(entriesText(options, width));
   return text.append(kOutput).append(kStatuses);
 }
