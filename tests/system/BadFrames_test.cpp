@@ -140,7 +140,8 @@ TEST_F(BadFrames, AFrameThatBreaksOffIsMalformed) {
 TEST_F(BadFrames, AnotherVersionOfTheProtocolIsTold) {
   const RawPeer peer = connect();
   ASSERT_TRUE(peer.write(Frame(Hello{kProtocolVersion + 1, std::nullopt})));
-  expectDropped(peer, QXRpcErrorCode::unsupportedVersion, "version 2 of the protocol is not supported");
+  expectDropped(peer, QXRpcErrorCode::unsupportedVersion,
+                "version " + std::to_string(kProtocolVersion + 1) + " of the protocol is not supported");
 }
 
 TEST_F(BadFrames, AnUnknownOperationIsAnErrorAndTheConnectionGoesOn) {

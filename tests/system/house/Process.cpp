@@ -13,6 +13,7 @@
 #include <cerrno>
 #include <fstream>
 #include <iterator>
+#include <sstream>
 #include <stdexcept>
 
 #include "tests/wire/Waiting.h"
@@ -99,8 +100,10 @@ const Ending& Process::wait() {
 }
 
 std::string contentsOf(const std::string& path) {
-  std::ifstream file(path, std::ios::binary);
-  return {std::istreambuf_iterator<char>(file), {}};
+  const std::ifstream file(path, std::ios::binary);
+  std::ostringstream contents;
+  contents << file.rdbuf();  // a process's files cannot be read any more when it ends in the middle: then there are none
+  return std::move(contents).str();
 }
 
 }  // namespace docuvend::tests
