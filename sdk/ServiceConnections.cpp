@@ -8,8 +8,7 @@
 //                           ends of a request must not be ended by it for ever.
 //   the service refused     it says why, and would say it again
 //   no answer in time       the request stays in the connection's books until its answer comes, which may be never: a connection with many
-//   of
-//                           those is left behind, and closes when its last running call is done
+//                           of those is left behind, and closes when its last running call is done
 
 #include "sdk/ServiceConnections.h"
 
