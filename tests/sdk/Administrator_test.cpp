@@ -73,7 +73,7 @@ class AdministratorTest : public LibraryTest {
  protected:
   ~AdministratorTest() override {
     administrator_.reset();
-    service_.reset();
+    stop(service_);
   }
   void startService() {
     service_ = std::make_unique<ScriptedService<DVAdministration>>(root_ + "/docuvend/" + kDVAdministrationServiceName, administration_);

@@ -57,6 +57,31 @@ class Calls {
   std::function<void()> event_;
 };
 
+// What an operation does with its reply instead of giving it. May be set while the services run.
+template <class Reply>
+class Instead {
+ public:
+  void operator=(std::function<void(Reply)> act) {
+    const std::lock_guard lock(mutex_);
+    act_ = std::move(act);
+  }
+  // False: nothing is set, and the reply is still to be given.
+  [[nodiscard]] bool takes(Reply& reply) const {
+    std::function<void(Reply)> act;
+    {
+      const std::lock_guard lock(mutex_);
+      act = act_;
+    }
+    if (!act) return false;
+    act(std::move(reply));
+    return true;
+  }
+
+ private:
+  mutable std::mutex mutex_;
+  std::function<void(Reply)> act_;
+};
+
 // What the services answer. Set before the first question.
 struct Script {
   std::optional<QXError> error;
@@ -71,11 +96,11 @@ struct Script {
   // What a token is redeemed for.
   std::function<std::variant<QXDescriptor, QXError>(const std::string& token)> redeem;
   // These take a reply instead of giving it.
-  std::function<void(DVDaemon::Done)> waking;
-  std::function<void(DVDaemon::ErrorReply)> starting;
-  std::function<void(DVDaemon::ErrorReply)> stopping;
-  std::function<void(linux_platform::QXSandboxRedemption::FileReply)> redeeming;
-  std::function<void(linux_platform::QXSandboxRedemption::ErrorReply)> replacing;
+  Instead<DVDaemon::Done> waking;
+  Instead<DVDaemon::ErrorReply> starting;
+  Instead<DVDaemon::ErrorReply> stopping;
+  Instead<linux_platform::QXSandboxRedemption::FileReply> redeeming;
+  Instead<linux_platform::QXSandboxRedemption::ErrorReply> replacing;
 };
 
 class ScriptedDaemon : public DVDaemon {
@@ -84,7 +109,7 @@ class ScriptedDaemon : public DVDaemon {
 
   void wakeUpCompletion(Done completion) override {
     calls_.add("wake");
-    if (script_.waking) return script_.waking(std::move(completion));
+    if (script_.waking.takes(completion)) return;
     completion();
   }
   void extendSandboxForFileURL(std::optional<QXURL>, std::optional<ProviderID> fromProviderID, std::optional<ConsumerID> toConsumerID,
@@ -96,7 +121,7 @@ class ScriptedDaemon : public DVDaemon {
   void startProvidingItemAtURL(std::optional<QXURL> url, std::optional<ProviderID> fromProviderID, std::optional<ConsumerID> forConsumerID,
                                ErrorReply completionHandler) override {
     calls_.add("start " + url->absoluteString() + " " + fromProviderID->value + " " + forConsumerID->value);
-    if (script_.starting) return script_.starting(std::move(completionHandler));
+    if (script_.starting.takes(completionHandler)) return;
     completionHandler(script_.error);
   }
   void providePlaceholderForItemAtURL(std::optional<QXURL> url, std::optional<ProviderID> fromProviderID,
@@ -107,7 +132,7 @@ class ScriptedDaemon : public DVDaemon {
   void stopProvidingItemAtURL(std::optional<QXURL> url, std::optional<ProviderID> fromProviderID, std::optional<ConsumerID> forConsumerID,
                               ErrorReply completionHandler) override {
     calls_.add("stop " + url->absoluteString() + " " + fromProviderID->value + " " + forConsumerID->value);
-    if (script_.stopping) return script_.stopping(std::move(completionHandler));
+    if (script_.stopping.takes(completionHandler)) return;
     completionHandler(script_.error);
   }
   void extendBookmarkForFileURL(std::optional<QXURL> url, std::optional<ConsumerID> toConsumerID, StringReply completionHandler) override {
@@ -142,7 +167,7 @@ class ScriptedSandbox : public linux_platform::QXSandboxRedemption {
 
   void redeemToken(std::optional<QXData> token, std::optional<bool> forWriting, FileReply completionHandler) override {
     calls_.add("redeem " + token->text() + (*forWriting ? " for writing" : " for reading"));
-    if (script_.redeeming) return script_.redeeming(std::move(completionHandler));
+    if (script_.redeeming.takes(completionHandler)) return;
     if (!script_.redeem) return completionHandler({}, {});
     auto redeemed = script_.redeem(token->text());
     if (auto* error = std::get_if<QXError>(&redeemed)) return completionHandler(*error, {});
@@ -151,7 +176,7 @@ class ScriptedSandbox : public linux_platform::QXSandboxRedemption {
   void replaceItemWithToken(std::optional<QXData> itemToken, std::optional<QXData> bySiblingWithToken,
                             ErrorReply completionHandler) override {
     calls_.add("replace " + itemToken->text() + " by " + bySiblingWithToken->text());
-    if (script_.replacing) return script_.replacing(std::move(completionHandler));
+    if (script_.replacing.takes(completionHandler)) return;
     completionHandler(script_.replaceError);
   }
 
@@ -221,9 +246,9 @@ class ConsumerTest : public LibraryTest {
   }
   // As when the daemon is killed.
   void stopServices() {
-    daemon_.reset();
-    sandbox_.reset();
-    coordination_.reset();
+    stop(daemon_);
+    stop(sandbox_);
+    stop(coordination_);
   }
   // The services must be running.
   Consumer& consumer(Consumer::Options options = {}) {

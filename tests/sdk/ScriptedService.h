@@ -35,8 +35,12 @@ class ScriptedService {
       return EPOLLIN;
     });
   }
-  // As when a daemon is killed: every connection ends.
-  ~ScriptedService() {
+  ~ScriptedService() { stop(); }
+  ScriptedService(const ScriptedService&) = delete;
+  ScriptedService& operator=(const ScriptedService&) = delete;
+
+  // As when a daemon is killed: every connection ends. No operation runs any more when this returns.
+  void stop() {
     registration_.reset();
     {
       const std::lock_guard lock(mutex_);
@@ -44,9 +48,6 @@ class ScriptedService {
     }
     reactor_.reset();
   }
-  ScriptedService(const ScriptedService&) = delete;
-  ScriptedService& operator=(const ScriptedService&) = delete;
-
   // Ends the connections that there are; may be called by an operation.
   void endConnections() {
     std::vector<std::shared_ptr<linux_platform::Endpoint>> ended;
@@ -95,5 +96,12 @@ class ScriptedService {
   std::unique_ptr<linux_platform::Reactor> reactor_ = std::make_unique<linux_platform::Reactor>(1);
   std::shared_ptr<linux_platform::Reactor::Registration> registration_;
 };
+
+// The pointer is taken away when no operation can read it any more.
+template <class Protocol>
+void stop(std::unique_ptr<ScriptedService<Protocol>>& service) {
+  if (service) service->stop();
+  service.reset();
+}
 
 }  // namespace docuvend::tests

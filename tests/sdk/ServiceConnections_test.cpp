@@ -86,6 +86,7 @@ TEST_F(ServiceConnectionsTest, TheDeadlinesOfTheOptionsHoldForAnswersAndForMater
   (*reply)(std::nullopt);
   EXPECT_EQ(answer.get(), std::nullopt);
   EXPECT_EQ(errorIn(daemon.within(1ms).startProviding(*script_.url, kProvider, kConsumer)), own(ConsumerErrorCode::deadlinePassed));
+  stopServices();
 }
 
 TEST_F(ServiceConnectionsTest, ADeadlineLongerThanTheClockReachesIsNoPastOne) {
@@ -111,10 +112,11 @@ TEST_F(ServiceConnectionsTest, TenThousandCallsWithoutAnswersLeaveNothingBehind)
     }
     // What closed connections held goes on the library's own thread.
     eventually("only the last calls are waited for", [&token] { return token.use_count() <= static_cast<long>(kFewAtATime) + 1; });
-    script_.waking = {};
+    script_.waking = nullptr;
     EXPECT_EQ(errorIn(services.ask<&DVDaemon::wakeUpCompletion>(kDVServiceName, {after(kNever)}, Repeat::harmless)), std::nullopt);
   }
   eventually("all descriptors are closed", [descriptors] { return openDescriptors() <= descriptors; });
+  stopServices();
 }
 
 TEST_F(ServiceConnectionsTest, CallsThatRunOverAConnectionGoOnWhenItIsLeftBehind) {
@@ -127,7 +129,7 @@ TEST_F(ServiceConnectionsTest, CallsThatRunOverAConnectionGoOnWhenItIsLeftBehind
   ASSERT_TRUE(reply);
   script_.waking = [](const DVDaemon::Done&) {};
   for (int i = 0; i < 2000; ++i) ASSERT_EQ(errorIn(daemon.within(0ms).wakeUp()), own(ConsumerErrorCode::deadlinePassed));
-  script_.waking = {};
+  script_.waking = nullptr;
   ASSERT_EQ(daemon.wakeUp(), std::nullopt);
   ASSERT_GT(daemon_->declared().size(), 1U);
   (*reply)(std::nullopt);

@@ -240,26 +240,28 @@ TEST_F(OverScriptedServices, ACommandOfTheAdministrationEndsAtTheCallersTimeoutT
 
 TEST_F(OverScriptedServices, ABundleStaysWhenItsGrantsCannotBeHad) {
   installBundle("org.b");
-  startAdministration();
   tests::Mailbox<DVAdministration::GrantsReply> listing;
   administrator_->listing = [&listing](DVAdministration::GrantsReply reply) { listing.put(std::move(reply)); };
+  startAdministration();
   EXPECT_EQ(tests::Process(command({"--timeout", "1", "uninstall", "--remove-grants", "org.b"})).wait().status, 8);
   EXPECT_TRUE(std::filesystem::exists(bundleDirectory("org.b"))) << "the list could not be had, so nothing is removed";
+  stop(administration_);
 }
 
 TEST_F(OverScriptedServices, AGrantThatIsGoneMeanwhileIsRemovedEnough) {
   installBundle("org.b");
-  startAdministration();
   administrator_->revokeErrors.emplace("\u6f22\u5b57", DVNotFoundError(ProviderID{"org.p"}));
+  startAdministration();
   EXPECT_EQ(tests::Process(command({"uninstall", "--remove-grants", "org.b"})).wait().status, 0);
+  stop(administration_);
   EXPECT_THAT(administrator_->revoked, ElementsAre("\u6f22\u5b57", "a\u202eb\tc"));
   EXPECT_FALSE(std::filesystem::exists(bundleDirectory("org.b")));
 }
 
 TEST_F(OverScriptedServices, AGrantThatCannotBeRemovedIsAnError) {
   installBundle("org.b");
-  startAdministration();
   administrator_->revokeErrors.emplace("\u6f22\u5b57", QXError::system(EIO, "the list could not be written"));
+  startAdministration();
   const Ending ending = tests::Process(command({"uninstall", "--remove-grants", "org.b"})).wait();
   EXPECT_EQ(ending.status, 9);
   EXPECT_THAT(ending.errors, HasSubstr("the list could not be written"));
