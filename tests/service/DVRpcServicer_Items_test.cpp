@@ -175,7 +175,7 @@ TEST_P(DVRpcServicerItemsTest, AURLAndAProviderOfNobodyAreNotFound) {
 }
 
 TEST_P(DVRpcServicerItemsTest, AnEarlyFailureWithoutAReplyHandlerIsLoggedAndHarmless) {
-  (servicer_.get()->*operation_.ask)(std::nullopt, kCellar, kEditor, /*reply=*/{});
+  askFor(/*url=*/std::nullopt, kCellar, kEditor, /*reply=*/{});
   EXPECT_EQ(platform_.log.texts(QXLogType::fault).size(), 1U);
   platform_.queues.runAll();
 }

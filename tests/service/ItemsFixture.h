@@ -112,13 +112,12 @@ class ItemsFixture : public ServicerFixture {
     return "URL " + url.absoluteString() + " from provider ID " + provider.value + " to consumer ID " + kEditor.value;
   }
 
-  const ItemOperation& operation_;
-
- private:
   void askFor(std::optional<QXURL> url, std::optional<ProviderID> provider, std::optional<ConsumerID> consumer,
               DVDaemon::ErrorReply reply) {
     (servicer_.get()->*operation_.ask)(std::move(url), std::move(provider), std::move(consumer), std::move(reply));
   }
+
+  const ItemOperation& operation_;
 };
 
 // Over the rows that a suite is instantiated with.
