@@ -26,7 +26,6 @@ namespace {
 namespace fs = std::filesystem;
 using linux_platform::UniqueDescriptor;
 
-constexpr std::chrono::milliseconds kBetweenLooks{2};
 constexpr int kStatusOfSignal = 128;
 
 std::string program(const std::string& name) { return std::string(DOCUVEND_BIN) + "/" + name; }
