@@ -17,6 +17,7 @@
 #include <cstdlib>
 #include <thread>
 
+#include "platform/linux/wire/ConnectToSocket.h"
 #include "platform/linux/wire/Limits.h"
 #include "platform/rpc_errors.h"
 

@@ -17,6 +17,7 @@
 #include "platform/linux/rpc/BoundSocket.h"
 #include "platform/linux/rpc/ConnectionLimiter.h"
 #include "platform/linux/rpc/LinuxRpcConnection.h"
+#include "platform/linux/wire/ConnectToSocket.h"
 #include "platform/linux/wire/Limits.h"
 #include "platform/linux/wire/SocketAddress.h"
 #include "tests/rpc/RpcDrivers.h"

@@ -14,6 +14,7 @@
 #include "platform/fake/FakeLog.h"
 #include "platform/fake/FakeRpc.h"
 #include "platform/linux/rpc/LinuxRpcService.h"
+#include "platform/linux/wire/ConnectToSocket.h"
 #include "platform/linux/wire/Endpoint.h"
 #include "platform/rpc.h"
 #include "tests/rpc/TestPeerDirectory.h"

@@ -11,6 +11,7 @@
 #include <ostream>
 #include <vector>
 
+#include "platform/linux/wire/ConnectToSocket.h"
 #include "platform/linux/wire/Limits.h"
 #include "platform/linux/wire/SandboxProtocol.h"
 #include "platform/rpc_errors.h"

@@ -7,6 +7,7 @@
 #include <variant>
 #include <vector>
 
+#include "platform/linux/wire/ConnectToSocket.h"
 #include "platform/linux/wire/Endpoint.h"
 #include "platform/linux/wire/Reactor.h"
 #include "sdk/BlockingCall.h"

@@ -12,6 +12,7 @@
 #include <filesystem>
 #include <thread>
 
+#include "platform/linux/wire/ConnectToSocket.h"
 #include "platform/linux/wire/Limits.h"
 #include "tests/wire/RawPeer.h"
 #include "tests/wire/Waiting.h"

@@ -70,9 +70,4 @@ class Endpoint : public std::enable_shared_from_this<Endpoint> {
   const std::shared_ptr<State> state_;
 };
 
-// Connects to a named service's socket. Waits while the service has more clients waiting than it can queue; with EAGAIN no longer than
-// that.
-[[nodiscard]] std::variant<UniqueDescriptor, QXError> connectToSocket(const std::string& path,
-                                                                      std::optional<std::chrono::milliseconds> patience = std::nullopt);
-
 }  // namespace docuvend::linux_platform

@@ -2,6 +2,7 @@
 
 #include <stdexcept>
 
+#include "platform/linux/wire/ConnectToSocket.h"
 #include "platform/linux/wire/Limits.h"
 
 namespace docuvend::tests {

@@ -1,4 +1,5 @@
 #include "tests/system/house/DaemonHouse.h"
+#include "platform/linux/wire/ConnectToSocket.h"
 
 #include <fcntl.h>
 #include <signal.h>
