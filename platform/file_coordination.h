@@ -1,10 +1,12 @@
 // The file-coordination service and what it asks of a provider.
 #pragma once
 
+#include <functional>
 #include <memory>
 #include <optional>
 #include <string>
 
+#include "platform/QXError.h"
 #include "platform/QXURL.h"
 #include "platform/queue.h"
 
@@ -29,6 +31,13 @@ class QXDocuvend {
   // Under which identity the service knows this object.
   [[nodiscard]] virtual std::optional<std::string> _fileReactorID() const = 0;
 
+  // Somebody is about to read a file in the directory: its contents are brought into it. The completion, which may be empty, runs on any
+  // thread, also inside the call, with the reason why the file cannot be read, if there is one; it may run a second time.
+  using ProvideCompletion = std::function<void(std::optional<QXError> error)>;
+  virtual void _provideItemAtURL(const QXURL& url, const std::optional<QXCoordinationID>& toReaderWithID,
+                                 ProvideCompletion completionHandler) = 0;
+  // The same for nobody in particular. Deprecated: a service that can say who reads calls the other one.
+  virtual void _provideItemAtURL(const QXURL& url, ProvideCompletion completionHandler) = 0;
   // A writer has finished with a file in the directory.
   virtual void _writerWithID(const QXCoordinationID& writer, const QXURL& didFinishWritingForURL) = 0;
 };

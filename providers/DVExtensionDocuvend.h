@@ -123,12 +123,17 @@ class DVExtensionDocuvend final : public QXDocuvend, public std::enable_shared_f
   void itemIDForURL(const QXURL& url, ItemIDCompletion completionHandler);
   void URLForItemID(const ItemID& itemID, URLCompletion completionHandler);
 
-  // --- Changes
+  // --- What file coordination asks
 
-  // Tells the extension; nobody hears of a failure but the log.
-  void itemChangedAtURL(const QXURL& url);
+  // The item must have an identifier; then the extension starts providing it. The reader is printed, and asked nothing: whoever may
+  // coordinate a read may have the item.
+  void _provideItemAtURL(const QXURL& url, const std::optional<QXCoordinationID>& toReaderWithID,
+                         ProvideCompletion completionHandler) override;
+  void _provideItemAtURL(const QXURL& url, ProvideCompletion completionHandler) override;
   // Tells the provider that owns the URL now, which need not be this one.
   void _writerWithID(const QXCoordinationID& writer, const QXURL& didFinishWritingForURL) override;
+  // Tells the extension; nobody hears of a failure but the log.
+  void itemChangedAtURL(const QXURL& url);
 
  private:
   explicit DVExtensionDocuvend(std::shared_ptr<QXExtension> extension);
@@ -140,6 +145,8 @@ class DVExtensionDocuvend final : public QXDocuvend, public std::enable_shared_f
   void initialSetupAnswered(std::int32_t retryCount, std::optional<QXError> error, const FinishHandler& finish, ErrorCompletion completion);
   void operationQueueRegister(const ErrorCompletion& completion);
 
+  void readableItemIDAnswered(const QXURL& url, const std::optional<std::string>& reader, std::optional<QXError> error,
+                              ProvideCompletion completionHandler);
   void changeRequestAnswered(const QXURL& url, const std::optional<QXError>& error, const std::optional<VendorProxy>& proxy,
                              const FinishHandler& finish);
   void changeAnswered(const QXURL& url, const std::optional<QXError>& error, const FinishHandler& finish);

@@ -1,9 +1,39 @@
 #include <utility>
 
 #include "common/DVLog.h"
+#include "platform/QXPlatform.h"
 #include "providers/DVExtensionDocuvend.h"
 
 namespace docuvend {
+
+void DVExtensionDocuvend::_provideItemAtURL(const QXURL& url, ProvideCompletion completionHandler) {
+  dvLog("[ERROR] Calling deprecated method: %@", "_provideItemAtURL:completionHandler:");
+  _provideItemAtURL(url, /*toReaderWithID=*/std::nullopt, std::move(completionHandler));
+}
+
+// That the extension knows the item is all that the identifier is asked for.
+void DVExtensionDocuvend::_provideItemAtURL(const QXURL& url, const std::optional<QXCoordinationID>& toReaderWithID,
+                                            ProvideCompletion completionHandler) {
+  const std::optional<std::string> reader = toReaderWithID ? std::optional(toReaderWithID->value) : std::nullopt;
+  dvLog("[INFO] QXFileCoordinator requested us to provide item at URL %@ for consumer %@", url, reader);
+  itemIDForURL(url, [strongSelf = shared_from_this(), url, reader, completionHandler = std::move(completionHandler)](
+                        std::optional<QXError> error, const std::optional<ItemID>& /*itemID*/) {
+    strongSelf->readableItemIDAnswered(url, reader, std::move(error), completionHandler);
+  });
+}
+
+void DVExtensionDocuvend::readableItemIDAnswered(const QXURL& url, const std::optional<std::string>& reader, std::optional<QXError> error,
+                                                 ProvideCompletion completionHandler) {
+  if (error) {
+    dvLog("[ERROR] Could not provide item at URL %@ from extension %@ to reader %@. Error: %@", url, identifier(), reader, error);
+    if (completionHandler) completionHandler(std::move(error));
+    return;
+  }
+  QXPlatform::current().queues.globalQueue().async(
+      [strongSelf = shared_from_this(), url, completionHandler = std::move(completionHandler)] {
+        strongSelf->startProvidingItemAtURL(url, completionHandler);
+      });
+}
 
 void DVExtensionDocuvend::_writerWithID(const QXCoordinationID& writer, const QXURL& didFinishWritingForURL) {
   const QXURL& url = didFinishWritingForURL;

@@ -21,6 +21,9 @@ class RecordingProvider final : public QXDocuvend {
   std::optional<QXURL> _providedItemsURL() const override { return directory_; }
   std::shared_ptr<QXOperationQueue> _providedItemsOperationQueue() const override { return queue_; }
   std::optional<std::string> _fileReactorID() const override { return std::nullopt; }
+  void _provideItemAtURL(const QXURL& /*url*/, const std::optional<QXCoordinationID>& /*toReaderWithID*/,
+                         ProvideCompletion /*completionHandler*/) override {}
+  void _provideItemAtURL(const QXURL& /*url*/, ProvideCompletion /*completionHandler*/) override {}
   void _writerWithID(const QXCoordinationID& writer, const QXURL& didFinishWritingForURL) override {
     told.emplace_back(writer.value, didFinishWritingForURL);
     if (onTold) onTold();
