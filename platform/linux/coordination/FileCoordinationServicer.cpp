@@ -1,15 +1,9 @@
 #include "platform/linux/coordination/FileCoordinationServicer.h"
 
-#include <string>
+#include "platform/linux/coordination/CoordinationErrors.h"
 
 namespace docuvend::linux_platform {
 namespace {
-
-QXError coordinationError(FileCoordinationErrorCode code, std::string description, std::optional<QXURL> url) {
-  QXError error = QXError::make(kQXFileCoordinationErrorDomain, static_cast<std::int64_t>(code), std::move(description));
-  error.url = std::move(url);
-  return error;
-}
 
 void answer(const FileCoordinationServicer::ErrorReply& completionHandler, std::optional<QXError> error) {
   if (completionHandler) completionHandler(std::move(error));
@@ -19,19 +13,19 @@ void answer(const FileCoordinationServicer::ErrorReply& completionHandler, std::
 
 void FileCoordinationServicer::writerDidFinishWritingForURL(std::optional<QXURL> url, ErrorReply completionHandler) {
   if (!url) {
-    answer(completionHandler, coordinationError(FileCoordinationErrorCode::missingURL, "the URL is missing", /*url=*/{}));
+    answer(completionHandler, makeCoordinationError(FileCoordinationErrorCode::missingURL, "the URL is missing", /*url=*/{}));
     return;
   }
   const auto connection = connection_.lock();
   const QXAuditToken caller = connection ? connection->auditToken() : QXAuditToken{};
   // First of all: whoever may not write the file learns nothing about it.
   if (sandbox_.checkWithoutReport(caller, kQXSandboxFileWriteData, url->fileSystemPath()) != 0) {
-    answer(completionHandler, coordinationError(FileCoordinationErrorCode::notPermitted, "the caller may not write the file", url));
+    answer(completionHandler, makeCoordinationError(FileCoordinationErrorCode::notPermitted, "the caller may not write the file", url));
     return;
   }
   const auto provider = coordinator_.providerOf(*url);
   if (!provider) {
-    answer(completionHandler, coordinationError(FileCoordinationErrorCode::noProvider, "the file belongs to no provider", url));
+    answer(completionHandler, makeCoordinationError(FileCoordinationErrorCode::noProvider, "the file belongs to no provider", url));
     return;
   }
   const int process = connection ? connection->processIdentifier() : 0;

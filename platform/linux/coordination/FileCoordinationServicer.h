@@ -17,6 +17,13 @@ class FileCoordinationServicer final : public QXFileCoordination {
   FileCoordinationServicer(LinuxFileCoordinator& coordinator, QXSandbox& sandbox, std::weak_ptr<QXRpcConnection> connection)
       : coordinator_(coordinator), sandbox_(sandbox), connection_(std::move(connection)) {}
 
+  void coordinateReadingItemAtURL(std::optional<QXURL>, std::optional<QXData>, std::optional<QXUUID>, std::optional<std::int64_t>,
+                                  ErrorReply) override {}
+  void coordinateWritingItemAtURL(std::optional<QXURL>, std::optional<QXData>, std::optional<QXUUID>, std::optional<std::int64_t>,
+                                  ErrorReply) override {}
+  void endAccess(std::optional<QXUUID>, ErrorReply) override {}
+  void progressOfAccess(std::optional<QXUUID>, ProgressReply) override {}
+  void holdersOfItemAtURL(std::optional<QXURL>, std::optional<QXData>, HoldersReply) override {}
   void writerDidFinishWritingForURL(std::optional<QXURL> url, ErrorReply completionHandler) override;
 
  private:
