@@ -10,6 +10,7 @@
 
 namespace docuvend {
 
+inline constexpr std::string_view kQXSandboxFileReadData = "file-read-data";
 inline constexpr std::string_view kQXSandboxFileWriteData = "file-write-data";
 
 class QXSandbox {

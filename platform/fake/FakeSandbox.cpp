@@ -66,7 +66,7 @@ std::optional<QXError> FakeSandbox::invalidateReadWriteExtensions(const std::opt
 int FakeSandbox::checkWithoutReport(const QXAuditToken& token, std::string_view operation, const std::string& path) {
   const std::lock_guard lock(mutex_);
   checks_.push_back({token, std::string(operation), path});
-  if (token == QXAuditToken{} || operation != kQXSandboxFileWriteData) return kRefused;
+  if (token == QXAuditToken{} || (operation != kQXSandboxFileReadData && operation != kQXSandboxFileWriteData)) return kRefused;
   const auto found = answers_.find(path);
   return found == answers_.end() ? answer_ : found->second;
 }

@@ -1,8 +1,8 @@
 // The sandbox in memory.
 //
 // Differs from the real one: a token is "token:" and the path, whatever lies at the path; the answer to a check is what the test has
-// set, except that the zero token and any operation but writing are refused as the platform refuses them. Taking tokens back is recorded
-// and changes nothing: nobody redeems them here. May be used from any thread.
+// set, whatever the operation, except that the zero token and any operation but reading and writing are refused as the platform refuses
+// them. Taking tokens back is recorded and changes nothing: nobody redeems them here. May be used from any thread.
 #pragma once
 
 #include <functional>

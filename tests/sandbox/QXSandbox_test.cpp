@@ -77,10 +77,11 @@ TEST(FakeSandbox, RemembersWhatWasTakenBackAndAnswersAsItWasTold) {
   EXPECT_EQ(sandbox.invalidations(), (std::vector<std::optional<std::string>>{"/a", std::nullopt, "/b"}));
 }
 
-TYPED_TEST(QXSandboxTest, AllowsTheWriterToWriteAndNothingElse) {
+TYPED_TEST(QXSandboxTest, AllowsTheWriterToReadAndWriteAndNothingElse) {
   const QXAuditToken writer = this->writer();
   EXPECT_EQ(this->sandbox().checkWithoutReport(writer, kQXSandboxFileWriteData, this->document), 0);
-  EXPECT_NE(this->sandbox().checkWithoutReport(writer, "file-read-data", this->document), 0);
+  EXPECT_EQ(this->sandbox().checkWithoutReport(writer, kQXSandboxFileReadData, this->document), 0);
+  EXPECT_NE(this->sandbox().checkWithoutReport(writer, "file-read-metadata", this->document), 0);
   EXPECT_NE(this->sandbox().checkWithoutReport(writer, kQXSandboxFileWriteData, "/etc/passwd"), 0);
 }
 

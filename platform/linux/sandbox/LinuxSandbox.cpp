@@ -11,24 +11,24 @@ namespace {
 
 constexpr int kAllowed = 0;
 
-int codeFor(WriteVerdict verdict) {
+int codeFor(AccessVerdict verdict) {
   switch (verdict) {
-    case WriteVerdict::allowedByAccess:
-    case WriteVerdict::allowedByRedemption:
+    case AccessVerdict::allowedByAccess:
+    case AccessVerdict::allowedByRedemption:
       return kAllowed;
-    case WriteVerdict::nobody:
-    case WriteVerdict::outsideProfile:
+    case AccessVerdict::nobody:
+    case AccessVerdict::outsideProfile:
       return EPERM;
-    case WriteVerdict::unknownOperation:
+    case AccessVerdict::unknownOperation:
       return ENOSYS;
-    case WriteVerdict::peerGone:
+    case AccessVerdict::peerGone:
       return ESRCH;
-    case WriteVerdict::malformedPath:
+    case AccessVerdict::malformedPath:
       return EINVAL;
-    case WriteVerdict::notFound:
-    case WriteVerdict::anotherObject:
+    case AccessVerdict::notFound:
+    case AccessVerdict::anotherObject:
       return ENOENT;
-    case WriteVerdict::accessDenied:
+    case AccessVerdict::accessDenied:
       return EACCES;
   }
   return EPERM;
@@ -66,11 +66,17 @@ std::optional<QXError> LinuxSandbox::invalidateReadWriteExtensions(const std::op
 }
 
 int LinuxSandbox::checkWithoutReport(const QXAuditToken& token, std::string_view operation, const std::string& path) {
-  return codeFor(mayWrite(token, operation, path));
+  return codeFor(ask(token, operation, path));
 }
 
-WriteVerdict LinuxSandbox::mayWrite(const QXAuditToken& token, std::string_view operation, const std::string& path) const {
+AccessVerdict LinuxSandbox::ask(const QXAuditToken& token, std::string_view operation, const std::string& path) const {
   return query_.ask(token, operation, path);
+}
+
+bool LinuxSandbox::mayReach(const QXAuditToken& caller, std::string_view operation, const std::string& path,
+                            const std::optional<std::string>& token) const {
+  if (isAllowed(ask(caller, operation, path))) return true;
+  return token && somebody(caller) && redeemer_.isFor(*token, path);
 }
 
 std::shared_ptr<const PeerIdentity> LinuxSandbox::somebody(const QXAuditToken& caller) const {

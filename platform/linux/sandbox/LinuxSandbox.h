@@ -1,7 +1,7 @@
-// What confined processes may open, on Linux: tokens, their redemption, and the write query.
+// What confined processes may open, on Linux: tokens, their redemption, and what they may reach.
 //
 // Of a token that was issued nothing is remembered but the number that it may not be below, if some were taken back; what was redeemed for
-// writing is remembered for the write query, until the next time that tokens are taken back. May be used from any thread.
+// writing is remembered for the access query, until the next time that tokens are taken back. May be used from any thread.
 #pragma once
 
 #include <memory>
@@ -11,11 +11,11 @@
 #include <variant>
 
 #include "platform/linux/base/Paths.h"
+#include "platform/linux/sandbox/AccessQuery.h"
 #include "platform/linux/sandbox/GroupContainers.h"
 #include "platform/linux/sandbox/RedemptionLedger.h"
 #include "platform/linux/sandbox/TokenRedeemer.h"
 #include "platform/linux/sandbox/TokenSession.h"
-#include "platform/linux/sandbox/WriteQuery.h"
 #include "platform/sandbox.h"
 
 namespace docuvend::linux_platform {
@@ -32,7 +32,12 @@ class LinuxSandbox final : public QXSandbox {
   int checkWithoutReport(const QXAuditToken& token, std::string_view operation, const std::string& path) override;
 
   // The same, with the reason.
-  [[nodiscard]] WriteVerdict mayWrite(const QXAuditToken& token, std::string_view operation, const std::string& path) const;
+  [[nodiscard]] AccessVerdict ask(const QXAuditToken& token, std::string_view operation, const std::string& path) const;
+
+  // Whether the process may perform the operation on the path by itself, or brings a token that is good now for exactly this file. Like a
+  // redemption, that takes one of this user's processes; nothing is remembered of it.
+  [[nodiscard]] bool mayReach(const QXAuditToken& caller, std::string_view operation, const std::string& path,
+                              const std::optional<std::string>& token) const;
 
   // For the process that the audit token identifies, which must be one of this user's: confined or not, what it brings is what counts.
   [[nodiscard]] std::variant<UniqueDescriptor, QXError> redeem(const QXAuditToken& caller, std::string_view token, TokenUse use);
@@ -46,7 +51,7 @@ class LinuxSandbox final : public QXSandbox {
   GroupContainers containers_;
   RedemptionLedger ledger_;
   const TokenRedeemer redeemer_;
-  const WriteQuery query_;
+  const AccessQuery query_;
 };
 
 }  // namespace docuvend::linux_platform

@@ -153,6 +153,16 @@ std::variant<RedeemedFile, QXError> TokenRedeemer::redeem(std::string_view token
   return sandboxErrorFor(PathRefusal::unsteady);
 }
 
+bool TokenRedeemer::isFor(std::string_view token, const std::string& path) const {
+  const auto use = session_.beginUse();
+  const auto named = placed(token);
+  const auto* item = std::get_if<PlacedItem>(&named);
+  if (item == nullptr) return false;
+  const auto meant = containers_.place(path);
+  const auto* file = std::get_if<PlacedItem>(&meant);
+  return file != nullptr && file->path == item->path;
+}
+
 std::variant<ReplacedItem, QXError> TokenRedeemer::replaceItem(std::string_view itemToken, std::string_view siblingToken) const {
   auto itemPlace = placed(itemToken);
   if (auto* error = std::get_if<QXError>(&itemPlace)) return std::move(*error);

@@ -32,6 +32,9 @@ class TokenRedeemer {
 
   [[nodiscard]] std::variant<RedeemedFile, QXError> redeem(std::string_view token, TokenUse tokenUse) const;
 
+  // Whether the token is good now and names the file at that path, however the path is spelled. The file need not be there.
+  [[nodiscard]] bool isFor(std::string_view token, const std::string& path) const;
+
   // The item's new file has the permission bits of the old one.
   [[nodiscard]] std::variant<ReplacedItem, QXError> replaceItem(std::string_view itemToken, std::string_view siblingToken) const;
 
