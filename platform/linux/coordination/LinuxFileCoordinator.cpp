@@ -2,9 +2,21 @@
 
 #include <algorithm>
 #include <string>
+#include <utility>
 #include <variant>
 
 namespace docuvend::linux_platform {
+namespace {
+
+void onItsQueue(const QXDocuvend& provider, QXTask task) {
+  if (const auto queue = provider._providedItemsOperationQueue()) {
+    queue->addOperation(std::move(task));
+  } else {
+    task();
+  }
+}
+
+}  // namespace
 
 void LinuxFileCoordinator::_addDocuvend(std::shared_ptr<QXDocuvend> provider) {
   if (!provider) return;
@@ -36,29 +48,37 @@ std::vector<std::shared_ptr<QXDocuvend>> LinuxFileCoordinator::providers() const
   return list;
 }
 
-std::shared_ptr<QXDocuvend> LinuxFileCoordinator::providerOf(const QXURL& file) const {
+std::shared_ptr<QXDocuvend> LinuxFileCoordinator::providerOf(const QXURL& file, DirectoryItself itself) const {
   for (const auto& provider : providers()) {
     const auto directory = provider->_providedItemsURL();
     if (!directory) continue;
     const auto answer = fileSystem_.relationship(*directory, file);
     const auto* relationship = std::get_if<QXRelationship>(&answer);
-    if (relationship != nullptr && *relationship != QXRelationship::other) return provider;
+    if (relationship == nullptr || *relationship == QXRelationship::other) continue;
+    if (*relationship == QXRelationship::contains || itself == DirectoryItself::counts) return provider;
   }
   return nullptr;
 }
 
+QXCoordinationID LinuxFileCoordinator::nameFor(const char* role, int process) {
+  std::string name(role);
+  name.append(" ").append(std::to_string(process)).append("-").append(std::to_string(++names_));
+  return {std::move(name)};
+}
+
+void LinuxFileCoordinator::askToProvide(const std::shared_ptr<QXDocuvend>& provider, int readerProcess, const QXURL& file,
+                                        QXDocuvend::ProvideCompletion completion) {
+  onItsQueue(*provider, [provider, reader = nameFor("reader", readerProcess), file, completion = std::move(completion)] {
+    provider->_provideItemAtURL(file, reader, completion);
+  });
+}
+
 void LinuxFileCoordinator::tellFinishedWriting(const std::shared_ptr<QXDocuvend>& provider, int writerProcess, const QXURL& file,
                                                std::function<void()> told) {
-  const QXCoordinationID writer{"writer " + std::to_string(writerProcess) + "-" + std::to_string(++writers_)};
-  auto tell = [provider, writer, file, told = std::move(told)] {
+  onItsQueue(*provider, [provider, writer = nameFor("writer", writerProcess), file, told = std::move(told)] {
     provider->_writerWithID(writer, file);
     if (told) told();
-  };
-  if (const auto queue = provider->_providedItemsOperationQueue()) {
-    queue->addOperation(std::move(tell));
-  } else {
-    tell();
-  }
+  });
 }
 
 }  // namespace docuvend::linux_platform

@@ -1,0 +1,165 @@
+// How a file's line moves
+//
+// A file has a line: accesses that have the turn, and accesses that wait. Whoever waits at the head gets the turn when it excludes none of
+// the other processes' accesses that have it; then the next one is looked at, and so on until one has to go on waiting. Nobody is ever
+// passed over but by the further accesses of a process that has the turn: those begin without queueing, or, when they write within their
+// own read, queue at the head.
+//
+// Nothing that waits gets somebody new to wait for except by an access that is entered: a turn that is got or given up only shortens waits,
+// and an access that goes before others waits for nobody whom they do not wait for too. So a cycle can only be closed by the access that is
+// just being entered, and looking from there finds every one.
+
+#include "platform/linux/coordination/AccessTable.h"
+
+#include <algorithm>
+#include <cstddef>
+#include <utility>
+
+namespace docuvend::linux_platform {
+
+bool AccessTable::Access::excludes(const Access& other) const {
+  return party.process != other.party.process && (kind == AccessKind::writing || other.kind == AccessKind::writing);
+}
+
+bool AccessTable::Line::has(const QXAuditToken& process) const {
+  return std::any_of(having.begin(), having.end(), [&process](const Access& access) { return access.party.process == process; });
+}
+
+bool AccessTable::Line::hasRoomFor(const Access& access) const {
+  return std::none_of(having.begin(), having.end(), [&access](const Access& other) { return other.excludes(access); });
+}
+
+// Whether the wait of an access that has just taken its place in a line leads back to its party.
+class AccessTable::Cycle {
+ public:
+  Cycle(const AccessTable& table, const AccessParty& party) : table_(table), party_(party) {}
+
+  [[nodiscard]] bool isClosedBy(AccessNumber number) {
+    await(number);
+    while (!isClosed_ && !open_.empty()) {
+      const AccessNumber next = open_.back();
+      open_.pop_back();
+      follow(next);
+    }
+    return isClosed_;
+  }
+
+ private:
+  // An access that waits has to get its turn.
+  void await(AccessNumber number) {
+    if (awaited_.insert(number).second) open_.push_back(number);
+  }
+
+  // A party has to go on.
+  void await(const AccessParty& party) {
+    if (party == party_) isClosed_ = true;
+    if (!awaitedParties_.insert(party).second) return;
+    for (const AccessNumber number : table_.parties_.at(party).waiting) await(number);
+  }
+
+  void follow(AccessNumber number) {
+    const Line& line = table_.lines_.at(*table_.places_.at(number).file);
+    const auto own =
+        std::find_if(line.waiting.begin(), line.waiting.end(), [number](const Access& access) { return access.number == number; });
+    for (const Access& access : line.having) {
+      if (access.excludes(*own)) await(access.party);
+    }
+    for (auto before = line.waiting.begin(); before != own; ++before) {
+      if (before->excludes(*own)) {
+        await(before->party);
+      } else if (before->party.process == own->party.process) {
+        // Its own process need not end that one, but does not pass it.
+        await(before->number);
+      }
+    }
+  }
+
+  const AccessTable& table_;
+  const AccessParty& party_;
+  bool isClosed_ = false;
+  std::vector<AccessNumber> open_;
+  std::set<AccessNumber> awaited_;
+  std::set<AccessParty> awaitedParties_;
+};
+
+AccessTable::Entry AccessTable::enter(AccessNumber number, const FileKey& file, AccessKind kind, const AccessParty& party) {
+  const auto at = lines_.try_emplace(file).first;
+  Line& line = at->second;
+  const Access access{number, kind, party};
+  const bool isWithin = line.has(party.process);
+  const bool goesAtOnce = line.hasRoomFor(access) && (isWithin || line.waiting.empty());
+  const bool wasEngaged = parties_.contains(party);
+  Engagement& engagement = parties_[party];
+  places_.emplace(number, Place{&at->first, party});
+  if (goesAtOnce) {
+    line.having.push_back(access);
+    engagement.having.insert(number);
+    return Entry::hasTurn;
+  }
+  line.waiting.insert(isWithin ? line.waiting.begin() : line.waiting.end(), access);
+  engagement.waiting.insert(number);
+  // Nobody waits for a party that has nothing else, unless it goes before others.
+  if ((wasEngaged || isWithin) && Cycle(*this, party).isClosedBy(number)) {
+    std::erase_if(line.waiting, [number](const Access& waiting) { return waiting.number == number; });
+    forget(number);
+    return Entry::wouldDeadlock;
+  }
+  return Entry::waits;
+}
+
+void AccessTable::forget(AccessNumber number) {
+  const auto place = places_.find(number);
+  const auto engagement = parties_.find(place->second.party);
+  engagement->second.having.erase(number);
+  engagement->second.waiting.erase(number);
+  if (engagement->second.having.empty() && engagement->second.waiting.empty()) parties_.erase(engagement);
+  places_.erase(place);
+}
+
+std::vector<AccessNumber> AccessTable::leave(AccessNumber number) {
+  const auto place = places_.find(number);
+  if (place == places_.end()) return {};
+  const auto at = lines_.find(*place->second.file);
+  Line& line = at->second;
+  const auto isIt = [number](const Access& access) { return access.number == number; };
+  std::erase_if(line.having, isIt);
+  std::erase_if(line.waiting, isIt);
+  forget(number);
+  std::vector<AccessNumber> come;
+  auto head = line.waiting.begin();
+  for (; head != line.waiting.end() && line.hasRoomFor(*head); ++head) {
+    line.having.push_back(*head);
+    Engagement& engagement = parties_.at(head->party);
+    engagement.waiting.erase(head->number);
+    engagement.having.insert(head->number);
+    come.push_back(head->number);
+  }
+  line.waiting.erase(line.waiting.begin(), head);
+  if (line.having.empty() && line.waiting.empty()) lines_.erase(at);
+  return come;
+}
+
+std::vector<AccessTable::State> AccessTable::of(const FileKey& file) const {
+  std::vector<State> states;
+  const auto at = lines_.find(file);
+  if (at == lines_.end()) return states;
+  for (const Access& access : at->second.having) states.push_back({access.number, /*hasTurn=*/true});
+  for (const Access& access : at->second.waiting) states.push_back({access.number, /*hasTurn=*/false});
+  return states;
+}
+
+bool AccessTable::hasTurn(const QXAuditToken& process, const FileKey& file) const {
+  const auto at = lines_.find(file);
+  return at != lines_.end() && at->second.has(process);
+}
+
+bool AccessTable::isWriting(const QXAuditToken& process, const FileKey& file) const {
+  const auto at = lines_.find(file);
+  return at != lines_.end() && std::any_of(at->second.having.begin(), at->second.having.end(), [&process](const Access& access) {
+           return access.kind == AccessKind::writing && access.party.process == process;
+         });
+}
+
+bool AccessTable::isEmpty() const { return lines_.empty(); }
+
+}  // namespace docuvend::linux_platform

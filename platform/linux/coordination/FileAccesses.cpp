@@ -1,0 +1,215 @@
+// How an access goes on
+//
+// Every change is made in two halves: with the lock held the table, the requests to providers and the entries are brought from one
+// consistent state to the next, and what follows from that (answers, questions to providers) is collected; then the lock is given back and
+// the collected is carried out. Providers are looked up without the lock as well, since that asks them and the file system: an access may
+// therefore have ended by the time its provider is known, and is looked for again.
+//
+// An access is in the table exactly while it has an entry. A write that ends keeps both until the provider has been told.
+
+#include "platform/linux/coordination/FileAccesses.h"
+
+#include <cassert>
+#include <utility>
+
+#include "platform/linux/coordination/CoordinationErrors.h"
+
+namespace docuvend::linux_platform {
+namespace {
+
+QXError wouldDeadlock(const QXURL& url) {
+  return makeCoordinationError(FileCoordinationErrorCode::wouldDeadlock,
+                               "the wait would never end: those who are waited for wait for the caller themselves", url);
+}
+
+QXError endedBeforeItBegan(const QXURL& url) {
+  return makeCoordinationError(FileCoordinationErrorCode::ended, "the access was ended before it had begun", url);
+}
+
+}  // namespace
+
+FileAccesses::FileAccesses(LinuxFileCoordinator& coordinator) : coordinator_(coordinator) {}
+
+AccessNumber FileAccesses::newNumber() { return ++lastNumber_; }
+
+void FileAccesses::begin(AccessNumber number, FileAccess access, Answer answer) {
+  Consequences consequences;
+  {
+    const std::lock_guard lock(mutex_);
+    assert(!entries_.contains(number));
+    const AccessTable::Entry entered = table_.enter(number, access.file, access.kind, access.party);
+    Entry entry{std::move(access), Stage::waiting, std::move(answer)};
+    if (entered == AccessTable::Entry::wouldDeadlock) {
+      answerWith(entry, wouldDeadlock(entry.access.url), consequences);
+    } else {
+      entries_.emplace(number, std::move(entry));
+      if (entered == AccessTable::Entry::hasTurn) takeTurn(number, consequences);
+    }
+  }
+  carryOut(std::move(consequences));
+}
+
+void FileAccesses::end(AccessNumber number, std::function<void()> ended) {
+  std::optional<FileAccess> written;
+  Consequences consequences;
+  {
+    const std::lock_guard lock(mutex_);
+    const auto found = entries_.find(number);
+    if (found != entries_.end() && found->second.stage != Stage::ending) {
+      Entry& entry = found->second;
+      if (entry.stage == Stage::holding && entry.access.kind == AccessKind::writing) {
+        entry.stage = Stage::ending;
+        written = entry.access;
+      } else {
+        if (entry.stage != Stage::holding) answerWith(entry, endedBeforeItBegan(entry.access.url), consequences);
+        remove(number, consequences);
+      }
+    }
+    if (!written) consequences.answers.push_back(std::move(ended));
+  }
+  if (written) tellThenRelease(number, *written, std::move(ended));
+  carryOut(std::move(consequences));
+}
+
+void FileAccesses::tellThenRelease(AccessNumber number, const FileAccess& access, std::function<void()> ended) {
+  const auto provider = coordinator_.providerOf(access.url);
+  if (!provider) {
+    release(number, std::move(ended));
+    return;
+  }
+  // This outlives the telling.
+  coordinator_.tellFinishedWriting(provider, access.holder.processIdentifier, access.url,
+                                   [this, number, ended = std::move(ended)] { release(number, ended); });
+}
+
+void FileAccesses::release(AccessNumber number, std::function<void()> ended) {
+  Consequences consequences;
+  {
+    const std::lock_guard lock(mutex_);
+    remove(number, consequences);
+    consequences.answers.push_back(std::move(ended));
+  }
+  carryOut(std::move(consequences));
+}
+
+void FileAccesses::takeTurn(AccessNumber number, Consequences& consequences) {
+  Entry& entry = entries_.at(number);
+  const FileAccess& access = entry.access;
+  if (access.kind == AccessKind::writing || provisions_.isProvided(access.file, access.party.process)) {
+    hold(entry, consequences);
+    return;
+  }
+  entry.stage = Stage::providing;
+  consequences.readers.push_back({number, access.file, access.url, access.holder, access.party.process});
+}
+
+void FileAccesses::hold(Entry& entry, Consequences& consequences) {
+  entry.stage = Stage::holding;
+  answerWith(entry, /*error=*/{}, consequences);
+}
+
+void FileAccesses::answerWith(Entry& entry, std::optional<QXError> error, Consequences& consequences) {
+  consequences.answers.push_back([answer = std::move(entry.answer), error = std::move(error)] {
+    if (answer) answer(error);
+  });
+}
+
+void FileAccesses::remove(AccessNumber number, Consequences& consequences) {
+  const auto found = entries_.find(number);
+  const FileAccess access = std::move(found->second.access);
+  entries_.erase(found);
+  provisions_.leave(number);
+  const std::vector<AccessNumber> come = table_.leave(number);
+  if (!table_.hasTurn(access.party.process, access.file)) provisions_.noteTurnIsOver(access.file, access.party.process);
+  for (const AccessNumber next : come) takeTurn(next, consequences);
+}
+
+void FileAccesses::carryOut(Consequences consequences) {
+  for (const auto& answer : consequences.answers) {
+    if (answer) answer();
+  }
+  for (const Reader& reader : consequences.readers) provide(reader);
+}
+
+void FileAccesses::provide(const Reader& reader) {
+  const auto provider = coordinator_.providerOf(reader.url, LinuxFileCoordinator::DirectoryItself::doesNotCount);
+  std::optional<Provisions::Joined> joined;
+  Consequences consequences;
+  {
+    const std::lock_guard lock(mutex_);
+    const auto found = entries_.find(reader.number);
+    if (found == entries_.end()) return;
+    if (provider) {
+      joined = provisions_.join(provider, reader.file, reader.number, reader.process);
+    } else {
+      hold(found->second, consequences);
+    }
+  }
+  carryOut(std::move(consequences));
+  if (!joined || joined->wait == Provisions::Wait::forRunningRequest) return;
+  // This outlives the request.
+  coordinator_.askToProvide(provider, reader.holder.processIdentifier, reader.url,
+                            [this, request = joined->request](const std::optional<QXError>& error) { requestIsAnswered(request, error); });
+}
+
+void FileAccesses::requestIsAnswered(ProvideRequest request, const std::optional<QXError>& error) {
+  std::optional<Provisions::Finished> finished;
+  Consequences consequences;
+  {
+    const std::lock_guard lock(mutex_);
+    finished = provisions_.finish(request);
+    if (!finished) return;
+    if (!error) {
+      for (const QXAuditToken& process : finished->processes) {
+        if (table_.hasTurn(process, finished->file)) provisions_.noteProvided(finished->file, process);
+      }
+    }
+    for (const AccessNumber number : finished->waiting) {
+      Entry& entry = entries_.at(number);
+      if (error) {
+        answerWith(entry, error, consequences);
+        remove(number, consequences);
+      } else {
+        hold(entry, consequences);
+      }
+    }
+  }
+  carryOut(std::move(consequences));
+}
+
+std::vector<KnownAccess> FileAccesses::of(const FileKey& file) const {
+  const std::lock_guard lock(mutex_);
+  std::vector<KnownAccess> known;
+  for (const AccessTable::State& state : table_.of(file)) {
+    const Entry& entry = entries_.at(state.number);
+    known.push_back({entry.access, stateOf(entry.stage)});
+  }
+  return known;
+}
+
+std::optional<AccessState> FileAccesses::stateOf(AccessNumber number) const {
+  const std::lock_guard lock(mutex_);
+  const auto found = entries_.find(number);
+  if (found == entries_.end()) return std::nullopt;
+  return stateOf(found->second.stage);
+}
+
+AccessState FileAccesses::stateOf(Stage stage) {
+  switch (stage) {
+    case Stage::waiting:
+      return AccessState::waiting;
+    case Stage::providing:
+      return AccessState::providing;
+    case Stage::holding:
+    case Stage::ending:
+      break;
+  }
+  return AccessState::holding;
+}
+
+bool FileAccesses::isWriting(const QXAuditToken& process, const FileKey& file) const {
+  const std::lock_guard lock(mutex_);
+  return table_.isWriting(process, file);
+}
+
+}  // namespace docuvend::linux_platform

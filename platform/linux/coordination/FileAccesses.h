@@ -1,0 +1,116 @@
+// Accesses to files from their request to their end, over a table of turns and the providers.
+//
+// Reading: its turn, then the contents, which are asked of the provider if the file lies below a provider's directory, then it has begun.
+// All readers that wait for one file's contents wait for one request to the provider, also those that come while it runs; a failure is the
+// error of all that wait then, and whoever comes later asks anew. A request goes on when nobody waits for it any more. A read within an
+// access of its own process asks the provider only when no access of this process has had it asked since it has the turn. Writing: its
+// turn, then it has begun. When it has begun and ends, the provider is told once, and only then the turn passes on.
+//
+// May be used from any thread. Providers are asked and told with no lock held; answers run with no lock held, on any thread, also inside
+// the call. Outlives every request that a provider may still answer.
+#pragma once
+
+#include <atomic>
+#include <cstdint>
+#include <functional>
+#include <map>
+#include <mutex>
+#include <optional>
+#include <string>
+#include <vector>
+
+#include "platform/QXError.h"
+#include "platform/QXURL.h"
+#include "platform/linux/coordination/AccessTable.h"
+#include "platform/linux/coordination/LinuxFileCoordinator.h"
+#include "platform/linux/coordination/Provisions.h"
+
+namespace docuvend::linux_platform {
+
+// Who asks, as others may be told.
+struct AccessHolder {
+  int processIdentifier = 0;
+  std::optional<std::string> bundleIdentifier;
+};
+
+struct FileAccess {
+  FileKey file;
+  QXURL url;  // as the caller named it; the provider hears this
+  AccessKind kind;
+  AccessParty party;
+  AccessHolder holder;
+};
+
+enum class AccessState { waiting, providing, holding };
+
+struct KnownAccess {
+  FileAccess access;
+  AccessState state;
+};
+
+class FileAccesses {
+ public:
+  using Answer = std::function<void(std::optional<QXError>)>;
+
+  // The coordinator outlives it.
+  explicit FileAccesses(LinuxFileCoordinator& coordinator);
+  FileAccesses(const FileAccesses&) = delete;
+  FileAccesses& operator=(const FileAccesses&) = delete;
+
+  [[nodiscard]] AccessNumber newNumber();
+  // `answer` runs once: without an error when the access has begun. After an error the access is over; its end need not be asked for.
+  void begin(AccessNumber number, FileAccess access, Answer answer);
+  // `ended` runs once: of a write that had begun, when the provider has been told. An access that has not begun is answered with `ended` of
+  // FileCoordinationErrorCode. The end of an access that is over already, or is ending, has nothing to wait for.
+  void end(AccessNumber number, std::function<void()> ended);
+
+  // Those that have the file, then those that wait for it, in their order.
+  [[nodiscard]] std::vector<KnownAccess> of(const FileKey& file) const;
+  // None when the access is over.
+  [[nodiscard]] std::optional<AccessState> stateOf(AccessNumber number) const;
+  [[nodiscard]] bool isWriting(const QXAuditToken& process, const FileKey& file) const;
+
+ private:
+  enum class Stage { waiting, providing, holding, ending };
+  struct Entry {
+    FileAccess access;
+    Stage stage;
+    Answer answer;  // until it has run
+  };
+  struct Reader {
+    AccessNumber number;
+    FileKey file;
+    QXURL url;
+    AccessHolder holder;
+    QXAuditToken process;
+  };
+  // What follows from a change, for when the lock is free.
+  struct Consequences {
+    std::vector<std::function<void()>> answers;
+    std::vector<Reader> readers;  // have the turn and need the contents
+  };
+
+  // With the lock held.
+  void takeTurn(AccessNumber number, Consequences& consequences);
+  static void hold(Entry& entry, Consequences& consequences);
+  void remove(AccessNumber number, Consequences& consequences);
+  static void answerWith(Entry& entry, std::optional<QXError> error, Consequences& consequences);
+  [[nodiscard]] static AccessState stateOf(Stage stage);
+
+  // Without.
+  void carryOut(Consequences consequences);
+  void provide(const Reader& reader);
+  void requestIsAnswered(ProvideRequest request, const std::optional<QXError>& error);
+  void tellThenRelease(AccessNumber number, const FileAccess& access, std::function<void()> ended);
+  void release(AccessNumber number, std::function<void()> ended);
+
+  LinuxFileCoordinator& coordinator_;
+  std::atomic<AccessNumber> lastNumber_{0};
+  mutable std::mutex mutex_;
+  // Guarded by mutex_.
+  AccessTable table_;
+  Provisions provisions_;
+  std::map<AccessNumber, Entry> entries_;  // as many as the table has
+};
+
+}  // namespace docuvend::linux_platform

@@ -1,0 +1,38 @@
+#include "platform/linux/coordination/FileKey.h"
+
+#include <cerrno>
+#include <utility>
+
+#include "platform/linux/files/FilePlace.h"
+
+namespace docuvend::linux_platform {
+namespace {
+
+QXError noDirectory(int error, const QXURL& url) {
+  QXError made = QXError::system(error, "cannot find the directory of " + url.fileSystemPath());
+  made.url = url;
+  return made;
+}
+
+// "." and ".." are no names of anything.
+bool endsInDots(const std::string& path) { return path.ends_with("/.") || path.ends_with("/.."); }
+
+}  // namespace
+
+std::variant<FileKey, QXError> FileKey::of(const QXURL& url) {
+  std::string path = url.fileSystemPath();
+  if (endsInDots(path)) {
+    auto place = FilePlace::ofDirectory(path);
+    if (const int* error = std::get_if<int>(&place)) return noDirectory(*error, url);
+    path = std::get<FilePlace>(std::move(place)).existing;
+  }
+  if (path == "/") return noDirectory(EINVAL, url);
+  const std::size_t slash = path.rfind('/');
+  const OpenedPath directory = openDirectory(path.substr(0, slash + 1));
+  if (const auto* failure = std::get_if<SystemFailure>(&directory)) return noDirectory(failure->code, url);
+  const auto status = statusOf(std::get<UniqueDescriptor>(directory).get());
+  if (const auto* failure = std::get_if<SystemFailure>(&status)) return noDirectory(failure->code, url);
+  return FileKey{std::get<ObjectStatus>(status).identity, path.substr(slash + 1)};
+}
+
+}  // namespace docuvend::linux_platform
