@@ -26,6 +26,11 @@ using TimePoint = std::chrono::steady_clock::time_point;
   return std::chrono::steady_clock::now() + std::min<std::chrono::milliseconds>(time, kYear);
 }
 
+// Never negative.
+[[nodiscard]] inline std::chrono::milliseconds timeLeft(TimePoint until) {
+  return std::max(std::chrono::milliseconds(0), std::chrono::ceil<std::chrono::milliseconds>(until - std::chrono::steady_clock::now()));
+}
+
 // How a call waits.
 struct Waiting {
   TimePoint until;

@@ -25,30 +25,35 @@
 //
 //   docuvend.within(2s).documentURL(string)
 //
-// A call whose deadline has passed may still take effect; its late answer is dropped, with the file that may have come in it.
+// A call whose deadline has passed may still take effect; its late answer is dropped, with the file that may have come in it. Only a wait
+// for a file's turn leaves nothing behind: the library gives the turn up.
 //
 // Restarts of the daemon. A Consumer outlives them. A call that finds its connection ended, or no daemon, waits for a new one: no longer
 // than Options::restartPatience and its deadline, then it is `unreachable`. If the daemon ends with a request in hand, the library asks
 // once more where that is harmless: wakeUp, extendSandbox, providePlaceholder, startProviding, providers, extendBookmark,
-// bookmarkableString, documentURL, redeem, open, finishedWriting. stopProviding, which might undo what somebody else began meanwhile, and
-// the last step of replace are not repeated: their error is `connectionLost`, and they may have taken effect.
+// bookmarkableString, documentURL, redeem, open, finishedWriting, coordinateReading, coordinateWriting, holders. stopProviding, which might
+// undo what somebody else began meanwhile, and the last step of replace are not repeated: their error is `connectionLost`, and they may
+// have taken effect.
 //
 // Errors. The library's own are in ConsumerErrors.h. All others are answers as they came: DVErrorDomain (common/DVErrorCodes.h) from the
 // daemon, with a provider's own error beneath code 7; QXSandboxErrorDomain (platform/linux/wire/SandboxProtocol.h) when a token opens
-// nothing; QXRpcErrorDomain (platform/rpc_errors.h) when the daemon refuses the connection or a request is too large;
-// QXSystemErrorDomain, with an errno value, from the system. What each call adds stands beside it.
+// nothing; QXFileCoordinationErrorDomain (platform/linux/wire/FileCoordinationProtocol.h) when a file's turn cannot be had;
+// QXRpcErrorDomain (platform/rpc_errors.h) when the daemon refuses the connection or a request is too large; QXSystemErrorDomain, with an
+// errno value, from the system. What each call adds stands beside it.
 #pragma once
 
 #include <chrono>
-#include <cstdint>
 #include <functional>
 #include <memory>
 #include <optional>
 #include <string>
+#include <vector>
 
 #include "platform/QXValue.h"
 #include "platform/identifiers.h"
 #include "sdk/ConsumerErrors.h"
+#include "sdk/CoordinatedAccess.h"
+#include "sdk/Progress.h"
 #include "sdk/Result.h"
 
 namespace docuvend {
@@ -71,21 +76,13 @@ struct Document {
   std::optional<std::string> bookmarkableString = std::nullopt;
 };
 
-// How much of a document is there while it is being provided. A provider may begin anew: the first number may also fall.
-struct Progress {
-  std::uint64_t bytesPresent;
-  std::uint64_t size;
-};
-// Called on the thread that made the call, now and then while it waits, never afterwards. Not called when nothing can be said.
-using ProgressHandler = std::function<void(const Progress&)>;
-
 class Consumer {
  public:
   struct Options {
     // For an unconfined program: the installed bundle that it acts for. A confined one is known by its launch.
     std::optional<std::string> actAs;
     std::chrono::milliseconds deadline{30'000};
-    // Materialising a document may take longer than an answer: for startProviding, and for open as a whole.
+    // Materialising a document may take longer than an answer: for startProviding, for open as a whole, and for the beginning of an access.
     std::chrono::milliseconds materialisingDeadline{600'000};
     // How long a call waits for a daemon that is not there.
     std::chrono::milliseconds restartPatience{5'000};
@@ -151,9 +148,31 @@ class Consumer {
   // what `write` returns to give up: the item is untouched. Then, of putting the sibling in its place: `unreachable` and of
   // QXSandboxErrorDomain badToken (1), notRegularFile (2), notPermitted (5) and notSiblings (6) leave it untouched; after anything else
   // it has the old contents or the new. `notTold`: it has the new ones; call finishedWriting again.
+  //
+  // Takes no turn at the file: who has read what it writes, and must not lose what others write meanwhile, does both within one
+  // coordinateWriting. There the provider is not told by this call but, once, by the access's end.
   [[nodiscard]] Failure replace(const Document& document, const std::function<Failure(const QXDescriptor&)>& write);
-  // Tells file coordination that this process has written the document in place, so that its provider hears of the change.
+  // Tells file coordination that this process has written the document in place, so that its provider hears of the change. Takes no turn
+  // either; within a write access of this process, whose end tells the provider, nothing remains to be told.
   [[nodiscard]] Failure finishedWriting(const QXURL& url);
+
+  // These two wait for this caller's turn at the file among all processes that take turns (sdk/CoordinatedAccess.h), and of a read that the
+  // file's provider has brought its contents; then the caller opens the file, by its path or by a token, and ends the access when it is
+  // done. The file need not be there, nor be a provider's. A document's token is sent with the request, and renewed when it has become
+  // worthless.
+  //
+  // Failures. `deadlinePassed`: the library has given the turn up. Of QXFileCoordinationErrorDomain: notPermitted (2), this process can
+  // reach the file in that way neither by its path nor by the token; wouldDeadlock (5), those who have the file wait for this thread's
+  // accesses: end them and try again; ended (6), the daemon has given the turn up; tooManyAccesses (7), over this Consumer's connection;
+  // noDirectory (8), there is none where the file would be. Of QXSandboxErrorDomain: a token that opens nothing. Of DVErrorDomain: the
+  // provider could not bring the contents (7), or is not there.
+  [[nodiscard]] Result<CoordinatedAccess> coordinateReading(const QXURL& url, const CoordinationOptions& options = {});
+  [[nodiscard]] Result<CoordinatedAccess> coordinateReading(const Document& document, const CoordinationOptions& options = {});
+  [[nodiscard]] Result<CoordinatedAccess> coordinateWriting(const QXURL& url, const CoordinationOptions& options = {});
+  [[nodiscard]] Result<CoordinatedAccess> coordinateWriting(const Document& document, const CoordinationOptions& options = {});
+  // Who accesses the file: those who have it, then those who wait for it, in their order. For who can read it, or has a token for it;
+  // else of QXFileCoordinationErrorDomain notPermitted (2), or noDirectory (8).
+  [[nodiscard]] Result<std::vector<FileHolder>> holders(const QXURL& url, const std::optional<QXData>& token = std::nullopt);
 
  private:
   Consumer(std::shared_ptr<sdk_detail::ServiceConnections> services, Options options);
@@ -161,6 +180,9 @@ class Consumer {
   // startProviding, with something to be done now and then while it waits.
   [[nodiscard]] Failure start(const QXURL& url, const ProviderID& fromProvider, const ConsumerID& forConsumer,
                               const std::function<void()>& watch);
+  [[nodiscard]] Result<CoordinatedAccess> coordinate(CoordinationKind kind, const Document& document, const CoordinationOptions& options);
+  [[nodiscard]] Result<CoordinatedAccess> coordinate(CoordinationKind kind, const QXURL& url, const CoordinationOptions& options,
+                                                     std::chrono::milliseconds deadline);
 
   const std::shared_ptr<sdk_detail::ServiceConnections> services_;
   const Options options_;

@@ -21,6 +21,7 @@
 #include "platform/linux/wire/SandboxProtocol.h"
 #include "sdk/Consumer.h"
 #include "sdk/FileProgress.h"
+#include "sdk/LiveTokens.h"
 #include "sdk/ServiceConnections.h"
 
 namespace docuvend {
@@ -30,24 +31,19 @@ using linux_platform::QXSandboxRedemption;
 using linux_platform::SandboxErrorCode;
 using sdk_detail::after;
 using sdk_detail::errorOf;
+using sdk_detail::isSandboxError;
 using sdk_detail::Repeat;
+using sdk_detail::timeLeft;
 using sdk_detail::TimePoint;
 using sdk_detail::valueOf;
+using sdk_detail::withLiveTokens;
 
 namespace {
 
 constexpr std::chrono::milliseconds kBusyInterval{20};
 
-bool isSandboxError(const QXError& error, SandboxErrorCode code) {
-  return error.domain == linux_platform::kQXSandboxErrorDomain && error.code == static_cast<std::int64_t>(code);
-}
-
 bool isDeadline(const QXError& error) {
   return error.domain == kConsumerErrorDomain && error.code == static_cast<std::int64_t>(ConsumerErrorCode::deadlinePassed);
-}
-
-std::chrono::milliseconds timeLeft(TimePoint until) {
-  return std::max(std::chrono::milliseconds(0), std::chrono::ceil<std::chrono::milliseconds>(until - std::chrono::steady_clock::now()));
 }
 
 // Waits a little before the next try. False: the time is over.
@@ -109,17 +105,6 @@ struct Locks {
   Lock item;
   Lock sibling;
 };
-
-// Does `act` with the document; once more with new tokens when these have become worthless and the library can ask for others.
-template <class Act>
-auto withLiveTokens(Consumer& consumer, const Document& document, TimePoint until, const Act& act) -> decltype(act(document)) {
-  auto result = act(document);
-  const auto* error = std::get_if<QXError>(&result);
-  if (error == nullptr || !isSandboxError(*error, SandboxErrorCode::badToken) || !document.bookmarkableString) return result;
-  auto renewed = consumer.within(timeLeft(until)).documentURL(*document.bookmarkableString);
-  if (auto* refusal = std::get_if<QXError>(&renewed)) return std::move(*refusal);
-  return act(std::get<Document>(renewed));
-}
 
 QXError noTokens(const Document& document) {
   return makeConsumerError(ConsumerErrorCode::noToken, "There is no token for " + document.url.absoluteString() + ".");

@@ -7,7 +7,7 @@
 #include <chrono>
 #include <cstdint>
 
-#include "sdk/Consumer.h"
+#include "sdk/Progress.h"
 
 namespace docuvend::sdk_detail {
 

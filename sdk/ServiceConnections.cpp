@@ -8,7 +8,7 @@
 //                           ends of a request must not be ended by it for ever.
 //   the service refused     it says why, and would say it again
 //   no answer in time       the request stays in the connection's books until its answer comes, which may be never: a connection with many
-//                           of those is left behind, and closes when its last running call is done
+//                           of those is left behind, and closes when its last running call, or access to a file, is done
 
 #include "sdk/ServiceConnections.h"
 
@@ -106,9 +106,14 @@ Result<UniqueDescriptor> ServiceConnections::connectSocket(const std::string& se
 }
 
 std::shared_ptr<Connection> ServiceConnections::open(const std::string& service) {
+  std::shared_ptr<Connection> left;  // goes when nothing is locked any more
   const std::lock_guard lock(mutex_);
   const auto found = open_.find(service);
-  return found == open_.end() ? nullptr : found->second;
+  if (found == open_.end()) return nullptr;
+  if (*found->second->abandonedCalls < kMaximumAbandonedCalls) return found->second;
+  left = std::move(found->second);
+  open_.erase(found);
+  return nullptr;
 }
 
 std::shared_ptr<Connection> ServiceConnections::keep(const std::string& service, UniqueDescriptor socket) {
@@ -123,7 +128,10 @@ std::shared_ptr<Connection> ServiceConnections::make(const std::string& service,
   Endpoint::Handlers handlers;
   // `this` is safe: the reactor has run its last handler before anything else of this object goes.
   handlers.onClose = [this, service, weak = std::weak_ptr(connection)](const QXError&) {
-    if (const auto ended = weak.lock()) drop(service, *ended);
+    const auto ended = weak.lock();
+    if (!ended) return;
+    ended->hasEnded = true;
+    drop(service, *ended);
   };
   connection->endpoint = Endpoint::create(reactor_, std::move(socket), {linux_platform::kProtocolVersion, actAs_}, std::move(handlers));
   connection->endpoint->resume();
@@ -137,11 +145,6 @@ void ServiceConnections::drop(const std::string& service, const Connection& conn
   if (found == open_.end() || found->second.get() != &connection) return;
   dropped = std::move(found->second);
   open_.erase(found);
-}
-
-QXError ServiceConnections::abandon(const std::string& service, Connection& connection) {
-  if (++connection.abandonedCalls >= kMaximumAbandonedCalls) drop(service, connection);
-  return notInTime();
 }
 
 bool ServiceConnections::mayAskAgain(const std::string& service, const Connection& connection, const NotDelivered& failure, Repeat repeat,

@@ -11,6 +11,7 @@
 #include <mutex>
 #include <optional>
 #include <string>
+#include <type_traits>
 #include <utility>
 #include <variant>
 
@@ -26,7 +27,33 @@ enum class Repeat { harmless, never };
 
 struct Connection {
   std::shared_ptr<linux_platform::Endpoint> endpoint;
-  std::atomic<std::size_t> abandonedCalls = 0;
+  // Calls that nobody waits for any more and whose answers may still come.
+  std::shared_ptr<std::atomic<std::size_t>> abandonedCalls = std::make_shared<std::atomic<std::size_t>>(0);
+  // Nothing can be asked over it any more. Set soon after the end.
+  std::atomic<bool> hasEnded = false;
+};
+
+// A call in its connection's count: abandoned from `abandon` until the object goes, which is held by who waits and until the answer comes.
+class CountedCall {
+ public:
+  CountedCall(std::shared_ptr<std::atomic<std::size_t>> abandonedCalls, std::shared_ptr<const void> held)
+      : abandonedCalls_(std::move(abandonedCalls)), held_(std::move(held)) {}
+  ~CountedCall() {
+    if (isAbandoned_) --*abandonedCalls_;
+  }
+  CountedCall(const CountedCall&) = delete;
+  CountedCall& operator=(const CountedCall&) = delete;
+
+  // At most once.
+  void abandon() {
+    isAbandoned_ = true;
+    ++*abandonedCalls_;
+  }
+
+ private:
+  const std::shared_ptr<std::atomic<std::size_t>> abandonedCalls_;
+  const std::shared_ptr<const void> held_;
+  bool isAbandoned_ = false;
 };
 
 // One call's tries.
@@ -69,15 +96,24 @@ class ServiceConnections {
   // had left, and once more, if that is harmless, when it ended afterwards.
   template <auto Method, class... Arguments>
   [[nodiscard]] Result<ReplyValues<Method>> ask(const char* service, const Waiting& waiting, Repeat repeat, const Arguments&... arguments) {
-    Attempts attempts(waiting.until, patience_);
+    return askBy(service, waiting.until, repeat, [&waiting, &arguments...](const std::shared_ptr<Connection>& connection) {
+      return callOver<Method>(*connection, waiting, arguments...);
+    });
+  }
+  // The same for those whom it concerns which connection it is: `call` makes the call over the one that it is given, and returns its
+  // outcome.
+  template <class Call>
+  [[nodiscard]] auto askBy(const char* service, TimePoint until, Repeat repeat, const Call& call)
+      -> Result<std::variant_alternative_t<0, std::invoke_result_t<const Call&, const std::shared_ptr<Connection>&>>> {
+    Attempts attempts(until, patience_);
     for (;;) {
       auto reached = reach(service, attempts);
       if (auto* error = std::get_if<QXError>(&reached)) return std::move(*error);
       const auto& connection = std::get<std::shared_ptr<Connection>>(reached);
-      auto outcome = callAndWait<Method>(*connection->endpoint, waiting, arguments...);
-      if (auto* values = std::get_if<ReplyValues<Method>>(&outcome)) return std::move(*values);
+      auto outcome = call(connection);
+      if (auto* values = std::get_if<0>(&outcome)) return std::move(*values);
       const auto* failure = std::get_if<NotDelivered>(&outcome);
-      if (failure == nullptr) return abandon(service, *connection);
+      if (failure == nullptr) return notInTime();
       if (!mayAskAgain(service, *connection, *failure, repeat, attempts)) return finalError(*failure);
     }
   }
@@ -88,16 +124,26 @@ class ServiceConnections {
   template <auto Method, class... Arguments>
   [[nodiscard]] static Result<ReplyValues<Method>> askOver(const Connection& connection, const Waiting& waiting,
                                                            const Arguments&... arguments) {
-    auto outcome = callAndWait<Method>(*connection.endpoint, waiting, arguments...);
+    auto outcome = callOver<Method>(connection, waiting, arguments...);
     if (auto* values = std::get_if<ReplyValues<Method>>(&outcome)) return std::move(*values);
     if (const auto* failure = std::get_if<NotDelivered>(&outcome)) return finalError(*failure);
     return notInTime();
+  }
+  // One try over that connection.
+  template <auto Method, class... Arguments>
+  [[nodiscard]] static Outcome<Method> callOver(const Connection& connection, const Waiting& waiting, const Arguments&... arguments) {
+    Waiting counted = waiting;
+    const auto call = std::make_shared<CountedCall>(connection.abandonedCalls, waiting.held);
+    counted.held = call;
+    auto outcome = callAndWait<Method>(*connection.endpoint, counted, arguments...);
+    if (std::holds_alternative<NotInTime>(outcome)) call->abandon();
+    return outcome;
   }
 
  private:
   [[nodiscard]] Result<std::shared_ptr<Connection>> reach(const std::string& service, Attempts& attempts);
   [[nodiscard]] Result<linux_platform::UniqueDescriptor> connectSocket(const std::string& service, Attempts& attempts) const;
-  // The one that is open; none when it must be made.
+  // The one that is open; none when it must be made, also because too many calls over it are abandoned.
   [[nodiscard]] std::shared_ptr<Connection> open(const std::string& service);
   // A connection over that socket, or the one that another thread has made meanwhile.
   [[nodiscard]] std::shared_ptr<Connection> keep(const std::string& service, linux_platform::UniqueDescriptor socket);
@@ -105,8 +151,6 @@ class ServiceConnections {
   // Later calls need another one; those that run over it go on.
   void drop(const std::string& service, const Connection& connection);
 
-  // A call over the connection has waited long enough.
-  [[nodiscard]] QXError abandon(const std::string& service, Connection& connection);
   [[nodiscard]] bool mayAskAgain(const std::string& service, const Connection& connection, const NotDelivered& failure, Repeat repeat,
                                  Attempts& attempts);
   [[nodiscard]] static QXError finalError(const NotDelivered& failure);

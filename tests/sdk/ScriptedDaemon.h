@@ -93,6 +93,12 @@ struct Script {
   std::optional<QXDictionary> providers = QXDictionary{{"p", QXDictionary{}}};
   std::optional<QXError> replaceError;
   std::optional<QXError> finishedError;
+  std::optional<QXError> accessError;
+  std::optional<QXError> endError;
+  std::optional<QXError> progressError;
+  std::optional<std::int64_t> bytesPresent;
+  std::optional<std::int64_t> size;
+  std::optional<QXArray> holders = QXArray{};
   // What a token is redeemed for.
   std::function<std::variant<QXDescriptor, QXError>(const std::string& token)> redeem;
   // These take a reply instead of giving it.
@@ -101,6 +107,8 @@ struct Script {
   Instead<DVDaemon::ErrorReply> stopping;
   Instead<linux_platform::QXSandboxRedemption::FileReply> redeeming;
   Instead<linux_platform::QXSandboxRedemption::ErrorReply> replacing;
+  Instead<linux_platform::QXFileCoordination::ErrorReply> accessing;
+  Instead<linux_platform::QXFileCoordination::ErrorReply> ending;
 };
 
 class ScriptedDaemon : public DVDaemon {
@@ -185,18 +193,63 @@ class ScriptedSandbox : public linux_platform::QXSandboxRedemption {
   Calls& calls_;
 };
 
+// How accesses were named, in the order of the requests for them and for their ends.
+struct AccessNames {
+  struct Asked {
+    QXUUID accessID;
+    std::int64_t party;
+  };
+  Mailbox<Asked> asked;
+  Mailbox<QXUUID> ended;
+};
+
 class ScriptedCoordination : public linux_platform::QXFileCoordination {
  public:
-  ScriptedCoordination(Script& script, Calls& calls) : script_(script), calls_(calls) {}
+  ScriptedCoordination(Script& script, Calls& calls, AccessNames& names) : script_(script), calls_(calls), names_(names) {}
 
+  void coordinateReadingItemAtURL(std::optional<QXURL> url, std::optional<QXData> token, std::optional<QXUUID> accessID,
+                                  std::optional<std::int64_t> party, ErrorReply completionHandler) override {
+    begin("read", url, token, {*accessID, *party}, std::move(completionHandler));
+  }
+  void coordinateWritingItemAtURL(std::optional<QXURL> url, std::optional<QXData> token, std::optional<QXUUID> accessID,
+                                  std::optional<std::int64_t> party, ErrorReply completionHandler) override {
+    begin("write", url, token, {*accessID, *party}, std::move(completionHandler));
+  }
+  void endAccess(std::optional<QXUUID> accessID, ErrorReply completionHandler) override {
+    calls_.add("end");
+    names_.ended.put(*accessID);
+    if (script_.ending.takes(completionHandler)) return;
+    completionHandler(script_.endError);
+  }
+  void progressOfAccess(std::optional<QXUUID>, ProgressReply completionHandler) override {
+    calls_.add("progress");
+    completionHandler(script_.progressError, script_.bytesPresent, script_.size);
+  }
+  void holdersOfItemAtURL(std::optional<QXURL> url, std::optional<QXData> token, HoldersReply completionHandler) override {
+    calls_.add("holders of " + named(url, token));
+    if (script_.error) return completionHandler(script_.error, {});
+    completionHandler({}, script_.holders);
+  }
   void writerDidFinishWritingForURL(std::optional<QXURL> url, ErrorReply completionHandler) override {
     calls_.add("finished " + url->absoluteString());
     completionHandler(script_.finishedError);
   }
 
  private:
+  static std::string named(const std::optional<QXURL>& url, const std::optional<QXData>& token) {
+    return url->absoluteString() + (token ? " by " + token->text() : "");
+  }
+  void begin(const std::string& verb, const std::optional<QXURL>& url, const std::optional<QXData>& token, const AccessNames::Asked& asked,
+             ErrorReply completionHandler) {
+    calls_.add(verb + " " + named(url, token));
+    names_.asked.put(asked);
+    if (script_.accessing.takes(completionHandler)) return;
+    completionHandler(script_.accessError);
+  }
+
   Script& script_;
   Calls& calls_;
+  AccessNames& names_;
 };
 
 // A run-time directory of the test's own.
@@ -242,7 +295,7 @@ class ConsumerTest : public LibraryTest {
     sandbox_ = std::make_unique<ScriptedService<linux_platform::QXSandboxRedemption>>(directory + linux_platform::kSandboxServiceName,
                                                                                       std::make_shared<ScriptedSandbox>(script_, calls_));
     coordination_ = std::make_unique<ScriptedService<linux_platform::QXFileCoordination>>(
-        directory + linux_platform::kFileCoordinationServiceName, std::make_shared<ScriptedCoordination>(script_, calls_));
+        directory + linux_platform::kFileCoordinationServiceName, std::make_shared<ScriptedCoordination>(script_, calls_, names_));
   }
   // As when the daemon is killed.
   void stopServices() {
@@ -266,6 +319,7 @@ class ConsumerTest : public LibraryTest {
 
   Script script_;
   Calls calls_;
+  AccessNames names_;
   Mailbox<DVDaemon::Done> taken_;
   std::unique_ptr<ScriptedService<DVDaemon>> daemon_;
   std::unique_ptr<ScriptedService<linux_platform::QXSandboxRedemption>> sandbox_;
