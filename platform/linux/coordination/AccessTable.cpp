@@ -5,9 +5,9 @@
 // passed over but by the further accesses of a process that has the turn: those begin without queueing, or, when they write within their
 // own read, queue at the head.
 //
-// Nothing that waits gets somebody new to wait for except by an access that is entered: a turn that is got or given up only shortens waits,
-// and an access that goes before others waits for nobody whom they do not wait for too. So a cycle can only be closed by the access that is
-// just being entered, and looking from there finds every one.
+// Turns that are got or given up only shorten waits. An access that is entered waits for others, and makes those wait for it that it goes
+// before; one that begins at once is of a party that does not wait. So a cycle can only be closed by the access that is just being entered
+// and waits, it leads through that access, and looking from there finds it.
 
 #include "platform/linux/coordination/AccessTable.h"
 
@@ -58,7 +58,7 @@ class AccessTable::Cycle {
   }
 
   void follow(AccessNumber number) {
-    const Line& line = table_.lines_.at(*table_.places_.at(number).file);
+    const Line& line = table_.lines_.at(table_.places_.at(number).file);
     const auto own =
         std::find_if(line.waiting.begin(), line.waiting.end(), [number](const Access& access) { return access.number == number; });
     for (const Access& access : line.having) {
@@ -83,14 +83,13 @@ class AccessTable::Cycle {
 };
 
 AccessTable::Entry AccessTable::enter(AccessNumber number, const FileKey& file, AccessKind kind, const AccessParty& party) {
-  const auto at = lines_.try_emplace(file).first;
-  Line& line = at->second;
+  Line& line = lines_[file];
   const Access access{number, kind, party};
   const bool isWithin = line.has(party.process);
   const bool goesAtOnce = line.hasRoomFor(access) && (isWithin || line.waiting.empty());
   const bool wasEngaged = parties_.contains(party);
   Engagement& engagement = parties_[party];
-  places_.emplace(number, Place{&at->first, party});
+  places_.emplace(number, Place{file, party});
   if (goesAtOnce) {
     line.having.push_back(access);
     engagement.having.insert(number);
@@ -119,7 +118,7 @@ void AccessTable::forget(AccessNumber number) {
 std::vector<AccessNumber> AccessTable::leave(AccessNumber number) {
   const auto place = places_.find(number);
   if (place == places_.end()) return {};
-  const auto at = lines_.find(*place->second.file);
+  const auto at = lines_.find(place->second.file);
   Line& line = at->second;
   const auto isIt = [number](const Access& access) { return access.number == number; };
   std::erase_if(line.having, isIt);

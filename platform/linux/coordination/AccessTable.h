@@ -4,10 +4,10 @@
 // queue. Reading then begins at once, and so does writing within its own write; writing within its own read goes before all who queue and
 // waits for the other readers. Everybody else waits behind those who came before.
 //
-// A cycle is looked for between parties, each of which does one thing after another. An access that waits is held up by the accesses of
-// other processes that it and they exclude each other with: those that have the turn, and those that queue before it. One that has the turn
-// ends only when its party goes on, which it cannot while an access of that party waits. An access whose wait would lead back to its own
-// party this way is not entered.
+// A cycle is looked for between parties, each of which does one thing after another. An access that waits is held up by those accesses of
+// other processes that have the turn or queue before it, where the two exclude each other. One that has the turn ends only when its party
+// goes on, which it cannot while an access of that party waits. An access whose wait would lead back to its own party this way is not
+// entered.
 #pragma once
 
 #include <compare>
@@ -65,9 +65,8 @@ class AccessTable {
     [[nodiscard]] bool has(const QXAuditToken& process) const;
     [[nodiscard]] bool hasRoomFor(const Access& access) const;
   };
-  // What an access's number leads to; nodes of the map of lines stay where they are.
   struct Place {
-    const FileKey* file;
+    FileKey file;
     AccessParty party;
   };
   // Numbers of a party's accesses.
