@@ -1,11 +1,20 @@
 // docs/protocol.md says what the code does.
 #include <gtest/gtest.h>
 
-#include <algorithm>
+#include <chrono>
 #include <fstream>
 #include <iterator>
 #include <sstream>
 
+#include "common/DVErrorCodes.h"
+#include "daemon/DVGrantPage.h"
+#include "platform/linux/base/confinement.h"
+#include "platform/linux/bundles/BundleIdentifier.h"
+#include "platform/linux/coordination/AccessSession.h"
+#include "platform/linux/coordination/FileCoordinationServicer.h"
+#include "platform/linux/extension_host/ExtensionErrors.h"
+#include "platform/linux/extension_host/ExtensionTimes.h"
+#include "platform/linux/rpc/ConnectionLimiter.h"
 #include "platform/linux/wire/FileCoordinationProtocol.h"
 #include "platform/linux/wire/SandboxProtocol.h"
 #include "platform/rpc_errors.h"
@@ -13,6 +22,7 @@
 #include "providers/_QXDocuvendVendor.h"
 #include "service/DVAdministration.h"
 #include "service/DVDaemon.h"
+#include "tests/wire/ErrorNames.h"
 #include "tests/wire/ProtocolRows.h"
 #include "tests/wire/WorkedExchange.h"
 
@@ -32,39 +42,66 @@ class ProtocolPageTest : public testing::Test {
     const std::size_t begin = page.find("## " + heading + "\n");
     return begin == std::string::npos ? "" : page.substr(begin, page.find("\n## ", begin) - begin);
   }
-  // The table rows of a section, without its head.
+  // The rows of a section's first table, without its head.
   std::vector<std::string> rows(const std::string& heading) const {
     std::vector<std::string> found;
     std::istringstream lines(section(heading));
     for (std::string line; std::getline(lines, line);) {
       if (line.starts_with("| ")) found.push_back(line);
+      if (!found.empty() && !line.starts_with("|")) break;
     }
     if (!found.empty()) found.erase(found.begin());
     return found;
+  }
+  // The cells of a row of the section's first table that begins with that one; empty, and a failure, when there is not exactly one.
+  std::vector<std::string> row(const std::string& heading, const std::string& firstCell) const {
+    std::vector<std::string> found;
+    int count = 0;
+    for (const std::string& line : rows(heading)) {
+      if (!line.starts_with("| " + firstCell + " |")) continue;
+      ++count;
+      found.clear();
+      for (std::size_t from = 2, to = line.find(" |", from); to != std::string::npos; from = to + 3, to = line.find(" |", from)) {
+        found.push_back(line.substr(from, to - from));
+      }
+    }
+    EXPECT_EQ(count, 1) << heading << ": " << firstCell;
+    return found;
+  }
+  // Every code from 1 on that has a name is in the table with it, and nothing else.
+  template <class Code>
+  void expectCodes(const std::string& heading) const {
+    std::vector<std::string> due;
+    for (std::int64_t code = 1; const char* name = nameOf(static_cast<Code>(code)); ++code) {
+      due.push_back("| " + std::to_string(code) + " | " + name + " |");
+    }
+    ASSERT_GT(due.size(), 1U);
+    std::vector<std::string> shown = rows(heading);
+    for (std::string& line : shown) line.resize(line.find('|', line.find('|', 1) + 1) + 1);
+    EXPECT_EQ(shown, due) << heading;
+  }
+  void expectExchange(const std::string& heading, const std::vector<ExchangeStep>& exchange) const {
+    std::size_t due = 0;
+    for (const auto& [title, frame] : exchange) {
+      std::istringstream lines(hexLines(frame));
+      std::string expected = title + "\n\n";
+      for (std::string line; std::getline(lines, line); ++due) expected += "    " + line + "\n";
+      EXPECT_TRUE(says(heading, expected + "\n") || section(heading).ends_with(expected)) << expected;
+    }
+    // And nothing else: as many lines of bytes as the frames have.
+    std::size_t shown = 0;
+    std::istringstream lines(section(heading));
+    for (std::string line; std::getline(lines, line);) shown += line.starts_with("    ") ? 1U : 0U;
+    EXPECT_EQ(shown, due);
   }
   bool says(const std::string& heading, const std::string& text) const { return section(heading).find(text) != std::string::npos; }
 
   std::string page;
 };
 
-TEST_F(ProtocolPageTest, ShowsTheBytesOfTheWorkedExchange) {
-  std::string expected;
-  for (const auto& [title, frame] : workedExchange()) {
-    std::istringstream lines(hexLines(frame));
-    expected = title + "\n\n";
-    for (std::string line; std::getline(lines, line);) expected += "    " + line + "\n";
-    EXPECT_TRUE(says("A worked exchange", expected + "\n") || says("A worked exchange", expected)) << expected;
-  }
-  // And nothing else: as many bytes as the frames have.
-  std::size_t shown = 0;
-  std::istringstream lines(section("A worked exchange"));
-  for (std::string line; std::getline(lines, line);) shown += line.starts_with("    ") ? 1U : 0U;
-  std::size_t due = 0;
-  for (const auto& step : workedExchange()) {
-    const std::string text = hexLines(step.frame);
-    due += static_cast<std::size_t>(std::count(text.begin(), text.end(), '\n'));
-  }
-  EXPECT_EQ(shown, due);
+TEST_F(ProtocolPageTest, ShowsTheBytesOfTheWorkedExchanges) {
+  expectExchange("A worked exchange: a client", workedExchange());
+  expectExchange("A worked exchange: a provider extension", workedProviderExchange());
 }
 
 TEST_F(ProtocolPageTest, GivesEveryFrameItsNumber) {
@@ -113,30 +150,71 @@ TEST_F(ProtocolPageTest, GivesEveryKindItsNumber) {
   }
 }
 
-TEST_F(ProtocolPageTest, GivesEveryErrorItsCode) {
-  const std::vector<std::pair<QXRpcErrorCode, std::string>> codes = {{QXRpcErrorCode::unknownOperation, "unknownOperation"},
-                                                                     {QXRpcErrorCode::invalidArguments, "invalidArguments"},
-                                                                     {QXRpcErrorCode::invalidReply, "invalidReply"},
-                                                                     {QXRpcErrorCode::notTransmissible, "notTransmissible"},
-                                                                     {QXRpcErrorCode::tooManyCalls, "tooManyCalls"},
-                                                                     {QXRpcErrorCode::malformedFrame, "malformedFrame"},
-                                                                     {QXRpcErrorCode::unsupportedVersion, "unsupportedVersion"},
-                                                                     {QXRpcErrorCode::peerDoesNotRead, "peerDoesNotRead"},
-                                                                     {QXRpcErrorCode::refused, "refused"}};
-  for (const auto& [code, name] : codes) {
-    const std::string row = "| " + std::to_string(static_cast<std::int64_t>(code)) + " | " + name + " | ";
-    EXPECT_TRUE(says("Errors of the protocol itself", row)) << row;
+TEST_F(ProtocolPageTest, NamesTheServicesAndTheirErrors) {
+  for (const char* service :
+       {kDVServiceName, linux_platform::kSandboxServiceName, linux_platform::kFileCoordinationServiceName, kDVAdministrationServiceName}) {
+    EXPECT_TRUE(says("Where", service)) << service;
   }
-  EXPECT_EQ(rows("Errors of the protocol itself").size(), codes.size());
+  EXPECT_TRUE(says("Errors of the protocol itself", std::string("Domain `") + kQXRpcErrorDomain + "`"));
+  EXPECT_TRUE(says("Errors of the operations", std::string("`") + kQXSystemErrorDomain + "`"));
+}
+
+TEST_F(ProtocolPageTest, GivesEveryErrorItsCode) {
+  expectCodes<QXRpcErrorCode>("Errors of the protocol itself");
+  expectCodes<DVErrorCode>(std::string("Errors: `") + kDVErrorDomain + "`");
+  expectCodes<linux_platform::SandboxErrorCode>(std::string("Errors: `") + linux_platform::kQXSandboxErrorDomain + "`");
+  expectCodes<linux_platform::FileCoordinationErrorCode>(std::string("Errors: `") + linux_platform::kQXFileCoordinationErrorDomain + "`");
+  expectCodes<linux_platform::ExtensionHostErrorCode>(std::string("Errors: `") + linux_platform::kExtensionHostErrorDomain + "`");
 }
 
 TEST_F(ProtocolPageTest, GivesTheLimits) {
   using namespace linux_platform;
-  for (const std::size_t limit : {kMaximumFrameBytes, kMaximumTextBytes, kMaximumNesting, kMaximumElements, kMaximumDescriptors,
-                                  kMaximumPendingCalls, kMaximumOutputBytes}) {
-    const std::string cell = "| " + std::to_string(limit);
-    EXPECT_TRUE(says("Limits", cell + " |") || says("Limits", cell + " bytes |") || says("Limits", cell + ";")) << limit;
-  }
+  const std::vector<std::pair<std::string, std::string>> limits = {
+      {"length of a frame (what follows the length field)", std::to_string(kMaximumFrameBytes) + " bytes"},
+      {"a text", std::to_string(kMaximumTextBytes) + " bytes"},
+      {"nesting of arrays, dictionaries and errors in one another", std::to_string(kMaximumNesting)},
+      {"values and error texts of one frame, on all levels together", std::to_string(kMaximumElements)},
+      {"descriptors of one frame", std::to_string(kMaximumDescriptors)},
+      {"descriptors beside bytes of no frame that declares them", "0"},
+      {"pings of one direction without a pong", "1; one more is malformed once it is noticed"},
+      {"requests of one direction that wait for a reply", std::to_string(kMaximumPendingCalls) + "; one more fails with error 5"},
+      {"bytes written for a peer that it does not read", std::to_string(kMaximumOutputBytes) + "; then the connection ends"},
+      {"connections of one bundle to the daemon", std::to_string(kMaximumConnectionsPerPeer) + "; one more is ended with error 9"},
+      {"accesses of one connection to `com.orvane.FileCoordination`",
+       std::to_string(AccessSession::kMaximumAccesses) + "; one more is refused"}};
+  for (const auto& limit : limits) EXPECT_EQ(row("Limits", limit.first), (std::vector{limit.first, limit.second}));
+  EXPECT_EQ(rows("Limits").size(), limits.size());
+  EXPECT_TRUE(says("Frames", ", at most " + std::to_string(kMaximumFrameBytes) + " |"));
+  EXPECT_TRUE(says("Frames", "The version is " + std::to_string(kProtocolVersion) + "."));
+}
+
+TEST_F(ProtocolPageTest, GivesTheLimitsOfTheServices) {
+  EXPECT_TRUE(says("Operations: `QXFileCoordination`",
+                   std::to_string(linux_platform::FileCoordinationServicer::kMaximumHoldersNamed) + " at most"));
+  const std::string administration = "Operations: `DVAdministration`";
+  EXPECT_TRUE(says(administration, "after " + std::to_string(kDVMaximumGrantsOfPage) + " grants"));
+  EXPECT_TRUE(says(administration, "more than " + std::to_string(kDVMaximumTextBytesOfPage) + " bytes together"));
+  EXPECT_TRUE(says(administration, "more than " + std::to_string(kDVLongestIdentifier) + " bytes is left out"));
+}
+
+TEST_F(ProtocolPageTest, SaysWhatAnExtensionIsGivenAndHowLong) {
+  using namespace linux_platform;
+  const std::string heading = "A provider extension";
+  EXPECT_TRUE(says(heading, "- descriptor " + std::to_string(kExtensionSocketNumber) + " is its end"));
+  const auto seconds = [](ExtensionTimes::Duration time) {
+    return std::to_string(std::chrono::duration_cast<std::chrono::seconds>(time).count()) + " s";
+  };
+  const ExtensionTimes times;
+  const std::vector<std::pair<std::string, std::string>> expected = {
+      {"to answer the initial setup, an identifier or a URL", seconds(times.answerLimit) + "; then the process is ended"},
+      {"to answer the others", "none, as long as it gives signs of life"},
+      {"between two pings, while it owes an answer", seconds(times.livenessInterval)},
+      {"to answer a ping", seconds(times.answerLimit) + "; then the process is ended"},
+      {"without requests, until its connection is closed", seconds(times.linger)},
+      {"to end by itself after that, and then again after SIGTERM", seconds(times.endGrace)}};
+  for (const auto& time : expected) EXPECT_EQ(row(heading, time.first), (std::vector{time.first, time.second}));
+  EXPECT_EQ(rows(heading).size(), expected.size());
+  EXPECT_TRUE(says("Bundles", "at most " + std::to_string(kLongestIdentifier) + " bytes"));
 }
 
 }  // namespace

@@ -1,4 +1,4 @@
-// The conversation that docs/protocol.md shows byte by byte.
+// The conversations that docs/protocol.md shows byte by byte.
 #pragma once
 
 #include <array>
@@ -29,6 +29,23 @@ inline std::vector<ExchangeStep> workedExchange() {
       {"Client: request 2", RequestFrame{2, true, "wakeUp:", {}}},
       {"Daemon: failure 2", FailureFrame{2, QXError::make(kQXRpcErrorDomain, static_cast<std::int64_t>(QXRpcErrorCode::unknownOperation),
                                                           "unknown operation wakeUp:")}},
+  };
+}
+
+inline std::vector<ExchangeStep> workedProviderExchange() {
+  using namespace linux_platform;
+  const QXURL url = *QXURL::fromString("file:///home/u/.local/share/docuvend/groups/org.example.p.g/Docuvend%20Storage/a%20b.txt");
+  return {
+      {"Daemon: hello", Hello{kProtocolVersion, std::nullopt}},
+      {"Extension: hello", Hello{kProtocolVersion, std::nullopt}},
+      {"Daemon: request 1", RequestFrame{1, true, "_performInitialSetupWithCompletion:", {}}},
+      {"Extension: reply 1", ReplyFrame{1, {QXValue(), QXValue(), QXValue()}}},
+      {"Daemon: request 2", RequestFrame{2, true, "_startProvidingItemAtURL:completion:", {QXValue(url)}}},
+      {"Daemon: request 3", RequestFrame{3, true, "_identifierForItemAtURL:completion:", {QXValue(url)}}},
+      {"Extension: reply 3", ReplyFrame{3, {QXValue(), QXValue("doc/7")}}},
+      {"Daemon: ping", PingFrame{}},
+      {"Extension: pong", PongFrame{}},
+      {"Extension: reply 2", ReplyFrame{2, {QXValue(QXError::make("ExampleErrorDomain", 2, "offline"))}}},
   };
 }
 
