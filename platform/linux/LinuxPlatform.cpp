@@ -15,6 +15,7 @@
 #include "platform/linux/LinuxStatus.h"
 #include "platform/linux/base/Paths.h"
 #include "platform/linux/bundles/InstalledBundles.h"
+#include "platform/linux/coordination/FileAccesses.h"
 #include "platform/linux/coordination/FileCoordinationListenerDelegate.h"
 #include "platform/linux/coordination/LinuxFileCoordinator.h"
 #include "platform/linux/extension_host/LinuxExtensionHost.h"
@@ -90,6 +91,7 @@ struct LinuxPlatform::Services {
   LinuxExtensionHost extensionHost{bundles, paths, reactor, log.defaultLog()};
   LinuxStatus status{rpc, extensionHost};
   LinuxFileCoordinator fileCoordinator{fileSystem};
+  FileAccesses fileAccesses{fileCoordinator};
 
   std::unique_ptr<LinuxSandbox> sandbox;  // made in `create`, never null after it
 
@@ -101,7 +103,8 @@ struct LinuxPlatform::Services {
 
   void publish() {
     sandboxDelegate = std::make_shared<SandboxListenerDelegate>(*sandbox, log.defaultLog());
-    coordinationDelegate = std::make_shared<FileCoordinationListenerDelegate>(fileCoordinator, *sandbox);
+    coordinationDelegate = std::make_shared<FileCoordinationListenerDelegate>(
+        FileCoordinationServicer::Surroundings{fileCoordinator, fileAccesses, *sandbox, peers});
     sandboxListener = listen(kSandboxServiceName, sandboxDelegate);
     coordinationListener = listen(kFileCoordinationServiceName, coordinationDelegate);
   }

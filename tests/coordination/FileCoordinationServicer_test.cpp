@@ -1,6 +1,7 @@
 #include "platform/linux/coordination/FileCoordinationServicer.h"
 
 #include <gtest/gtest.h>
+#include <sys/stat.h>
 
 #include <memory>
 #include <optional>
@@ -8,156 +9,203 @@
 #include <vector>
 
 #include "platform/fake/FakeFileSystem.h"
-#include "platform/fake/FakeRpc.h"
-#include "platform/fake/FakeSandbox.h"
-#include "platform/linux/coordination/FileCoordinationListenerDelegate.h"
-#include "platform/linux/files/LinuxFileSystem.h"
-#include "tests/coordination/RecordingProvider.h"
-#include "tests/sandbox/SandboxHouse.h"
+#include "tests/coordination/CoordinationHouse.h"
 
 namespace docuvend::linux_platform {
 namespace {
 
-using testing::RecordingProvider;
+using testing::accessID;
+using testing::expectError;
+using testing::expectSuccess;
 
-// A client of the service: what it says, and what it hears.
-class Client {
- public:
-  Client(LinuxFileCoordinator& coordinator, QXSandbox& sandbox)
-      : delegate_(std::make_shared<FileCoordinationListenerDelegate>(coordinator, sandbox)) {
-    listener_.setDelegate(delegate_);
-    listener_.resume();
-    connection->setProcessIdentifier(4711);
-  }
+using FileCoordinationServicerTest = testing::CoordinationHouse;
 
-  // The answers so far, absent for success.
-  std::vector<std::optional<QXError>> say(const std::optional<QXURL>& url) {
-    if (!connection->isResumed()) listener_.connect(connection);
-    std::vector<std::optional<QXError>> answers;
-    QXRemote<QXFileCoordination>(connection->peer())
-        .call<&QXFileCoordination::writerDidFinishWritingForURL>(
-            url, [&answers](std::optional<QXError> error) { answers.push_back(std::move(error)); });
-    return answers;
-  }
-
-  const std::shared_ptr<fake_platform::FakeRpcConnection> connection = fake_platform::FakeRpcConnection::create();
-
- private:
-  const std::shared_ptr<FileCoordinationListenerDelegate> delegate_;
-  fake_platform::FakeRpcListener listener_;
-};
-
-void expectError(const std::vector<std::optional<QXError>>& answers, FileCoordinationErrorCode code) {
-  ASSERT_EQ(answers.size(), 1U);
-  ASSERT_TRUE(answers[0]);
-  EXPECT_EQ(answers[0]->domain, kQXFileCoordinationErrorDomain);
-  EXPECT_EQ(answers[0]->code, static_cast<std::int64_t>(code));
+TEST_F(FileCoordinationServicerTest, AReadBeginsWhenTheProviderHasBroughtTheContents) {
+  const auto reader = anybody();
+  const auto answers = reader.read(item, accessID(1));
+  EXPECT_TRUE(answers->empty());
+  ASSERT_EQ(provider->asked.size(), 1U);
+  EXPECT_EQ(provider->asked[0].url, item);
+  provider->asked[0].completion(/*error=*/{});
+  expectSuccess(*answers);
+  expectSuccess(*reader.end(accessID(1)));
+  EXPECT_TRUE(provider->told.empty());
 }
 
-struct FileCoordinationServicerTest : ::testing::Test {
-  void SetUp() override {
-    fileSystem.addDirectory("/a/storage");
-    coordinator._addDocuvend(provider);
-    caller.bytes[0] = 7;
-    client.connection->setAuditToken(caller);
-  }
+TEST_F(FileCoordinationServicerTest, AReadInNobodysDirectoryBeginsAtOnce) {
+  expectSuccess(*anybody().read(plain, accessID(1)));
+  EXPECT_TRUE(provider->asked.empty());
+}
 
-  const QXURL directory = QXURL::fileURL("/a/storage", QXURLKind::directory);
-  const QXURL file = directory.appendingPathComponent("x y.txt", QXURLKind::file);
-  fake_platform::FakeFileSystem fileSystem;
-  fake_platform::FakeSandbox sandbox;
-  LinuxFileCoordinator coordinator{fileSystem};
-  const std::shared_ptr<RecordingProvider> provider = std::make_shared<RecordingProvider>(directory);
-  QXAuditToken caller;
-  Client client{coordinator, sandbox};
-};
+TEST_F(FileCoordinationServicerTest, AProvidersErrorIsTheReadersAndItsIdentifierIsFreeAgain) {
+  const auto reader = anybody();
+  const auto answers = reader.read(item, accessID(1));
+  ASSERT_EQ(provider->asked.size(), 1U);
+  const QXError error = QXError::make("com.example", 12, "no network");
+  provider->asked[0].completion(error);
+  EXPECT_EQ(*answers, testing::Answers{error});
+  expectError(*reader.end(accessID(1)), FileCoordinationErrorCode::invalidAccessID);
+  expectSuccess(*reader.read(plain, accessID(1)));
+}
 
-TEST_F(FileCoordinationServicerTest, TellsTheProviderAndAnswersWithoutError) {
-  sandbox.setAnswer("/a/storage/x y.txt", fake_platform::FakeSandbox::kAllowed);
-  const auto answers = client.say(file);
-  ASSERT_EQ(answers.size(), 1U);
-  EXPECT_EQ(answers[0], std::nullopt);
+TEST_F(FileCoordinationServicerTest, AWriteBeginsAtOnceAndItsEndTellsTheProviderOnce) {
+  const auto writer = anybody();
+  expectSuccess(*writer.write(item, accessID(1)));
+  EXPECT_TRUE(provider->told.empty());
+  provider->onTold = [this] { EXPECT_EQ(provider->told.size(), 1U); };
+  expectSuccess(*writer.end(accessID(1)));
   ASSERT_EQ(provider->told.size(), 1U);
-  EXPECT_EQ(provider->told[0].first, "writer 4711-1");
-  EXPECT_EQ(provider->told[0].second, file);
-  const std::vector<fake_platform::FakeSandbox::Check> expected = {{caller, "file-write-data", "/a/storage/x y.txt"}};
-  EXPECT_EQ(sandbox.checks(), expected);
+  EXPECT_EQ(provider->told[0].second, item);
+  EXPECT_TRUE(provider->asked.empty());
 }
 
-TEST_F(FileCoordinationServicerTest, RefusesACallerWhoMayNotWriteTheFile) {
-  for (const QXURL& url : {file, QXURL::fileURL("/elsewhere/x.txt", QXURLKind::file)}) {
-    expectError(client.say(url), FileCoordinationErrorCode::notPermitted);
-  }
-  EXPECT_TRUE(provider->told.empty());
-  EXPECT_TRUE(fileSystem.calls().empty()) << "nobody asks about a file that the caller may not write";
-}
-
-TEST_F(FileCoordinationServicerTest, RefusesAFileOfNoProvider) {
-  sandbox.setAnswer(fake_platform::FakeSandbox::kAllowed);
-  expectError(client.say(QXURL::fileURL("/elsewhere/x.txt", QXURLKind::file)), FileCoordinationErrorCode::noProvider);
-  coordinator._removeDocuvend(provider);
-  expectError(client.say(file), FileCoordinationErrorCode::noProvider);
-  EXPECT_TRUE(provider->told.empty());
-}
-
-TEST_F(FileCoordinationServicerTest, LeavesTheDirectoryItselfToTheProvider) {
-  sandbox.setAnswer(fake_platform::FakeSandbox::kAllowed);
-  const auto answers = client.say(directory);
-  ASSERT_EQ(answers.size(), 1U);
-  EXPECT_EQ(answers[0], std::nullopt);
-  EXPECT_EQ(provider->told.size(), 1U);
+TEST_F(FileCoordinationServicerTest, WritersTakeTurns) {
+  const auto first = anybody();
+  const auto second = anybody();
+  expectSuccess(*first.write(plain, accessID(1)));
+  const auto answers = second.write(plain, accessID(1));
+  EXPECT_TRUE(answers->empty()) << "the same identifier on another connection is another access";
+  expectSuccess(*first.end(accessID(1)));
+  expectSuccess(*answers);
 }
 
 TEST_F(FileCoordinationServicerTest, RefusesAMissingURL) {
-  sandbox.setAnswer(fake_platform::FakeSandbox::kAllowed);
-  expectError(client.say(std::nullopt), FileCoordinationErrorCode::missingURL);
+  const auto caller = anybody();
+  expectError(*caller.read(std::nullopt, accessID(1)), FileCoordinationErrorCode::missingURL);
+  expectError(*caller.write(std::nullopt, accessID(1)), FileCoordinationErrorCode::missingURL);
+  expectError(*caller.didFinishWriting(std::nullopt), FileCoordinationErrorCode::missingURL);
+  expectError(caller.holders(std::nullopt).answers, FileCoordinationErrorCode::missingURL);
 }
 
-TEST_F(FileCoordinationServicerTest, IsNobodyOnceItsConnectionIsGone) {
-  sandbox.setAnswer(fake_platform::FakeSandbox::kAllowed);
-  FileCoordinationServicer servicer(coordinator, sandbox, /*connection=*/{});
-  std::optional<QXError> heard;
-  servicer.writerDidFinishWritingForURL(file, [&heard](std::optional<QXError> error) { heard = std::move(error); });
-  ASSERT_TRUE(heard);
-  EXPECT_EQ(heard->code, static_cast<std::int64_t>(FileCoordinationErrorCode::notPermitted));
-  servicer.writerDidFinishWritingForURL(file, /*completionHandler=*/{});
+TEST_F(FileCoordinationServicerTest, RefusesAMissingIdentifierBeforeItLooksAtTheFile) {
+  const auto caller = client(editor());
+  expectError(*caller.read(item, std::nullopt), FileCoordinationErrorCode::invalidAccessID);
+  expectError(*caller.write(item, std::nullopt), FileCoordinationErrorCode::invalidAccessID);
+  expectError(*caller.end(std::nullopt), FileCoordinationErrorCode::invalidAccessID);
+  expectError(caller.progress(std::nullopt).answers, FileCoordinationErrorCode::invalidAccessID);
+}
+
+// An application that may not reach a file is told the same of every such file, whatever is there.
+TEST_F(FileCoordinationServicerTest, SaysNothingOfAFileThatTheCallerCannotReach) {
+  const auto stranger = client(editor());
+  const auto holder = anybody();
+  expectSuccess(*holder.write(item, accessID(1)));
+  for (const std::string& path : {document, storage + "/none.txt", storage + "/none/none.txt", outside + "/secret.txt", storage}) {
+    const QXURL url = QXURL::fileURL(path, QXURLKind::file);
+    std::vector<testing::Answers> all = {*stranger.read(url, accessID(1)), stranger.holders(url).answers, *stranger.write(url, accessID(1)),
+                                         *stranger.didFinishWriting(url)};
+    for (const auto& answers : all) {
+      expectError(answers, FileCoordinationErrorCode::notPermitted);
+      EXPECT_EQ(answers[0]->url, url);
+      EXPECT_EQ(answers[0]->underlying, nullptr);
+    }
+    EXPECT_EQ(all[0][0]->texts.at("description"), "the caller may not read the file");
+    EXPECT_EQ(all[1], all[0]);
+    EXPECT_EQ(all[2][0]->texts.at("description"), "the caller may not write the file");
+  }
+  EXPECT_TRUE(provider->asked.empty());
   EXPECT_TRUE(provider->told.empty());
 }
 
-// The way of a confined editor's save, on the real file system.
-class SavedDocument : public testing::SandboxHouse {
- protected:
-  static Paths pathsWithHome(const std::string& home) {
-    Paths paths;
-    paths.home = home;
-    return paths;
+TEST_F(FileCoordinationServicerTest, AsksNobodyElseAboutAFileThatTheCallerCannotReach) {
+  fake_platform::FakeFileSystem watched;
+  watched.addDirectory(storage);
+  LinuxFileCoordinator watching(watched);
+  watching._addDocuvend(provider);
+  FileAccesses watchedAccesses(watching);
+  const FileCoordinationServicer::Surroundings around{watching, watchedAccesses, sandbox, peers};
+  const testing::CoordinationClient stranger(around, editor());
+  expectError(*stranger.read(item, accessID(1)), FileCoordinationErrorCode::notPermitted);
+  expectError(*stranger.write(item, accessID(1)), FileCoordinationErrorCode::notPermitted);
+  expectError(*stranger.didFinishWriting(item), FileCoordinationErrorCode::notPermitted);
+  EXPECT_TRUE(watched.calls().empty());
+  expectSuccess(*testing::CoordinationClient(around, unconfined()).didFinishWriting(item));
+  EXPECT_FALSE(watched.calls().empty());
+}
+
+TEST_F(FileCoordinationServicerTest, WhoMayReadOnlyDoesNotWrite) {
+  ASSERT_EQ(::chmod(plain.fileSystemPath().c_str(), 0400), 0);
+  const auto caller = anybody();
+  expectSuccess(*caller.read(plain, accessID(1)));
+  expectSuccess(*caller.end(accessID(1)));
+  expectError(*caller.write(plain, accessID(1)), FileCoordinationErrorCode::notPermitted);
+  ASSERT_EQ(::chmod(plain.fileSystemPath().c_str(), 0200), 0);
+  expectError(*caller.read(plain, accessID(1)), FileCoordinationErrorCode::notPermitted);
+  expectError(caller.holders(plain).answers, FileCoordinationErrorCode::notPermitted);
+  expectSuccess(*caller.write(plain, accessID(1)));
+}
+
+TEST_F(FileCoordinationServicerTest, ATokenForTheFileIsEnough) {
+  const auto caller = client(editor());
+  const std::string token = issued(document);
+  expectError(*caller.write(item, accessID(1)), FileCoordinationErrorCode::notPermitted);
+  expectError(*caller.write(item, accessID(1), issued(sibling)), FileCoordinationErrorCode::notPermitted);
+  expectSuccess(*caller.write(item, accessID(1), token));
+  expectSuccess(*caller.end(accessID(1)));
+  const auto reading = caller.read(item, accessID(1), token);
+  ASSERT_EQ(provider->asked.size(), 1U);
+  provider->asked[0].completion(/*error=*/{});
+  expectSuccess(*reading);
+  expectError(caller.holders(item).answers, FileCoordinationErrorCode::notPermitted);
+  expectSuccess(caller.holders(item, token).answers);
+  ASSERT_EQ(sandbox.invalidateReadWriteExtensions(std::nullopt), std::nullopt);
+  expectError(*caller.read(item, accessID(2), token), FileCoordinationErrorCode::notPermitted);
+}
+
+TEST_F(FileCoordinationServicerTest, TellsUnconfinedProcessesThatThereIsNoDirectory) {
+  const QXURL nowhere = QXURL::fileURL(outside + "/none/x.txt", QXURLKind::file);
+  const auto caller = anybody();
+  expectError(*caller.read(nowhere, accessID(1)), FileCoordinationErrorCode::noDirectory);
+  const auto answers = caller.write(nowhere, accessID(1));
+  expectError(*answers, FileCoordinationErrorCode::noDirectory);
+  EXPECT_EQ((*answers)[0]->url, nowhere);
+  ASSERT_TRUE((*answers)[0]->underlying);
+  EXPECT_EQ((*answers)[0]->underlying->code, ENOENT);
+  expectError(caller.holders(nowhere).answers, FileCoordinationErrorCode::noDirectory);
+  expectError(*caller.read(QXURL::fileURL("/", QXURLKind::directory), accessID(1)), FileCoordinationErrorCode::noDirectory);
+  expectSuccess(*caller.write(QXURL::fileURL(outside + "/new.txt", QXURLKind::file), accessID(1)));
+}
+
+TEST_F(FileCoordinationServicerTest, LooksForCyclesBetweenTheParties) {
+  for (const bool sameParty : {true, false}) {
+    const auto a = anybody();
+    const auto b = anybody();
+    expectSuccess(*a.write(plain, accessID(1), /*token=*/{}, /*party=*/7));
+    expectSuccess(*b.write(otherPlain, accessID(1)));
+    const auto waiting = a.write(otherPlain, accessID(2), /*token=*/{}, /*party=*/sameParty ? 7 : 8);
+    EXPECT_TRUE(waiting->empty());
+    const auto last = b.write(plain, accessID(2), /*token=*/{}, /*party=*/0);
+    if (sameParty) {
+      expectError(*last, FileCoordinationErrorCode::wouldDeadlock);
+    } else {
+      EXPECT_TRUE(last->empty());
+    }
+    a.connection->close();
+    b.connection->close();
   }
-  std::string issued(const std::string& path) { return sandbox.issueReadWriteExtension(path).value_or(""); }
+}
 
-  LinuxSandbox sandbox{loadedSession(), bundles, peers};
-  LinuxFileSystem fileSystem{pathsWithHome(home)};
-  LinuxFileCoordinator coordinator{fileSystem};
-};
+TEST_F(FileCoordinationServicerTest, AnswersNobodyWhoWantsNoAnswer) {
+  const auto caller = anybody();
+  caller.remote().call<&QXFileCoordination::coordinateWritingItemAtURL>(item, std::nullopt, accessID(1), std::nullopt, nullptr);
+  caller.remote().call<&QXFileCoordination::coordinateReadingItemAtURL>(std::nullopt, std::nullopt, accessID(1), std::nullopt, nullptr);
+  caller.remote().call<&QXFileCoordination::progressOfAccess>(accessID(1), nullptr);
+  caller.remote().call<&QXFileCoordination::holdersOfItemAtURL>(item, std::nullopt, nullptr);
+  caller.remote().call<&QXFileCoordination::endAccess>(accessID(1), nullptr);
+  EXPECT_EQ(provider->told.size(), 1U);
+  caller.remote().call<&QXFileCoordination::writerDidFinishWritingForURL>(item, nullptr);
+  EXPECT_EQ(provider->told.size(), 2U);
+}
 
-TEST_F(SavedDocument, IsAnnouncedByTheOneWhoReplacedItAndByNoOther) {
-  const auto provider = std::make_shared<RecordingProvider>(QXURL::fileURL(storage, QXURLKind::directory));
-  coordinator._addDocuvend(provider);
-  const QXAuditToken editor = peers.add(confined("com.example.editor", "1"));
-  Client saver(coordinator, sandbox);
-  saver.connection->setAuditToken(editor);
-  Client stranger(coordinator, sandbox);
-  stranger.connection->setAuditToken(peers.add(confined("com.example.editor", "2")));
-  const QXURL url = QXURL::fileURL(document, QXURLKind::file);
-
-  expectError(saver.say(url), FileCoordinationErrorCode::notPermitted);
-  ASSERT_TRUE(std::holds_alternative<UniqueDescriptor>(sandbox.redeem(editor, issued(sibling), TokenUse::writing)));
-  ASSERT_EQ(sandbox.replaceItem(editor, issued(document), issued(sibling)), std::nullopt);
-  expectError(stranger.say(url), FileCoordinationErrorCode::notPermitted);
-  const auto answers = saver.say(url);
-  ASSERT_EQ(answers.size(), 1U);
-  EXPECT_EQ(answers[0], std::nullopt);
-  ASSERT_EQ(provider->told.size(), 1U);
-  EXPECT_EQ(provider->told[0].second, url);
+TEST_F(FileCoordinationServicerTest, IsNobodyOnceItsConnectionIsGone) {
+  FileCoordinationServicer servicer(surroundings, /*connection=*/{});
+  testing::Answers heard;
+  const auto hear = [&heard](std::optional<QXError> error) { heard.push_back(std::move(error)); };
+  servicer.writerDidFinishWritingForURL(plain, hear);
+  expectError(heard, FileCoordinationErrorCode::notPermitted);
+  heard.clear();
+  servicer.coordinateReadingItemAtURL(plain, /*token=*/{}, accessID(1), /*party=*/{}, hear);
+  expectError(heard, FileCoordinationErrorCode::notPermitted);
 }
 
 }  // namespace

@@ -3,22 +3,20 @@
 
 #include <memory>
 
-#include "platform/linux/coordination/LinuxFileCoordinator.h"
+#include "platform/linux/coordination/FileCoordinationServicer.h"
 #include "platform/rpc.h"
-#include "platform/sandbox.h"
 
 namespace docuvend::linux_platform {
 
 class FileCoordinationListenerDelegate final : public QXRpcListenerDelegate {
  public:
-  // Both outlive every connection.
-  FileCoordinationListenerDelegate(LinuxFileCoordinator& coordinator, QXSandbox& sandbox) : coordinator_(coordinator), sandbox_(sandbox) {}
+  // What is around outlives every connection.
+  explicit FileCoordinationListenerDelegate(const FileCoordinationServicer::Surroundings& surroundings) : surroundings_(surroundings) {}
 
   bool listener(QXRpcListener& listener, const std::shared_ptr<QXRpcConnection>& shouldAcceptNewConnection) override;
 
  private:
-  LinuxFileCoordinator& coordinator_;
-  QXSandbox& sandbox_;
+  const FileCoordinationServicer::Surroundings surroundings_;
 };
 
 }  // namespace docuvend::linux_platform

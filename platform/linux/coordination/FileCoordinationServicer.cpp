@@ -1,36 +1,161 @@
 #include "platform/linux/coordination/FileCoordinationServicer.h"
 
+#include <cerrno>
+#include <string>
+#include <utility>
+#include <variant>
+#include <vector>
+
 #include "platform/linux/coordination/CoordinationErrors.h"
+#include "platform/sandbox.h"
 
 namespace docuvend::linux_platform {
 namespace {
 
-void answer(const FileCoordinationServicer::ErrorReply& completionHandler, std::optional<QXError> error) {
-  if (completionHandler) completionHandler(std::move(error));
+using ErrorReply = QXFileCoordination::ErrorReply;
+
+// A reply that may be called whether or not one is wanted.
+ErrorReply always(ErrorReply completionHandler) {
+  if (completionHandler) return completionHandler;
+  return [](const std::optional<QXError>&) {};
+}
+
+std::string_view operationOf(AccessKind kind) { return kind == AccessKind::reading ? kQXSandboxFileReadData : kQXSandboxFileWriteData; }
+
+QXError noDirectory(const QXURL& url, const QXError& reason) {
+  QXError error = makeCoordinationError(FileCoordinationErrorCode::noDirectory, "the file's directory does not exist", url);
+  error.underlying = std::make_shared<const QXError>(reason);
+  return error;
+}
+
+QXError notPermitted(AccessKind kind, const QXURL& url) {
+  const char* description = kind == AccessKind::reading ? "the caller may not read the file" : "the caller may not write the file";
+  return makeCoordinationError(FileCoordinationErrorCode::notPermitted, description, url);
+}
+
+// Of what is not there only an unconfined process is told: it could look for itself.
+QXError unreachable(AccessKind kind, const QXURL& url, const PeerIdentity* caller) {
+  if (caller == nullptr || caller->standing != Standing::unconfined) return notPermitted(kind, url);
+  const auto key = FileKey::of(url);
+  const auto* reason = std::get_if<QXError>(&key);
+  return reason != nullptr && reason->code == ENOENT ? noDirectory(url, *reason) : notPermitted(kind, url);
+}
+
+const char* nameOf(AccessKind kind) { return kind == AccessKind::reading ? "reading" : "writing"; }
+
+const char* nameOf(AccessState state) {
+  switch (state) {
+    case AccessState::waiting:
+      return "waiting";
+    case AccessState::providing:
+      return "providing";
+    case AccessState::holding:
+      return "holding";
+  }
+  return "";
+}
+
+// The caller is the provider's own process.
+bool isExempt(const PeerIdentity& caller, const std::shared_ptr<QXDocuvend>& provider) {
+  return provider && caller.bundleIdentifier && caller.bundleIdentifier == provider->_fileReactorID();
+}
+
+// What the caller may know of an access.
+QXDictionary described(const KnownAccess& known, const PeerIdentity& caller) {
+  QXDictionary holder;
+  holder["kind"] = nameOf(known.access.kind);
+  holder["state"] = nameOf(known.state);
+  holder["own"] = known.access.party.process == caller.token;
+  if (caller.standing != Standing::unconfined) return holder;
+  holder["processIdentifier"] = known.access.holder.processIdentifier;
+  if (known.access.holder.bundleIdentifier) holder["bundleIdentifier"] = *known.access.holder.bundleIdentifier;
+  return holder;
 }
 
 }  // namespace
 
-void FileCoordinationServicer::writerDidFinishWritingForURL(std::optional<QXURL> url, ErrorReply completionHandler) {
-  if (!url) {
-    answer(completionHandler, makeCoordinationError(FileCoordinationErrorCode::missingURL, "the URL is missing", /*url=*/{}));
-    return;
+void FileCoordinationServicer::coordinateReadingItemAtURL(std::optional<QXURL> url, std::optional<QXData> token,
+                                                          std::optional<QXUUID> accessID, std::optional<std::int64_t> party,
+                                                          ErrorReply completionHandler) {
+  coordinate(AccessKind::reading, {std::move(url), std::move(token), accessID, party}, always(std::move(completionHandler)));
+}
+
+void FileCoordinationServicer::coordinateWritingItemAtURL(std::optional<QXURL> url, std::optional<QXData> token,
+                                                          std::optional<QXUUID> accessID, std::optional<std::int64_t> party,
+                                                          ErrorReply completionHandler) {
+  coordinate(AccessKind::writing, {std::move(url), std::move(token), accessID, party}, always(std::move(completionHandler)));
+}
+
+void FileCoordinationServicer::coordinate(AccessKind kind, const Request& request, ErrorReply completionHandler) {
+  if (auto refusal = session_->refusalOf(request.accessID)) return completionHandler(std::move(refusal));
+  const auto admission = admit(kind, request.url, request.token);
+  if (const auto* refusal = std::get_if<QXError>(&admission)) return completionHandler(*refusal);
+  const PeerIdentity& caller = *std::get<std::shared_ptr<const PeerIdentity>>(admission);
+  auto key = FileKey::of(*request.url);
+  if (const auto* reason = std::get_if<QXError>(&key)) return completionHandler(noDirectory(*request.url, *reason));
+  if (isExempt(caller, surroundings_.coordinator.providerOf(*request.url))) {
+    session_->beginExempt(*request.accessID);
+    return completionHandler(/*error=*/{});
   }
+  FileAccess access{std::get<FileKey>(std::move(key)), *request.url, kind, AccessParty{caller.token, request.party.value_or(0)},
+                    AccessHolder{caller.pid, caller.bundleIdentifier}};
+  session_->begin(*request.accessID, std::move(access), std::move(completionHandler));
+}
+
+void FileCoordinationServicer::endAccess(std::optional<QXUUID> accessID, ErrorReply completionHandler) {
+  session_->end(accessID, always(std::move(completionHandler)));
+}
+
+void FileCoordinationServicer::progressOfAccess(std::optional<QXUUID> accessID, ProgressReply completionHandler) {
+  if (!completionHandler) return;
+  auto progress = session_->progressOf(accessID);
+  if (auto* error = std::get_if<QXError>(&progress)) return completionHandler(std::move(*error), /*bytesPresent=*/{}, /*size=*/{});
+  const auto& bytes = std::get<std::optional<BytesPresent>>(progress);
+  if (!bytes) return completionHandler(/*error=*/{}, /*bytesPresent=*/{}, /*size=*/{});
+  completionHandler(/*error=*/{}, bytes->present, bytes->size);
+}
+
+void FileCoordinationServicer::holdersOfItemAtURL(std::optional<QXURL> url, std::optional<QXData> token, HoldersReply completionHandler) {
+  if (!completionHandler) return;
+  const auto admission = admit(AccessKind::reading, url, token);
+  if (const auto* refusal = std::get_if<QXError>(&admission)) return completionHandler(*refusal, /*holders=*/{});
+  const PeerIdentity& caller = *std::get<std::shared_ptr<const PeerIdentity>>(admission);
+  const auto key = FileKey::of(*url);
+  if (const auto* reason = std::get_if<QXError>(&key)) return completionHandler(noDirectory(*url, *reason), /*holders=*/{});
+  QXArray holders;
+  for (const KnownAccess& known : surroundings_.accesses.of(std::get<FileKey>(key))) {
+    if (holders.size() == kMaximumHoldersNamed) break;
+    holders.emplace_back(described(known, caller));
+  }
+  completionHandler(/*error=*/{}, std::move(holders));
+}
+
+void FileCoordinationServicer::writerDidFinishWritingForURL(std::optional<QXURL> url, ErrorReply completionHandler) {
+  completionHandler = always(std::move(completionHandler));
+  const auto admission = admit(AccessKind::writing, url, /*token=*/{});
+  if (const auto* refusal = std::get_if<QXError>(&admission)) return completionHandler(*refusal);
+  const PeerIdentity& caller = *std::get<std::shared_ptr<const PeerIdentity>>(admission);
+  const auto key = FileKey::of(*url);
+  const auto* file = std::get_if<FileKey>(&key);
+  if (file != nullptr && surroundings_.accesses.isWriting(caller.token, *file)) return completionHandler(/*error=*/{});
+  const auto provider = surroundings_.coordinator.providerOf(*url);
+  if (!provider) {
+    return completionHandler(makeCoordinationError(FileCoordinationErrorCode::noProvider, "the file belongs to no provider", url));
+  }
+  if (isExempt(caller, provider)) return completionHandler(/*error=*/{});
+  surroundings_.coordinator.tellFinishedWriting(provider, caller.pid, *url,
+                                                [completionHandler = std::move(completionHandler)] { completionHandler(/*error=*/{}); });
+}
+
+std::variant<std::shared_ptr<const PeerIdentity>, QXError> FileCoordinationServicer::admit(AccessKind kind, const std::optional<QXURL>& url,
+                                                                                           const std::optional<QXData>& token) const {
+  if (!url) return makeCoordinationError(FileCoordinationErrorCode::missingURL, "the URL is missing", /*url=*/{});
   const auto connection = connection_.lock();
   const QXAuditToken caller = connection ? connection->auditToken() : QXAuditToken{};
-  // First of all: whoever may not write the file learns nothing about it.
-  if (sandbox_.checkWithoutReport(caller, kQXSandboxFileWriteData, url->fileSystemPath()) != 0) {
-    answer(completionHandler, makeCoordinationError(FileCoordinationErrorCode::notPermitted, "the caller may not write the file", url));
-    return;
-  }
-  const auto provider = coordinator_.providerOf(*url);
-  if (!provider) {
-    answer(completionHandler, makeCoordinationError(FileCoordinationErrorCode::noProvider, "the file belongs to no provider", url));
-    return;
-  }
-  const int process = connection ? connection->processIdentifier() : 0;
-  coordinator_.tellFinishedWriting(provider, process, *url,
-                                   [completionHandler = std::move(completionHandler)] { answer(completionHandler, /*error=*/{}); });
+  const auto text = token ? std::optional(token->text()) : std::nullopt;
+  auto peer = surroundings_.peers.find(caller);
+  if (peer && surroundings_.sandbox.mayReach(caller, operationOf(kind), url->fileSystemPath(), text)) return peer;
+  return unreachable(kind, *url, peer.get());
 }
 
 }  // namespace docuvend::linux_platform

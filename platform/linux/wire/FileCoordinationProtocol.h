@@ -63,7 +63,8 @@ class QXFileCoordination {
   virtual void endAccess(std::optional<QXUUID> accessID, ErrorReply completionHandler) = 0;
   // How much of the file is present while an access waits for the file's provider, in bytes; both absent at any other time.
   virtual void progressOfAccess(std::optional<QXUUID> accessID, ProgressReply completionHandler) = 0;
-  // Who accesses the file: those who have the file, then those who wait for it, in their order. Each a dictionary with the strings "kind"
+  // Who accesses the file: those who have the file, then those who wait for it, in their order, 1024 at most. Each a dictionary with the
+  // strings "kind"
   // ("reading" or "writing") and "state" ("holding", "providing" or "waiting") and the boolean "own" (the caller's process); for an
   // unconfined caller also the integer "processIdentifier" and, where there is one, the string "bundleIdentifier". For callers that can
   // read the file, or bring a token for it.
