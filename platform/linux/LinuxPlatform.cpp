@@ -3,6 +3,7 @@
 #include <fcntl.h>
 #include <sys/file.h>
 #include <sys/prctl.h>
+#include <sys/resource.h>
 #include <unistd.h>
 
 #include <algorithm>
@@ -65,6 +66,15 @@ std::variant<UniqueDescriptor, QXError> takePlatformLock(const Paths& paths) {
   return file;
 }
 
+// Every connection takes descriptors, and a login gives a process far fewer than it may have. Nothing here puts them into sets of a fixed
+// size, which is what the low number is for; an extension's own limit is set where it is launched.
+void takeAllDescriptors() {
+  rlimit limit{};
+  if (::getrlimit(RLIMIT_NOFILE, &limit) != 0) return;
+  limit.rlim_cur = limit.rlim_max;
+  static_cast<void>(::setrlimit(RLIMIT_NOFILE, &limit));  // with fewer, clients are refused sooner
+}
+
 }  // namespace
 
 struct LinuxPlatform::Services {
@@ -125,6 +135,7 @@ struct LinuxPlatform::Services {
 std::variant<std::unique_ptr<LinuxPlatform>, QXError> LinuxPlatform::create() {
   if (::geteuid() == 0) return QXError::system(EPERM, "a sandbox made by root keeps too much; run as an ordinary user");
   if (::prctl(PR_SET_NO_NEW_PRIVS, 1, 0, 0, 0) != 0) return QXError::system(errno, "cannot give up new privileges");
+  takeAllDescriptors();
   auto found = Paths::fromEnvironment();
   if (auto* error = std::get_if<QXError>(&found)) return *error;
   auto& paths = std::get<Paths>(found);

@@ -357,6 +357,26 @@ TEST_F(LinuxRpcServiceTest, APassedSocketServesItsName) {
   }
 }
 
+TEST_F(LinuxRpcServiceTest, UnconfinedProcessesHaveALimitOfTheirOwn) {
+  rlimit descriptors{};
+  ASSERT_EQ(::getrlimit(RLIMIT_NOFILE, &descriptors), 0);
+  descriptors.rlim_cur = descriptors.rlim_max;
+  ASSERT_EQ(::setrlimit(RLIMIT_NOFILE, &descriptors), 0);
+  ASSERT_GT(descriptors.rlim_cur, 3 * kMaximumUnconfinedConnections) << "both ends and the peers' own are of this process";
+  serve();
+  driver.peers.setNextPeer(Standing::unconfined, std::nullopt, {});
+  std::vector<LinuxDriver::Client> clients;
+  for (std::size_t i = 0; i < kMaximumUnconfinedConnections; ++i) clients.push_back(driver.connect());
+  ASSERT_TRUE(roundTrip(clients.back()));
+  const auto refused = driver.connect({}, [this](const QXError& reason) { closed.put(reason); });
+  EXPECT_THAT(closed.take(), IsRpcError(QXRpcErrorCode::refused));
+  EXPECT_THAT(driver.log.texts(),
+              testing::ElementsAre("[NOTICE] Refusing a connection of PID " + std::to_string(::getpid()) +
+                                   ": unconfined processes may not open more than " + std::to_string(kMaximumUnconfinedConnections) + "."));
+  driver.peers.setNextPeer(Standing::nobody, std::nullopt, {});
+  EXPECT_TRUE(roundTrip(driver.connect())) << "others are counted by themselves";
+}
+
 // --- A service for unconfined peers alone
 
 class UnconfinedServiceTest : public LinuxRpcServiceTest {

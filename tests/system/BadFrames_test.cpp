@@ -3,6 +3,7 @@
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
 #include <poll.h>
+#include <sys/resource.h>
 #include <sys/socket.h>
 #include <sys/time.h>
 #include <unistd.h>
@@ -273,10 +274,14 @@ TEST_F(BadFrames, APeerThatSaysNothingHoldsNobodyUp) {
   for (int i = 0; i < 3; ++i) EXPECT_TRUE(house_.answers());
 }
 
-TEST_F(BadFrames, ThreeHundredConnectionsAreLimitedWithOneLineAndLaterOnesServed) {
-  constexpr int kConnections = 300;
+TEST_F(BadFrames, AFloodOfConnectionsIsLimitedWithOneLineAndLaterOnesAreServed) {
+  constexpr int kConnections = 1200;
   // One that the house keeps is among those that are counted.
-  constexpr int kAdmitted = 63;
+  constexpr int kAdmitted = 1023;
+  rlimit descriptors{};
+  ASSERT_EQ(::getrlimit(RLIMIT_NOFILE, &descriptors), 0);
+  descriptors.rlim_cur = descriptors.rlim_max;
+  ASSERT_EQ(::setrlimit(RLIMIT_NOFILE, &descriptors), 0);
   std::vector<RawPeer> peers;
   for (int i = 0; i < kConnections; ++i) peers.push_back(connect());
   int admitted = 0;
@@ -297,7 +302,7 @@ TEST_F(BadFrames, ThreeHundredConnectionsAreLimitedWithOneLineAndLaterOnesServed
   EXPECT_EQ(admitted, kAdmitted);
   EXPECT_EQ(refused, kConnections - kAdmitted);
   const std::string line =
-      "[NOTICE] Refusing a connection of PID " + std::to_string(::getpid()) + ": unconfined processes may not open more than 64.";
+      "[NOTICE] Refusing a connection of PID " + std::to_string(::getpid()) + ": unconfined processes may not open more than 1024.";
   EXPECT_EQ(house_.logged(line), 1);
   // A confined application has a number of its own.
   EXPECT_NE(house_.confined(kEditor, {"show", "docuvend:p/i"}).errors.find("not permitted"), std::string::npos);

@@ -180,6 +180,8 @@ TEST_F(ProtocolPageTest, GivesTheLimits) {
       {"requests of one direction that wait for a reply", std::to_string(kMaximumPendingCalls) + "; one more fails with error 5"},
       {"bytes written for a peer that it does not read", std::to_string(kMaximumOutputBytes) + "; then the connection ends"},
       {"connections of one bundle to the daemon", std::to_string(kMaximumConnectionsPerPeer) + "; one more is ended with error 9"},
+      {"connections of all unconfined processes together",
+       std::to_string(kMaximumUnconfinedConnections) + "; one more is ended with error 9"},
       {"accesses of one connection to `com.orvane.FileCoordination`",
        std::to_string(AccessSession::kMaximumAccesses) + "; one more is refused"}};
   for (const auto& limit : limits) EXPECT_EQ(row("Limits", limit.first), (std::vector{limit.first, limit.second}));

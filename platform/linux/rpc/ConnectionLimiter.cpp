@@ -4,11 +4,11 @@
 
 namespace docuvend::linux_platform {
 
-ConnectionLimiter::Admission ConnectionLimiter::admit(const std::string& peer) {
+ConnectionLimiter::Admission ConnectionLimiter::admit(const std::string& peer, std::size_t limit) {
   {
     const std::lock_guard lock(mutex_);
     Count& count = counts_[peer];
-    if (count.open >= kMaximumConnectionsPerPeer) {
+    if (count.open >= limit) {
       return {std::exchange(count.refusing, true) ? Verdict::refusedAgain : Verdict::refused, nullptr};
     }
     ++count.open;

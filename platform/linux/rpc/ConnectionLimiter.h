@@ -10,6 +10,8 @@
 namespace docuvend::linux_platform {
 
 inline constexpr std::size_t kMaximumConnectionsPerPeer = 64;
+// All unconfined processes are counted as one peer. They are trusted, and there may be hundreds of them at work.
+inline constexpr std::size_t kMaximumUnconfinedConnections = 1024;
 
 class ConnectionLimiter : public std::enable_shared_from_this<ConnectionLimiter> {
  public:
@@ -36,8 +38,8 @@ class ConnectionLimiter : public std::enable_shared_from_this<ConnectionLimiter>
     Verdict verdict;
     std::unique_ptr<Place> place;  // when admitted
   };
-  // `peer` is what connections are counted by.
-  [[nodiscard]] Admission admit(const std::string& peer);
+  // `peer` is what connections are counted by; a peer has one limit.
+  [[nodiscard]] Admission admit(const std::string& peer, std::size_t limit);
 
   // Of all peers together.
   [[nodiscard]] std::size_t openConnections() const;

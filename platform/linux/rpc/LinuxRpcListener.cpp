@@ -29,6 +29,10 @@ std::string countedAs(const PeerIdentity& peer) {
   return "unconfined processes";
 }
 
+std::size_t limitFor(const PeerIdentity& peer) {
+  return peer.standing == Standing::unconfined ? kMaximumUnconfinedConnections : kMaximumConnectionsPerPeer;
+}
+
 }  // namespace
 
 LinuxRpcListener::LinuxRpcListener(Surroundings surroundings, Service service, std::unique_ptr<BoundSocket> socket)
@@ -114,11 +118,12 @@ void LinuxRpcListener::admit(UniqueDescriptor socket) {
   }
   const std::string counted = countedAs(*peer);
   const int process = peer->pid;
-  auto [verdict, place] = surroundings_.limiter->admit(counted);
+  const std::size_t limit = limitFor(*peer);
+  auto [verdict, place] = surroundings_.limiter->admit(counted, limit);
   if (verdict != ConnectionLimiter::Verdict::admitted) {
     if (verdict == ConnectionLimiter::Verdict::refused) {
       surroundings_.log.write(QXLogType::defaultType, "[NOTICE] Refusing a connection of PID " + std::to_string(process) + ": " + counted +
-                                                          " may not open more than " + std::to_string(kMaximumConnectionsPerPeer) + ".");
+                                                          " may not open more than " + std::to_string(limit) + ".");
     }
     refuse(std::move(socket), "too many connections");
     return;
