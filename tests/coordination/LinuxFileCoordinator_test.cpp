@@ -3,6 +3,9 @@
 #include <gtest/gtest.h>
 
 #include <memory>
+#include <optional>
+#include <utility>
+#include <vector>
 
 #include "platform/fake/FakeFileSystem.h"
 #include "platform/fake/FakeQueues.h"
@@ -40,6 +43,17 @@ TEST_F(LinuxFileCoordinatorTest, FindsTheObjectWhoseDirectoryContainsTheFile) {
 TEST_F(LinuxFileCoordinatorTest, TakesTheDirectoryItselfForItsObjects) {
   const auto provider = added("/a/storage");
   EXPECT_EQ(coordinator.providerOf(directoryURL("/a/storage")), provider);
+}
+
+TEST_F(LinuxFileCoordinatorTest, DoesNotTakeTheDirectoryItselfWhereThatDoesNotCount) {
+  const auto above = added("/a");
+  const auto provider = added("/a/storage");
+  using DirectoryItself = LinuxFileCoordinator::DirectoryItself;
+  EXPECT_EQ(coordinator.providerOf(directoryURL("/a"), DirectoryItself::doesNotCount), nullptr);
+  EXPECT_EQ(coordinator.providerOf(directoryURL("/a/storage"), DirectoryItself::doesNotCount), above);
+  coordinator._removeDocuvend(above);
+  EXPECT_EQ(coordinator.providerOf(directoryURL("/a/storage"), DirectoryItself::doesNotCount), nullptr);
+  EXPECT_EQ(coordinator.providerOf(fileURL("/a/storage/x.txt"), DirectoryItself::doesNotCount), provider);
 }
 
 TEST_F(LinuxFileCoordinatorTest, PassesOverObjectsWithoutADirectoryAndDirectoriesThatAreNotThere) {
@@ -84,6 +98,29 @@ TEST_F(LinuxFileCoordinatorTest, TellsAnObjectOnItsOwnQueue) {
   queues.runAll();
   EXPECT_EQ(provider->told.size(), 1U);
   EXPECT_TRUE(told);
+}
+
+TEST_F(LinuxFileCoordinatorTest, AsksAnObjectOnItsOwnQueueAndNamesEveryReaderAnew) {
+  fake_platform::FakeQueues queues;
+  const auto provider = std::make_shared<RecordingProvider>(directoryURL("/a"), queues.operationQueue());
+  std::vector<std::optional<QXError>> answers;
+  const auto completion = [&answers](std::optional<QXError> error) { answers.push_back(std::move(error)); };
+  coordinator.askToProvide(provider, 42, fileURL("/a/x.txt"), completion);
+  coordinator.askToProvide(provider, 42, fileURL("/a/x.txt"), completion);
+  EXPECT_TRUE(provider->asked.empty());
+  queues.runAll();
+  ASSERT_EQ(provider->asked.size(), 2U);
+  EXPECT_EQ(provider->asked[0].reader, "reader 42-1");
+  EXPECT_EQ(provider->asked[1].reader, "reader 42-2");
+  EXPECT_EQ(provider->asked[1].url, fileURL("/a/x.txt"));
+  provider->asked[0].completion(/*error=*/{});
+  EXPECT_EQ(answers, std::vector<std::optional<QXError>>{std::nullopt});
+}
+
+TEST_F(LinuxFileCoordinatorTest, AsksAnObjectWithoutAQueueAtOnce) {
+  const auto provider = added("/a/storage");
+  coordinator.askToProvide(provider, 42, fileURL("/a/storage/x.txt"), /*completion=*/{});
+  EXPECT_EQ(provider->asked.size(), 1U);
 }
 
 TEST_F(LinuxFileCoordinatorTest, HoldsNoLockWhileAnObjectIsTold) {
