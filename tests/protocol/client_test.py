@@ -10,7 +10,9 @@ import functools
 import multiprocessing
 import os
 import struct
+import time
 import unittest
+import uuid
 
 from docuvend_connection import (INVALID_ARGUMENTS, MALFORMED_FRAME, REFUSED, RPC_ERRORS, UNKNOWN_OPERATION, UNSUPPORTED_VERSION, Connection,
                                  Ended, connect, open_socket)
@@ -31,6 +33,8 @@ ERRORS = "DVErrorDomain"
 LACKS_ENTITLEMENT, NOT_PERMITTED, BAD_STRING, BAD_PARAMETER, NOT_FOUND, NOT_FOUND_URL, PROVIDER_FAILED, NOT_REACHED, NO_TOKEN = range(1, 10)
 SANDBOX_ERRORS = "QXSandboxErrorDomain"
 BAD_TOKEN, NOT_SIBLINGS = 1, 6
+COORDINATION_ERRORS = "QXFileCoordinationErrorDomain"
+MISSING_URL, MAY_NOT, NO_PROVIDER, INVALID_ACCESS, WOULD_DEADLOCK, ENDED_ACCESS, TOO_MANY_ACCESSES, NO_DIRECTORY = range(1, 9)
 
 PROVIDER = os.environ["TEST_PROVIDER"]
 DOCUMENT = URL.of_path(os.environ["TEST_DOCUMENT"])
@@ -52,6 +56,11 @@ STATUS = "statusCompletionHandler:"
 GRANTS = "grantsOfProviderID:toConsumerID:startingAt:completionHandler:"
 REVOKE = "revokeItemID:fromProviderID:toConsumerID:completionHandler:"
 UNLOCK = "announceFirstUnlockCompletionHandler:"
+READ = "coordinateReadingItemAtURL:token:accessID:party:completionHandler:"
+WRITE = "coordinateWritingItemAtURL:token:accessID:party:completionHandler:"
+END_ACCESS = "endAccess:completionHandler:"
+PROGRESS = "progressOfAccess:completionHandler:"
+HOLDERS = "holdersOfItemAtURL:token:completionHandler:"
 FINISHED_WRITING = "writerDidFinishWritingForURL:completionHandler:"
 
 
@@ -178,6 +187,138 @@ class Saving(ClientTest):
         self.assertEqual(original(), b"written in Python\n")
 
 
+def write_in_turn(url, line):
+    """Adds a line to the file, alone with it. What the waiting for it said."""
+    access = uuid.uuid4()
+    with connect(COORDINATION) as coordination:
+        error, = coordination.call(WRITE, url, None, access, None)
+        if error is None:
+            with open(url.path, "ab") as file:
+                file.write(line)
+            error, = coordination.call(END_ACCESS, access)
+        return error
+
+
+def await_holders(coordination, url, states):
+    """Waits until the file has accesses in these states, and no other."""
+    deadline = time.monotonic() + PATIENCE
+    while (known := [holder["state"] for holder in coordination.call(HOLDERS, url, None)[1]]) != states:
+        if time.monotonic() > deadline:
+            raise TimeoutError(f"{known} is never {states}")
+        time.sleep(0.002)
+
+
+def write_crosswise(mine, others):
+    """Has the one file, waits until somebody waits for it, and asks for the other. What that said."""
+    access = uuid.uuid4()
+    with connect(COORDINATION) as coordination:
+        coordination.call(WRITE, mine, None, access, None)
+        await_holders(coordination, mine, ["holding", "waiting"])
+        error, = coordination.call(WRITE, others, None, uuid.uuid4(), None)
+        coordination.call(END_ACCESS, access)
+        return error
+
+
+def end_the_wait(url):
+    """Asks to write the file, and ends that while it waits. What the request was answered."""
+    access = uuid.uuid4()
+    with connect(COORDINATION) as coordination:
+        request = coordination.start(WRITE, url, None, access, None)
+        await_holders(coordination, url, ["holding", "waiting"])
+        coordination.call(END_ACCESS, access)
+        error, = request.result(PATIENCE)
+        return error
+
+
+class Coordination(ClientTest):
+    def setUp(self):
+        with open(NOBODYS.path, "ab"):
+            pass
+
+    def begin(self, coordination, operation, url, token=None):
+        access = uuid.uuid4()
+        self.assertEqual(coordination.call(operation, url, token, access, None), [None])
+        return access
+
+    def text(self):
+        with open(DOCUMENT.path, "rb") as file:
+            return file.read()
+
+    def assert_saved(self, text):
+        """The provider has saved that. What it is asked after it was told comes after it."""
+        self.ask(EDITOR, STOP, DOCUMENT, PROVIDER, EDITOR)
+        self.assertEqual(original(), text)
+
+    def test_a_read_brings_the_contents(self):
+        self.ask(EDITOR, STOP, DOCUMENT, PROVIDER, EDITOR)
+        self.assertEqual(os.stat(DOCUMENT.path).st_blocks, 0)
+        with connect(COORDINATION) as coordination:
+            access = self.begin(coordination, READ, DOCUMENT)
+            self.assertEqual(self.text(), original())
+            self.assertEqual(coordination.call(PROGRESS, access), [None, None, None])
+            error, holders = coordination.call(HOLDERS, DOCUMENT, None)
+            self.assertIsNone(error)
+            self.assertEqual(holders, [{"kind": "reading", "state": "holding", "own": True, "processIdentifier": os.getpid()}])
+            self.assertEqual(coordination.call(END_ACCESS, access), [None])
+            self.assertEqual(coordination.call(HOLDERS, DOCUMENT, None), [None, []])
+
+    def test_writers_take_turns(self):
+        before = original()
+        with connect(COORDINATION) as coordination:
+            access = self.begin(coordination, READ, DOCUMENT)
+            coordination.call(END_ACCESS, access)
+            access = self.begin(coordination, WRITE, DOCUMENT)
+            other = actor(EDITOR).submit(write_in_turn, DOCUMENT, b"second\n")
+            await_holders(coordination, DOCUMENT, ["holding", "waiting"])
+            with open(DOCUMENT.path, "ab") as file:
+                file.write(b"first\n")
+            self.assertEqual(coordination.call(END_ACCESS, access), [None])
+            self.assertIsNone(other.result(PATIENCE))
+        self.assert_saved(before + b"first\nsecond\n")
+
+    def test_a_writer_that_leaves_is_told_of(self):
+        with connect(COORDINATION) as coordination:
+            self.begin(coordination, WRITE, DOCUMENT)
+            with open(DOCUMENT.path, "wb") as file:
+                file.write(b"left behind\n")
+        # A writer of another process has its turn when that one's end has been told.
+        self.assertIsNone(actor(EDITOR).submit(write_in_turn, DOCUMENT, b"and more\n").result(PATIENCE))
+        self.assert_saved(b"left behind\nand more\n")
+
+    def test_who_waits_crosswise_hears_of_it(self):
+        with connect(COORDINATION) as coordination:
+            mine = self.begin(coordination, WRITE, NOBODYS)
+            other = actor(EDITOR).submit(write_crosswise, DOCUMENT, NOBODYS)
+            await_holders(coordination, DOCUMENT, ["holding"])
+            self.assertEqual(coordination.call(WRITE, DOCUMENT, None, uuid.uuid4(), None), [None])
+            self.assert_error(other.result(PATIENCE), COORDINATION_ERRORS, WOULD_DEADLOCK)
+            self.assertEqual(coordination.call(END_ACCESS, mine), [None])
+
+    def test_a_wait_can_be_ended(self):
+        with connect(COORDINATION) as coordination:
+            self.begin(coordination, READ, NOBODYS)
+            blocked = actor(EDITOR).submit(end_the_wait, NOBODYS)
+            self.assert_error(blocked.result(PATIENCE), COORDINATION_ERRORS, ENDED_ACCESS)
+
+    def test_refusals(self):
+        nowhere = URL.of_path(os.path.join(os.environ["HOME"], "nowhere", "file"))
+        with connect(COORDINATION) as coordination:
+            taken = self.begin(coordination, READ, NOBODYS)
+            for operation in (READ, WRITE):
+                for url, access, code in ((None, uuid.uuid4(), MISSING_URL), (NOBODYS, None, INVALID_ACCESS), (NOBODYS, taken, INVALID_ACCESS),
+                                          (URL("file:///etc/shadow"), uuid.uuid4(), MAY_NOT), (nowhere, uuid.uuid4(), NO_DIRECTORY)):
+                    self.assert_error(*coordination.call(operation, url, None, access, None), COORDINATION_ERRORS, code)
+            self.assert_error(*coordination.call(END_ACCESS, uuid.uuid4()), COORDINATION_ERRORS, INVALID_ACCESS)
+            error, *nothing = coordination.call(PROGRESS, uuid.uuid4())
+            self.assert_error(error, COORDINATION_ERRORS, INVALID_ACCESS)
+            self.assertEqual(nothing, [None, None])
+            error, holders = coordination.call(HOLDERS, URL("file:///etc/shadow"), None)
+            self.assert_error(error, COORDINATION_ERRORS, MAY_NOT)
+            self.assertIsNone(holders)
+            for url, code in ((None, MISSING_URL), (URL("file:///etc/passwd"), MAY_NOT), (NOBODYS, NO_PROVIDER)):
+                self.assert_error(*coordination.call(FINISHED_WRITING, url), COORDINATION_ERRORS, code)
+
+
 class Administration(ClientTest):
     def grants(self, connection, provider, consumer):
         error, grants, following = connection.call(GRANTS, provider, consumer, None)
@@ -210,6 +351,26 @@ class Administration(ClientTest):
         error, file = self.ask(None, REDEEM, token, False, service=SANDBOX)
         self.assertIsNone(file)
         self.assert_error(error, SANDBOX_ERRORS, BAD_TOKEN)
+
+
+class ProviderThatIsGone(ClientTest):
+    def test_its_strings_get_no_reply(self):
+        self.grant()
+        with connect(DAEMON, EDITOR) as editor:
+            string, _ = editor.call(STRING_OF, DOCUMENT)
+            bundles = os.path.join(os.environ["HOME"], ".local/share/docuvend/bundles")
+            os.rename(os.path.join(bundles, PROVIDER), os.path.join(bundles, "." + PROVIDER))
+            deadline = time.monotonic() + PATIENCE
+            while PROVIDER in editor.call(PROVIDERS)[1]:
+                self.assertLess(time.monotonic(), deadline)
+                time.sleep(0.002)
+            resolving = editor.start(DOCUMENT_OF, string)
+            # What comes after it on the connection runs after it.
+            self.assertEqual(editor.call(WAKE_UP), [])
+            with self.assertRaises(TimeoutError):
+                resolving.result(0)
+        with self.assertRaises(Ended):
+            resolving.result(PATIENCE)
 
 
 class RefusalsOfOperations(ClientTest):
@@ -261,11 +422,14 @@ class RefusalsOfOperations(ClientTest):
         missing = URL.of_path(os.path.join(os.path.dirname(DOCUMENT.path), "missing.txt"))
         error, *_ = self.ask(PICKER, EXTEND, missing, PROVIDER, EDITOR)
         self.assert_error(error, ERRORS, PROVIDER_FAILED)
-        self.assertIsInstance(error.underlying, Error)
-        # From the provider object it comes as code 7, and is wrapped in another one but where the string is asked for.
+        self.assert_error(error.underlying, ERRORS, PROVIDER_FAILED)
+        providers_own = error.underlying.underlying
+        self.assertNotEqual(providers_own.domain, ERRORS)
+        self.assertIsNone(providers_own.underlying)
         string, error = self.ask(None, STRING_OF, missing)
         self.assertIsNone(string)
         self.assert_error(error, ERRORS, PROVIDER_FAILED)
+        self.assertEqual(error.underlying, providers_own)
 
     def test_passing_on_what_one_may_not(self):
         for bundle, url, consumer in ((None, DOCUMENT, STRANGER), (EDITOR, DOCUMENT, None), (EDITOR, URL("file:///etc/passwd"), STRANGER)):

@@ -39,7 +39,7 @@ class NotTransmissible(Exception):
 class URL(str):
     """An absolute file URL, as text."""
 
-    _PATTERN = re.compile(r"file:(?://(?:localhost)?)?(/(?:[A-Za-z0-9" + re.escape(_PLAIN_IN_URL) + r"]|%[0-9A-Fa-f]{2})*)", re.ASCII)
+    _PATTERN = re.compile(r"file:(?://(?:localhost)?|(?!//))(/(?:[A-Za-z0-9" + re.escape(_PLAIN_IN_URL) + r"]|%[0-9A-Fa-f]{2})*)", re.ASCII)
 
     def __new__(cls, text):
         match = cls._PATTERN.fullmatch(text)
