@@ -6,6 +6,7 @@
 
 #include "common/DVErrors.h"
 #include "platform/linux/bundles/BundleErrors.h"
+#include "platform/linux/wire/FileCoordinationProtocol.h"
 #include "platform/linux/wire/SandboxProtocol.h"
 #include "platform/rpc_errors.h"
 #include "sdk/ConsumerErrors.h"
@@ -14,10 +15,15 @@ namespace docuvend::ctl {
 namespace {
 
 using linux_platform::BundleErrorCode;
+using linux_platform::FileCoordinationErrorCode;
 
 QXError own(ConsumerErrorCode code) { return QXError::make(kConsumerErrorDomain, static_cast<std::int64_t>(code), "x"); }
 
 QXError bundle(BundleErrorCode code) { return linux_platform::bundleError(code, "x"); }
+
+QXError coordination(FileCoordinationErrorCode code) {
+  return QXError::make(linux_platform::kQXFileCoordinationErrorDomain, static_cast<std::int64_t>(code), "x");
+}
 
 TEST(Outcome, AKindOfFailureHasAStatusOfItsOwn) {
   const QXURL url = *QXURL::fromString("file:///x");
@@ -44,6 +50,14 @@ TEST(Outcome, AKindOfFailureHasAStatusOfItsOwn) {
       {own(ConsumerErrorCode::noToken), ExitStatus::notPermitted},
       {QXError::make(linux_platform::kQXSandboxErrorDomain, 3, "x"), ExitStatus::fileError},
       {QXError::system(2, "x"), ExitStatus::fileError},
+      {coordination(FileCoordinationErrorCode::missingURL), ExitStatus::invalidInput},
+      {coordination(FileCoordinationErrorCode::notPermitted), ExitStatus::notPermitted},
+      {coordination(FileCoordinationErrorCode::noProvider), ExitStatus::notFound},
+      {coordination(FileCoordinationErrorCode::noDirectory), ExitStatus::notFound},
+      {coordination(FileCoordinationErrorCode::wouldDeadlock), ExitStatus::deadlinePassed},
+      {coordination(FileCoordinationErrorCode::ended), ExitStatus::deadlinePassed},
+      {coordination(FileCoordinationErrorCode::invalidAccessID), ExitStatus::other},
+      {coordination(FileCoordinationErrorCode::tooManyAccesses), ExitStatus::other},
       {bundle(BundleErrorCode::noBundle), ExitStatus::invalidInput},
       {bundle(BundleErrorCode::forbidden), ExitStatus::invalidInput},
       {bundle(BundleErrorCode::tooLarge), ExitStatus::invalidInput},

@@ -1,12 +1,14 @@
 // What a command gives back. How it looks is the printer's matter.
 #pragma once
 
+#include <memory>
 #include <string>
 #include <utility>
 #include <variant>
 #include <vector>
 
 #include "platform/QXValue.h"
+#include "sdk/CoordinatedAccess.h"
 
 namespace docuvend::ctl {
 
@@ -40,6 +42,8 @@ struct Page {
 struct Contents {
   QXURL url;
   QXDescriptor file;
+  // The turn at the file, which ends when all is printed; none when it was taken without one.
+  std::shared_ptr<CoordinatedAccess> access = {};
 };
 
 using Answer = std::variant<Nothing, Line, Record, List, Page, Contents>;

@@ -7,8 +7,8 @@
 namespace docuvend::ctl {
 
 const CommandTable& CommandTable::all() {
-  static const CommandTable table(
-      {documentCommands(), itemCommands(), administrationCommands(), bundleCommands(), platformCommands(), generalCommands()});
+  static const CommandTable table({documentCommands(), itemCommands(), coordinationCommands(), administrationCommands(), bundleCommands(),
+                                   platformCommands(), generalCommands()});
   return table;
 }
 

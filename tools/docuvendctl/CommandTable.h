@@ -10,6 +10,7 @@ namespace docuvend::ctl {
 
 [[nodiscard]] CommandGroup documentCommands();
 [[nodiscard]] CommandGroup itemCommands();
+[[nodiscard]] CommandGroup coordinationCommands();
 [[nodiscard]] CommandGroup administrationCommands();
 [[nodiscard]] CommandGroup bundleCommands();
 [[nodiscard]] CommandGroup platformCommands();

@@ -4,6 +4,7 @@
 
 #include "common/DVErrors.h"
 #include "platform/linux/bundles/BundleErrors.h"
+#include "platform/linux/wire/FileCoordinationProtocol.h"
 #include "platform/linux/wire/SandboxProtocol.h"
 #include "sdk/ConsumerErrors.h"
 
@@ -11,6 +12,7 @@ namespace docuvend::ctl {
 namespace {
 
 using linux_platform::BundleErrorCode;
+using linux_platform::FileCoordinationErrorCode;
 
 ExitStatus statusOfBundleError(BundleErrorCode code) {
   switch (code) {
@@ -34,6 +36,26 @@ ExitStatus statusOfControlError(ControlErrorCode code) {
       return ExitStatus::usage;
     case ControlErrorCode::confined:
       return ExitStatus::notPermitted;
+  }
+  return ExitStatus::other;
+}
+
+ExitStatus statusOfCoordinationError(FileCoordinationErrorCode code) {
+  switch (code) {
+    case FileCoordinationErrorCode::missingURL:
+      return ExitStatus::invalidInput;
+    case FileCoordinationErrorCode::notPermitted:
+      return ExitStatus::notPermitted;
+    case FileCoordinationErrorCode::noProvider:
+    case FileCoordinationErrorCode::noDirectory:
+      return ExitStatus::notFound;
+    case FileCoordinationErrorCode::wouldDeadlock:
+    case FileCoordinationErrorCode::ended:
+      // The turn did not come, and may at another time.
+      return ExitStatus::deadlinePassed;
+    case FileCoordinationErrorCode::invalidAccessID:
+    case FileCoordinationErrorCode::tooManyAccesses:
+      break;
   }
   return ExitStatus::other;
 }
@@ -85,6 +107,9 @@ ExitStatus statusOf(const QXError& error) {
   }
   if (error.domain == kControlErrorDomain) return statusOfControlError(static_cast<ControlErrorCode>(error.code));
   if (error.domain == linux_platform::kBundleErrorDomain) return statusOfBundleError(static_cast<BundleErrorCode>(error.code));
+  if (error.domain == linux_platform::kQXFileCoordinationErrorDomain) {
+    return statusOfCoordinationError(static_cast<FileCoordinationErrorCode>(error.code));
+  }
   if (error.domain == linux_platform::kQXSandboxErrorDomain || error.domain == kQXSystemErrorDomain) return ExitStatus::fileError;
   return ExitStatus::other;
 }

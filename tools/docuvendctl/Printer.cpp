@@ -15,12 +15,17 @@
 namespace docuvend::ctl {
 namespace {
 
-Failure printContents(const Contents& contents, OutputForm form) {
+Failure printBytes(const Contents& contents, OutputForm form) {
   if (form != OutputForm::json) return copyAll(contents.file.number, STDOUT_FILENO);
   const std::string beginning = "{\"url\":" + jsonString(contents.url.absoluteString()) + ",\"base64\":\"";
   if (auto failure = writeAll(STDOUT_FILENO, beginning)) return failure;
   if (auto failure = copyAllAsBase64(contents.file.number, STDOUT_FILENO)) return failure;
   return writeAll(STDOUT_FILENO, "\"}\n");
+}
+
+Failure printContents(const Contents& contents, OutputForm form) {
+  if (auto failure = printBytes(contents, form)) return failure;
+  return contents.access ? contents.access->end() : std::nullopt;
 }
 
 }  // namespace
