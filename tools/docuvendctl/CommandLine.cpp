@@ -138,7 +138,7 @@ const std::vector<Option>& commonOptions() {
   static const std::vector<Option> options = {
       {"--as", "BUNDLE", "act for an installed bundle (not from inside a confinement)"},
       {"--json", "", "print one JSON object or array; errors are one JSON object too"},
-      {"--timeout", "SECONDS", "give up after that long; else after 30, and after 600 where a document or a turn at a file is waited for"},
+      {"--timeout", "SECONDS", "give up after that long; else after 30, and after 600 for a document or a turn at a file"},
   };
   return options;
 }

@@ -110,7 +110,7 @@ CommandGroup coordinationCommands() {
            "list who has a file, and who waits for it",
            "Who has it comes first, then who waits, in their order.\n"
            "Columns: kind (reading or writing), state (holding, waiting, or providing while the provider brings the contents), pid and\n"
-           "bundle (not told inside a confinement), own (it is this program's).\n",
+           "bundle (not told inside a confinement; bundle is empty where there is none), own (it is this program's).\n",
            holders},
       }};
 }
