@@ -241,6 +241,18 @@ TEST_F(AccessTableTest, FollowsTheWaitThroughItsOwnProcessWhoQueuesBefore) {
   EXPECT_EQ(read(f, a2), Entry::wouldDeadlock) << "it reads together with the writer before it, who waits for the reader";
 }
 
+TEST_F(AccessTableTest, FollowsTheWaitThroughAReaderWhoKeepsOneOfTheWritersProcessBehindIt) {
+  EXPECT_EQ(write(h, a2), Entry::hasTurn);
+  EXPECT_EQ(write(g, d), Entry::hasTurn);
+  EXPECT_EQ(write(f, b), Entry::hasTurn);
+  EXPECT_EQ(write(f, a), Entry::waits);
+  EXPECT_EQ(read(f, c), Entry::waits);
+  EXPECT_EQ(read(f, a2), Entry::waits);
+  EXPECT_EQ(table.leave(3), Numbers{4});
+  EXPECT_EQ(read(h, d), Entry::waits);
+  EXPECT_EQ(read(g, a), Entry::wouldDeadlock) << "its second party waits for nobody but the reader, who waits for its writer";
+}
+
 TEST_F(AccessTableTest, LetsAPartyQueueTwiceAtOneFile) {
   EXPECT_EQ(write(f, b), Entry::hasTurn);
   EXPECT_EQ(write(f, a), Entry::waits);

@@ -65,12 +65,9 @@ class AccessTable::Cycle {
       if (access.excludes(*own)) await(access.party);
     }
     for (auto before = line.waiting.begin(); before != own; ++before) {
-      if (before->excludes(*own)) {
-        await(before->party);
-      } else if (before->party.process == own->party.process) {
-        // Its own process need not end that one, but does not pass it.
-        await(before->number);
-      }
+      // Nobody passes another; but only those that exclude each other wait for each other's end.
+      await(before->number);
+      if (before->excludes(*own)) await(before->party);
     }
   }
 

@@ -5,9 +5,9 @@
 // waits for the other readers. Everybody else waits behind those who came before.
 //
 // A cycle is looked for between parties, each of which does one thing after another. An access that waits is held up by those accesses of
-// other processes that have the turn or queue before it, where the two exclude each other. One that has the turn ends only when its party
-// goes on, which it cannot while an access of that party waits. An access whose wait would lead back to its own party this way is not
-// entered.
+// other processes that have the turn and exclude it, and by those that queue before it: all of them have to get their turn, and those that
+// exclude it have to end as well. One ends only when its party goes on, which it cannot while an access of that party waits. An access
+// whose wait would lead back to its own party this way is not entered.
 #pragma once
 
 #include <compare>
