@@ -26,6 +26,8 @@ TEST(ProtocolFromThePage, EveryValueComesBackAndNothingMalformedIsRead) {
   expectPythonPasses("wire_test.py", "Values", {"TEST_PAGE=" DOCUVEND_DOCS "/protocol.md"});
 }
 
+TEST(ProtocolFromThePage, TheTwoSidesOfAConnectionKeepToIt) { expectPythonPasses("connection_test.py", "Sides", {}); }
+
 // The client over the provider of this build, and over the one in Python.
 class PythonClient : public PythonHouse, public testing::WithParamInterface<std::string> {
  protected:

@@ -262,6 +262,15 @@ class Coordination(ClientTest):
             self.assertEqual(coordination.call(END_ACCESS, access), [None])
             self.assertEqual(coordination.call(HOLDERS, DOCUMENT, None), [None, []])
 
+    def test_a_writer_that_writes_nothing_changes_nothing(self):
+        before = original()
+        self.ask(EDITOR, STOP, DOCUMENT, PROVIDER, EDITOR)
+        with connect(COORDINATION) as coordination:
+            access = self.begin(coordination, WRITE, DOCUMENT)
+            self.assertEqual(os.stat(DOCUMENT.path).st_blocks, 0)
+            self.assertEqual(coordination.call(END_ACCESS, access), [None])
+        self.assert_saved(before)
+
     def test_writers_take_turns(self):
         before = original()
         with connect(COORDINATION) as coordination:
