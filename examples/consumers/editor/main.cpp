@@ -2,7 +2,7 @@
 //
 //   editor open PATH            tries to open a file by its path, as any program would
 //   editor show STRING          prints a document
-//   editor append STRING TEXT   adds a line to a document and saves it, all or nothing
+//   editor append STRING TEXT   adds a line to a document and saves it, all or nothing; of several at once none loses the others' lines
 #include <fcntl.h>
 #include <unistd.h>
 
@@ -69,14 +69,21 @@ int show(Consumer& daemon, const Document& document) {
   return 0;
 }
 
-int append(Consumer& daemon, const Document& document, const std::string& text) {
+Failure addLine(Consumer& daemon, const Document& document, const std::string& text) {
   auto contents = contentsOf(daemon, document);
-  if (auto* error = std::get_if<QXError>(&contents)) return fail(*error);
+  if (auto* error = std::get_if<QXError>(&contents)) return *error;
   const std::string changed = std::get<std::string>(contents) + text + "\n";
-  if (auto failure = daemon.replace(document, [&changed](const QXDescriptor& file) { return writeAll(file, changed); })) {
-    return fail(*failure);
-  }
+  if (auto failure = daemon.replace(document, [&changed](const QXDescriptor& file) { return writeAll(file, changed); })) return failure;
   std::cout << "saved " << changed.size() << " bytes\n";
+  return std::nullopt;
+}
+
+// Reading and saving are one turn: who comes meanwhile reads what was saved.
+int append(Consumer& daemon, const Document& document, const std::string& text) {
+  auto writing = daemon.coordinateWriting(document);
+  if (auto* error = std::get_if<QXError>(&writing)) return fail(*error);
+  if (auto failure = addLine(daemon, document, text)) return fail(*failure);
+  if (auto failure = std::get<CoordinatedAccess>(writing).end()) return fail(*failure);
   return 0;
 }
 
