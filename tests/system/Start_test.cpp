@@ -1,12 +1,14 @@
 // How the daemon starts, and when it refuses to.
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
+#include <sys/resource.h>
 #include <sys/stat.h>
 
 #include <algorithm>
 #include <filesystem>
 #include <fstream>
 
+#include "platform/linux/launch/LaunchArguments.h"
 #include "tests/system/house/DaemonHouse.h"
 
 namespace docuvend::tests {
@@ -71,6 +73,27 @@ TEST_F(Start, EveryConnectionIsAcceptedAndLoggedOnce) {
   ASSERT_TRUE(house_.awaitLog(accepted, 3));
   EXPECT_EQ(house_.logged(accepted), 3);
   EXPECT_EQ(house_.logged("[DEBUG] Serving: wakeUpCompletion:"), 7);
+}
+
+TEST_F(Start, TakesAllTheDescriptorsThatItMayHaveAndLeavesAnExtensionItsOwnNumber) {
+  rlimit usual{};
+  ASSERT_EQ(::getrlimit(RLIMIT_NOFILE, &usual), 0);
+  ASSERT_GT(usual.rlim_max, linux_platform::kExtensionOpenFiles);
+  rlimit low = usual;
+  low.rlim_cur = linux_platform::kExtensionOpenFiles / 2;
+  ASSERT_EQ(::setrlimit(RLIMIT_NOFILE, &low), 0);
+  house_.startDaemon();
+  ASSERT_EQ(::setrlimit(RLIMIT_NOFILE, &usual), 0);
+  const auto descriptorsOf = [](pid_t process) {
+    rlimit limit{};
+    EXPECT_EQ(::prlimit(process, RLIMIT_NOFILE, /*new_limit=*/nullptr, &limit), 0);
+    return std::pair(limit.rlim_cur, limit.rlim_max);
+  };
+  EXPECT_EQ(descriptorsOf(house_.daemon().pid()), std::pair(usual.rlim_max, usual.rlim_max));
+  const auto extensions = house_.processesOf("cellar");
+  ASSERT_EQ(extensions.size(), 1U);
+  const rlim_t own = linux_platform::kExtensionOpenFiles;
+  EXPECT_EQ(descriptorsOf(extensions[0]), std::pair(own, own));
 }
 
 TEST_F(Start, WithoutASettingOnlyNoticesAndErrorsAreLogged) {
