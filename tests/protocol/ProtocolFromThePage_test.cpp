@@ -110,6 +110,12 @@ TEST_F(PythonProvider, PlaysAllSevenOperationsForTheCommandLine) {
   EXPECT_EQ(std::count(asked.begin(), asked.end(), "_itemChangedAtURL:completion:"), 1);
 }
 
+TEST_F(PythonProvider, BringsTheContentsForAProgramThatKnowsNothingOfProviders) {
+  const std::string placeholder = contentsOf(document());
+  EXPECT_EQ(says({"read", document()}), contentsOf(original()));
+  EXPECT_NE(contentsOf(document()), placeholder);
+}
+
 TEST_F(PythonProvider, ItsErrorsReachTheCommandLine) {
   const Ending ended = house_.ctl({"bookmark", house_.storage(kShelf) + "/missing.txt"});
   EXPECT_EQ(ended.status, static_cast<int>(ctl::ExitStatus::providerFailed));

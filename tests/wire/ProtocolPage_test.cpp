@@ -1,6 +1,7 @@
 // docs/protocol.md says what the code does.
 #include <gtest/gtest.h>
 
+#include <algorithm>
 #include <chrono>
 #include <fstream>
 #include <iterator>
@@ -95,6 +96,12 @@ class ProtocolPageTest : public testing::Test {
     EXPECT_EQ(shown, due);
   }
   bool says(const std::string& heading, const std::string& text) const { return section(heading).find(text) != std::string::npos; }
+  // The same for words that may stand on two lines.
+  bool tells(const std::string& heading, const std::string& words) const {
+    std::string folded = section(heading);
+    std::replace(folded.begin(), folded.end(), '\n', ' ');
+    return folded.find(words) != std::string::npos;
+  }
 
   std::string page;
 };
@@ -153,10 +160,10 @@ TEST_F(ProtocolPageTest, GivesEveryKindItsNumber) {
 TEST_F(ProtocolPageTest, NamesTheServicesAndTheirErrors) {
   for (const char* service :
        {kDVServiceName, linux_platform::kSandboxServiceName, linux_platform::kFileCoordinationServiceName, kDVAdministrationServiceName}) {
-    EXPECT_TRUE(says("Where", service)) << service;
+    EXPECT_TRUE(tells("Where", service)) << service;
   }
-  EXPECT_TRUE(says("Errors of the protocol itself", std::string("Domain `") + kQXRpcErrorDomain + "`"));
-  EXPECT_TRUE(says("Errors of the operations", std::string("`") + kQXSystemErrorDomain + "`"));
+  EXPECT_TRUE(tells("Errors of the protocol itself", std::string("Domain `") + kQXRpcErrorDomain + "`"));
+  EXPECT_TRUE(tells("Errors of the operations", std::string("`") + kQXSystemErrorDomain + "`"));
 }
 
 TEST_F(ProtocolPageTest, GivesEveryErrorItsCode) {
@@ -186,23 +193,23 @@ TEST_F(ProtocolPageTest, GivesTheLimits) {
        std::to_string(AccessSession::kMaximumAccesses) + "; one more is refused"}};
   for (const auto& limit : limits) EXPECT_EQ(row("Limits", limit.first), (std::vector{limit.first, limit.second}));
   EXPECT_EQ(rows("Limits").size(), limits.size());
-  EXPECT_TRUE(says("Frames", ", at most " + std::to_string(kMaximumFrameBytes) + " |"));
-  EXPECT_TRUE(says("Frames", "The version is " + std::to_string(kProtocolVersion) + "."));
+  EXPECT_TRUE(tells("Frames", ", at most " + std::to_string(kMaximumFrameBytes) + " |"));
+  EXPECT_TRUE(tells("Frames", "The version is " + std::to_string(kProtocolVersion) + "."));
 }
 
 TEST_F(ProtocolPageTest, GivesTheLimitsOfTheServices) {
-  EXPECT_TRUE(says("Operations: `QXFileCoordination`",
-                   std::to_string(linux_platform::FileCoordinationServicer::kMaximumHoldersNamed) + " at most"));
+  EXPECT_TRUE(tells("Operations: `QXFileCoordination`",
+                    std::to_string(linux_platform::FileCoordinationServicer::kMaximumHoldersNamed) + " at most"));
   const std::string administration = "Operations: `DVAdministration`";
-  EXPECT_TRUE(says(administration, "after " + std::to_string(kDVMaximumGrantsOfPage) + " grants"));
-  EXPECT_TRUE(says(administration, "more than " + std::to_string(kDVMaximumTextBytesOfPage) + " bytes together"));
-  EXPECT_TRUE(says(administration, "more than " + std::to_string(kDVLongestIdentifier) + " bytes is left out"));
+  EXPECT_TRUE(tells(administration, "after " + std::to_string(kDVMaximumGrantsOfPage) + " grants"));
+  EXPECT_TRUE(tells(administration, "more than " + std::to_string(kDVMaximumTextBytesOfPage) + " bytes together"));
+  EXPECT_TRUE(tells(administration, "more than " + std::to_string(kDVLongestIdentifier) + " bytes is left out"));
 }
 
 TEST_F(ProtocolPageTest, SaysWhatAnExtensionIsGivenAndHowLong) {
   using namespace linux_platform;
   const std::string heading = "A provider extension";
-  EXPECT_TRUE(says(heading, "- descriptor " + std::to_string(kExtensionSocketNumber) + " is its end"));
+  EXPECT_TRUE(tells(heading, "- descriptor " + std::to_string(kExtensionSocketNumber) + " is its end"));
   const auto seconds = [](ExtensionTimes::Duration time) {
     return std::to_string(std::chrono::duration_cast<std::chrono::seconds>(time).count()) + " s";
   };
@@ -216,7 +223,7 @@ TEST_F(ProtocolPageTest, SaysWhatAnExtensionIsGivenAndHowLong) {
       {"to end by itself after that, and then again after SIGTERM", seconds(times.endGrace)}};
   for (const auto& time : expected) EXPECT_EQ(row(heading, time.first), (std::vector{time.first, time.second}));
   EXPECT_EQ(rows(heading).size(), expected.size());
-  EXPECT_TRUE(says("Bundles", "at most " + std::to_string(kLongestIdentifier) + " bytes"));
+  EXPECT_TRUE(tells("Bundles", "at most " + std::to_string(kLongestIdentifier) + " bytes"));
 }
 
 }  // namespace
