@@ -37,19 +37,19 @@ class PythonClient : public PythonHouse, public testing::WithParamInterface<std:
   }
 };
 
-TEST_P(PythonClient, GoesThroughAllNineOperationsAndReadsForAToken) { expectClientPasses("AllNineOperations"); }
+TEST_P(PythonClient, GoesThroughAllNineOperationsAndReadsForAToken) { expectClientPasses("client_test.py", "AllNineOperations"); }
 
-TEST_P(PythonClient, SavesThroughTheHiddenSibling) { expectClientPasses("Saving"); }
+TEST_P(PythonClient, SavesThroughTheHiddenSibling) { expectClientPasses("client_test.py", "Saving"); }
 
-TEST_P(PythonClient, TakesTurnsAtFiles) { expectClientPasses("Coordination"); }
+TEST_P(PythonClient, TakesTurnsAtFiles) { expectClientPasses("coordination_test.py", "Coordination"); }
 
-TEST_P(PythonClient, LooksAfterTheGrants) { expectClientPasses("Administration"); }
+TEST_P(PythonClient, LooksAfterTheGrants) { expectClientPasses("client_test.py", "Administration"); }
 
-TEST_P(PythonClient, SetsItsOwnDeadlineWhereNoReplyEverComes) { expectClientPasses("ProviderThatIsGone"); }
+TEST_P(PythonClient, SetsItsOwnDeadlineWhereNoReplyEverComes) { expectClientPasses("client_test.py", "ProviderThatIsGone"); }
 
-TEST_P(PythonClient, IsRefusedWhatItMayNotHave) { expectClientPasses("RefusalsOfOperations"); }
+TEST_P(PythonClient, IsRefusedWhatItMayNotHave) { expectClientPasses("client_test.py", "RefusalsOfOperations"); }
 
-TEST_P(PythonClient, IsToldWhatIsNoRequestOrNoFrame) { expectClientPasses("RefusalsOfTheProtocol"); }
+TEST_P(PythonClient, IsToldWhatIsNoRequestOrNoFrame) { expectClientPasses("client_test.py", "RefusalsOfTheProtocol"); }
 
 INSTANTIATE_TEST_SUITE_P(Over, PythonClient, testing::Values(kCellar, kShelf),
                          [](const auto& named) { return named.param == kCellar ? "Cellar" : "Shelf"; });

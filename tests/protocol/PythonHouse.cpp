@@ -28,12 +28,12 @@ void PythonHouse::open(const std::string& provider) {
   house_.startDaemon();
 }
 
-void PythonHouse::expectClientPasses(const std::string& testClass) const {
+void PythonHouse::expectClientPasses(const std::string& script, const std::string& testClass) const {
   auto environment = house_.environment();
   for (const std::string& entry : {"TEST_PROVIDER=" + provider_, "TEST_DOCUMENT=" + document(), "TEST_ORIGINAL=" + original()}) {
     environment.push_back(entry);
   }
-  expectPythonPasses("client_test.py", testClass, std::move(environment));
+  expectPythonPasses(script, testClass, std::move(environment));
 }
 
 }  // namespace docuvend::tests

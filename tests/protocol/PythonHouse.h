@@ -23,8 +23,8 @@ class PythonHouse : public SystemTest {
 
   [[nodiscard]] std::string document() const { return house_.storage(provider_) + "/" + kDocument; }
   [[nodiscard]] std::string original() const { return house_.container(provider_) + "/cloud/" + kDocument; }
-  // Runs the tests of a class of the client script.
-  void expectClientPasses(const std::string& testClass) const;
+  // Runs the tests of a class of one of the client's scripts.
+  void expectClientPasses(const std::string& script, const std::string& testClass) const;
 
  private:
   static constexpr const char* kDocument = "a letter – 1.txt";

@@ -6,7 +6,8 @@ import unittest
 
 from docuvend_connection import (INVALID_ARGUMENTS, INVALID_REPLY, MALFORMED_FRAME, MAXIMUM_PENDING_CALLS, TOO_MANY_CALLS, UNKNOWN_OPERATION,
                                  UNSUPPORTED_VERSION, Connection, Ended, Operation)
-from docuvend_wire import URL, End, Error, Failure, FrameReader, Hello, Ping, Pong, Reply, Request, encode
+from docuvend_values import URL, Error
+from docuvend_wire import End, Failure, FrameReader, Hello, Ping, Pong, Reply, Request, encode
 
 PATIENCE = 60
 

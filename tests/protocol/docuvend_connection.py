@@ -18,8 +18,8 @@ import struct
 import threading
 import typing
 
-from docuvend_wire import (End, Error, Failure, FrameReader, Hello, Malformed, NotTransmissible, Ping, Pong, Reply, Request, encode,
-                           MAXIMUM_DESCRIPTORS, VERSION)
+from docuvend_values import MAXIMUM_DESCRIPTORS, Error, Malformed, NotTransmissible
+from docuvend_wire import VERSION, End, Failure, FrameReader, Hello, Ping, Pong, Reply, Request, encode
 
 EXTENSION_DESCRIPTOR = 3
 

@@ -5,8 +5,8 @@ import struct
 import unittest
 import uuid
 
-from docuvend_wire import (MAXIMUM_ELEMENTS, MAXIMUM_NESTING, MAXIMUM_TEXT_BYTES, URL, Error, Failure, FrameReader, Hello, Malformed,
-                           NotTransmissible, Ping, Pong, Reply, Request, encode)
+from docuvend_values import MAXIMUM_ELEMENTS, MAXIMUM_NESTING, MAXIMUM_TEXT_BYTES, URL, Error, Malformed, NotTransmissible
+from docuvend_wire import Failure, FrameReader, Hello, Ping, Pong, Reply, Request, encode
 
 
 def exchange(heading):
