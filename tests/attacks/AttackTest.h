@@ -1,0 +1,24 @@
+// A house with a confined attacker in it, and an honest application beside it.
+#pragma once
+
+#include <string>
+#include <vector>
+
+#include "tests/system/house/DaemonHouse.h"
+
+namespace docuvend::tests {
+
+// The bundle of attacker/main.cpp.
+inline const std::string kAttacker = "com.orvane.attacker";
+
+class AttackTest : public SystemTest {
+ protected:
+  // Installs the attacker with these entitlements, as what stands between "<dict>" and "</dict>".
+  void installAttacker(const std::string& entitlements = "") {
+    house_.install(kAttacker, "docuvend-attacker", stringEntry("QXBundleIdentifier", kAttacker), entitlements);
+  }
+  // What the attacker, confined, prints for its acts, a line each.
+  [[nodiscard]] std::vector<std::string> attack(const std::vector<std::string>& words) const;
+};
+
+}  // namespace docuvend::tests

@@ -1,0 +1,31 @@
+// An application that tries what it must not be able to do. It does what its words say, one thing after another, and prints a line for
+// each. The same program does the honest version, where that is allowed. Relative paths begin in its container.
+#include <cerrno>
+#include <cstring>
+#include <iostream>
+
+#include "tests/attacks/attacker/Acts.h"
+
+namespace docuvend::attacker {
+
+std::string outcome(long result) { return result >= 0 ? "ok" : ::strerrorname_np(errno); }
+
+}  // namespace docuvend::attacker
+
+int main(int count, char** arguments) {
+  using namespace docuvend::attacker;
+  Acts acts = identityActs();
+  acts.merge(fileActs());
+  acts.merge(surroundingsActs());
+  Words words({arguments + 1, arguments + count});
+  while (!words.isAtEnd()) {
+    const std::string word = words.next();
+    const auto act = acts.find(word);
+    if (act == acts.end()) {
+      std::cerr << "attacker: no such act: " << word << "\n";
+      return 2;
+    }
+    std::cout << act->second(words) << std::endl;
+  }
+  return 0;
+}
