@@ -327,12 +327,12 @@ INSTANTIATE_TEST_SUITE_P(Each, ItemsInUse, ::testing::Values("read", "write", "m
 TEST_P(ItemsInUse, StoppingLeavesTheContentsToWhoHasThem) {
   const std::string string = house_.granted(letter_.fileSystemPath(), kReader);
   ASSERT_EQ(kStart.ask(*caller_, letter_, kCellarID, ConsumerID{kReader}), std::nullopt);
-  auto holder = std::async(std::launch::async, [&] { return house_.confined(kReader, {GetParam(), string, "hold"}); });
-  const std::string holding = house_.container(kReader) + "/holding";
+  auto holder = std::async(std::launch::async, [&] { return house_.confined(kReader, {GetParam(), string, "hold", "it"}); });
+  const std::string holding = house_.container(kReader) + "/it.holding";
   EXPECT_TRUE(eventually("the document is held", [&holding] { return std::filesystem::exists(holding); }));
   EXPECT_THAT(kStop.ask(*caller_, letter_, kCellarID, kEditorID), KeepsContents(kInUse));
   EXPECT_EQ(contentsOf(letter_.fileSystemPath()), kText);
-  writeFile(house_.container(kReader) + "/go", "");
+  writeFile(house_.container(kReader) + "/it.go", "");
   const Ending ended = holder.get();
   EXPECT_EQ(ended.output, "ok\nok\n") << ended.errors;
   EXPECT_EQ(kStop.ask(*caller_, letter_, kCellarID, kEditorID), DVPluginOperationFailedError(std::nullopt));

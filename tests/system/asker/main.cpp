@@ -1,4 +1,4 @@
-// A confined application that does what its words say, one thing after another, in one launch.
+// A program that does what its words say, one thing after another, in one launch; confined when it is launched as an application.
 //
 //   placeholder URL PROVIDER CONSUMER
 //   start URL PROVIDER CONSUMER
@@ -9,7 +9,9 @@
 //   map STRING                   maps a document for reading, and closes it
 //   make PATH                    makes a file, with its directories
 //   link PATH TARGET             makes a symbolic link, with its directories
-//   hold                         makes the file "holding" in its container, and waits until the file "go" lies there
+//   hold PLACE                   makes the file PLACE.holding, and waits until PLACE.go is there
+//
+// and those of Turns.h. Relative paths begin in its container.
 //
 // Prints a line for each: "ok", a string, or the domains and codes of an error and of what stands beneath it.
 #include <fcntl.h>
@@ -18,7 +20,6 @@
 
 #include <cerrno>
 #include <chrono>
-#include <deque>
 #include <filesystem>
 #include <fstream>
 #include <iostream>
@@ -28,40 +29,19 @@
 #include <vector>
 
 #include "sdk/Consumer.h"
+#include "tests/system/asker/Turns.h"
+#include "tests/system/asker/Words.h"
 
-namespace docuvend {
+namespace docuvend::asker {
 namespace {
 
 constexpr auto kPatience = std::chrono::seconds(60);
 constexpr auto kBetweenLooks = std::chrono::milliseconds(2);
 constexpr std::size_t kMapped = 1;
 
-std::string text(const QXError& error) {
-  const std::string own = error.domain + " " + std::to_string(error.code);
-  return error.underlying ? own + " < " + text(*error.underlying) : own;
-}
-std::string text(const Failure& failure) { return failure ? text(*failure) : "ok"; }
-
-class Words {
- public:
-  Words(int count, char** words) : words_(words + 1, words + count) {}
-  [[nodiscard]] bool isEmpty() const { return words_.empty(); }
-  // Empty when there is no more.
-  std::string next() {
-    if (words_.empty()) return {};
-    std::string word = std::move(words_.front());
-    words_.pop_front();
-    return word;
-  }
-  QXURL nextURL() { return QXURL::fromString(next()).value_or(QXURL::fileURL("/", QXURLKind::directory)); }
-
- private:
-  std::deque<std::string> words_;
-};
-
 class Asker {
  public:
-  explicit Asker(Consumer& consumer) : consumer_(consumer) {}
+  explicit Asker(Consumer& consumer) : consumer_(consumer), turns_(consumer) {}
 
   std::string perform(Words& words) {
     const std::string verb = words.next();
@@ -72,8 +52,8 @@ class Asker {
     if (verb == "map") return map(open(words, Access::read));
     if (verb == "make") return make(words.next());
     if (verb == "link") return link(words);
-    if (verb == "hold") return hold();
-    return "no such word: " + verb;
+    if (verb == "hold") return hold(words.next());
+    return turns_.perform(verb, words).value_or("no such word: " + verb);
   }
 
  private:
@@ -125,10 +105,11 @@ class Asker {
     if (!error) std::filesystem::create_symlink(words.next(), path, error);
     return error ? text(QXError::system(error.value(), "cannot make the link")) : "ok";
   }
-  static std::string hold() {
-    std::ofstream("holding").close();
+  static std::string hold(const std::string& place) {
+    std::ofstream(place + ".holding").close();
+    const std::string go = place + ".go";
     const auto deadline = std::chrono::steady_clock::now() + kPatience;
-    while (::access("go", F_OK) != 0) {
+    while (::access(go.c_str(), F_OK) != 0) {
       if (std::chrono::steady_clock::now() > deadline) return "in vain";
       std::this_thread::sleep_for(kBetweenLooks);
     }
@@ -136,11 +117,14 @@ class Asker {
   }
 
   Consumer& consumer_;
+  Turns turns_;
   std::vector<QXDescriptor> kept_;
 };
 
 int run(Words words) {
-  auto connected = Consumer::connect({});
+  Consumer::Options options;
+  options.restartPatience = kPatience;
+  auto connected = Consumer::connect(options);
   if (const auto* error = std::get_if<QXError>(&connected)) {
     std::cout << text(*error) << "\n";
     return 1;
@@ -151,6 +135,6 @@ int run(Words words) {
 }
 
 }  // namespace
-}  // namespace docuvend
+}  // namespace docuvend::asker
 
-int main(int count, char** words) { return docuvend::run(docuvend::Words(count, words)); }
+int main(int count, char** words) { return docuvend::asker::run(docuvend::asker::Words(count, words)); }
