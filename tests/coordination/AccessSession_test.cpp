@@ -2,8 +2,10 @@
 
 #include <gtest/gtest.h>
 
+#include <cstdint>
 #include <memory>
-#include <string>
+#include <optional>
+#include <utility>
 #include <variant>
 
 #include "tests/coordination/CoordinationHouse.h"
@@ -153,6 +155,29 @@ TEST_F(AccessSessionTest, IsNotKeptAliveByAnswersThatAreDue) {
   EXPECT_EQ(anybody().holders(item).list, QXArray{});
   provider->asked[0].completion(/*error=*/{});
   EXPECT_TRUE(waiting->empty());
+}
+
+TEST_F(AccessSessionTest, KeepsWhatIsBegunUnderAnIdentifierAsSoonAsItIsFree) {
+  const auto holder = anybody();
+  expectSuccess(*holder.write(plain, accessID(1)));
+  const auto accessTo = [process = unconfined()](const QXURL& url) {
+    return FileAccess{std::get<FileKey>(FileKey::of(url)), url, AccessKind::writing, {process, 0}, {}};
+  };
+  const auto session = std::make_shared<AccessSession>(accesses);
+  testing::Answers second;
+  session->begin(accessID(1), accessTo(plain), [&](const std::optional<QXError>& error) {
+    ASSERT_TRUE(error);
+    EXPECT_EQ(session->refusalOf(accessID(1)), std::nullopt);
+    session->begin(accessID(1), accessTo(otherPlain), [&second](std::optional<QXError> heard) { second.push_back(std::move(heard)); });
+  });
+  testing::Answers firstEnd;
+  session->end(accessID(1), [&firstEnd](std::optional<QXError> heard) { firstEnd.push_back(std::move(heard)); });
+  expectSuccess(firstEnd);
+  expectSuccess(second);
+  EXPECT_NE(session->refusalOf(accessID(1)), std::nullopt);
+  testing::Answers secondEnd;
+  session->end(accessID(1), [&secondEnd](std::optional<QXError> heard) { secondEnd.push_back(std::move(heard)); });
+  expectSuccess(secondEnd);
 }
 
 TEST_F(AccessSessionTest, GoesAlthoughItsAnswersAreDue) {

@@ -23,8 +23,7 @@ QXError noSuchAccess() { return invalidID("this connection has no access of that
 
 AccessSession::~AccessSession() {
   for (const auto& [id, entry] : entries_) {
-    const auto* shared = std::get_if<Shared>(&entry);
-    if (shared != nullptr && !shared->isEnding) accesses_.end(shared->number, [] {});
+    if (const auto* shared = std::get_if<Shared>(&entry)) accesses_.end(shared->number, [] {});
   }
 }
 
@@ -97,7 +96,8 @@ std::variant<std::optional<BytesPresent>, QXError> AccessSession::progressOf(con
   return BytesPresent::of(shared->file, shared->url);
 }
 
-// The identifier may have come to name another access since.
+// An access that is ended before it has begun is forgotten with its request's answer, upon which the peer may use its identifier anew, and
+// again when it has ended.
 void AccessSession::forget(const QXUUID& id, AccessNumber number) {
   const std::lock_guard lock(mutex_);
   const auto found = entries_.find(id);
