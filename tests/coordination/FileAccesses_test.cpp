@@ -2,6 +2,7 @@
 
 #include <gtest/gtest.h>
 
+#include <functional>
 #include <memory>
 #include <optional>
 #include <string>
@@ -35,6 +36,16 @@ const char* nameOf(AccessState state) {
   }
   return "holding";
 }
+
+// Lets something happen while a file is looked for in a provider's directory.
+class InterruptedFileSystem final : public fake_platform::FakeFileSystem {
+ public:
+  RelationshipAnswer relationship(const QXURL& directory, const QXURL& item) override {
+    if (const auto interruption = std::exchange(onNextLook, {})) interruption();
+    return FakeFileSystem::relationship(directory, item);
+  }
+  std::function<void()> onNextLook;
+};
 
 struct FileAccessesTest : ::testing::Test {
   void SetUp() override {
@@ -82,7 +93,7 @@ struct FileAccessesTest : ::testing::Test {
   const std::string brokenText = " failed: " + broken.description();
   Events events;
   fake_platform::FakeQueues queues;
-  fake_platform::FakeFileSystem fileSystem;
+  InterruptedFileSystem fileSystem;
   LinuxFileCoordinator coordinator{fileSystem};
   const std::shared_ptr<RecordingProvider> provider = std::make_shared<RecordingProvider>(QXURL::fileURL("/storage", QXURLKind::directory));
   FileAccesses accesses{coordinator};
@@ -434,6 +445,17 @@ TEST_F(FileAccessesTest, AnswersAReadThatEndsBeforeItsContentsAreThere) {
   EXPECT_EQ(news(), (Events{"1" + endedText(item), "2 begun", "1 ended"}));
   answer(0);
   EXPECT_EQ(news(), Events{});
+}
+
+TEST_F(FileAccessesTest, AsksNobodyForAReaderWhoEndsWhileItsProviderIsLookedFor) {
+  for (const std::string& path : {item, elsewhere}) {
+    fileSystem.onNextLook = [this] { end(accesses.newNumber() - 1); };
+    const AccessNumber reader = read(path, a);
+    const std::string number = std::to_string(reader);
+    EXPECT_EQ(news(), (Events{number + endedText(path), number + " ended"}));
+    EXPECT_EQ(state(reader), "over");
+  }
+  EXPECT_TRUE(provider->asked.empty());
 }
 
 TEST_F(FileAccessesTest, LetsThoseBehindGoOnWhenOneThatWaitsEnds) {
