@@ -12,7 +12,7 @@
 #include "platform/linux/coordination/AccessTable.h"
 
 #include <algorithm>
-#include <cstddef>
+#include <optional>
 #include <utility>
 
 namespace docuvend::linux_platform {
@@ -29,7 +29,9 @@ bool AccessTable::Line::hasRoomFor(const Access& access) const {
   return std::none_of(having.begin(), having.end(), [&access](const Access& other) { return other.excludes(access); });
 }
 
-// Whether the wait of an access that has just taken its place in a line leads back to its party.
+// Whether the wait of an access that has just taken its place in a line leads back to its party. Nobody in a line passes another, so who
+// waits for one place in it waits for all before; a line is therefore gone through once from there to its head, and not again for a place
+// that has been passed.
 class AccessTable::Cycle {
  public:
   Cycle(const AccessTable& table, const AccessParty& party) : table_(table), party_(party) {}
@@ -39,16 +41,28 @@ class AccessTable::Cycle {
     while (!isClosed_ && !open_.empty()) {
       const AccessNumber next = open_.back();
       open_.pop_back();
-      follow(next);
+      if (!passed_.contains(next)) goThrough(table_.lines_.at(table_.places_.at(next).file), next);
     }
     return isClosed_;
   }
 
  private:
+  // The processes of accesses, as far as it matters whether one of them is another than a given one.
+  class Processes {
+   public:
+    void add(const QXAuditToken& process) {
+      hasSeveral_ = hasSeveral_ || (one_ && *one_ != process);
+      one_ = process;
+    }
+    [[nodiscard]] bool haveAnotherThan(const QXAuditToken& process) const { return hasSeveral_ || (one_ && *one_ != process); }
+
+   private:
+    std::optional<QXAuditToken> one_;
+    bool hasSeveral_ = false;
+  };
+
   // An access that waits has to get its turn.
-  void await(AccessNumber number) {
-    if (awaited_.insert(number).second) open_.push_back(number);
-  }
+  void await(AccessNumber number) { open_.push_back(number); }
 
   // A party has to go on.
   void await(const AccessParty& party) {
@@ -57,25 +71,30 @@ class AccessTable::Cycle {
     for (const AccessNumber number : table_.parties_.at(party).waiting) await(number);
   }
 
-  void follow(AccessNumber number) {
-    const Line& line = table_.lines_.at(table_.places_.at(number).file);
-    const auto own =
-        std::find_if(line.waiting.begin(), line.waiting.end(), [number](const Access& access) { return access.number == number; });
-    for (const Access& access : line.having) {
-      if (access.excludes(*own)) await(access.party);
+  void goThrough(const Line& line, AccessNumber number) {
+    // Of those that wait from the one that is looked at to the one with the number.
+    Processes all;
+    Processes writing;
+    const auto awaitIfExcluded = [this, &all, &writing](const Access& access) {
+      const Processes& excluded = access.kind == AccessKind::writing ? all : writing;
+      if (excluded.haveAnotherThan(access.party.process)) await(access.party);
+    };
+    auto place =
+        std::find_if(line.waiting.rbegin(), line.waiting.rend(), [number](const Access& access) { return access.number == number; });
+    for (; place != line.waiting.rend(); ++place) {
+      awaitIfExcluded(*place);
+      passed_.insert(place->number);
+      all.add(place->party.process);
+      if (place->kind == AccessKind::writing) writing.add(place->party.process);
     }
-    for (auto before = line.waiting.begin(); before != own; ++before) {
-      // Nobody passes another; but only those that exclude each other wait for each other's end.
-      await(before->number);
-      if (before->excludes(*own)) await(before->party);
-    }
+    std::for_each(line.having.begin(), line.having.end(), awaitIfExcluded);
   }
 
   const AccessTable& table_;
   const AccessParty& party_;
   bool isClosed_ = false;
   std::vector<AccessNumber> open_;
-  std::set<AccessNumber> awaited_;
+  std::set<AccessNumber> passed_;
   std::set<AccessParty> awaitedParties_;
 };
 
