@@ -36,13 +36,13 @@ class Process {
 
   [[nodiscard]] pid_t pid() const { return pid_; }
   [[nodiscard]] bool isRunning();
+  // Waits, for what may take longer than the tests' patience.
+  [[nodiscard]] bool hasEndedWithin(int milliseconds) const;
   void signal(int number) const;
   // Waits for its end, at most for the tests' patience; it is killed then, and the test fails.
   const Ending& wait();
 
  private:
-  [[nodiscard]] bool hasEndedWithin(int milliseconds) const;
-
   pid_t pid_ = -1;
   linux_platform::UniqueDescriptor pidfd_;
   linux_platform::UniqueDescriptor output_;
