@@ -5,6 +5,7 @@
 #include <iostream>
 
 #include "tests/attacks/attacker/Acts.h"
+#include "tests/attacks/attacker/Requests.h"
 
 namespace docuvend::attacker {
 
@@ -15,6 +16,7 @@ std::string outcome(long result) { return result >= 0 ? "ok" : ::strerrorname_np
 int main(int count, char** arguments) {
   using namespace docuvend::attacker;
   Acts acts = identityActs();
+  acts.merge(requestActs());
   acts.merge(fileActs());
   acts.merge(surroundingsActs());
   Words words({arguments + 1, arguments + count});
