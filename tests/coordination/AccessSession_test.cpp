@@ -161,7 +161,7 @@ TEST_F(AccessSessionTest, KeepsWhatIsBegunUnderAnIdentifierAsSoonAsItIsFree) {
   const auto holder = anybody();
   expectSuccess(*holder.write(plain, accessID(1)));
   const auto accessTo = [process = unconfined()](const QXURL& url) {
-    return FileAccess{std::get<FileKey>(FileKey::of(url)), url, AccessKind::writing, {process, 0}, {}};
+    return FileAccess{std::get<KeyedFile>(KeyedFile::of(url)).key, url, AccessKind::writing, {process, 0}, {}};
   };
   const auto session = std::make_shared<AccessSession>(accesses);
   testing::Answers second;
@@ -182,7 +182,7 @@ TEST_F(AccessSessionTest, KeepsWhatIsBegunUnderAnIdentifierAsSoonAsItIsFree) {
 
 TEST_F(AccessSessionTest, GoesAlthoughItsAnswersAreDue) {
   const QXAuditToken process = unconfined();
-  const FileAccess access{std::get<FileKey>(FileKey::of(item)), item, AccessKind::reading, {process, 0}, {}};
+  const FileAccess access{std::get<KeyedFile>(KeyedFile::of(item)).key, item, AccessKind::reading, {process, 0}, {}};
   auto session = std::make_shared<AccessSession>(accesses);
   testing::Answers answers;
   session->begin(accessID(1), access, [&answers](std::optional<QXError> error) { answers.push_back(std::move(error)); });

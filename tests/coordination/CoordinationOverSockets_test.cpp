@@ -266,7 +266,7 @@ TEST_F(CoordinationOverSockets, TwoHundredWritersTakeTurns) {
     ASSERT_TRUE(writer);
     ASSERT_GE(*writer, 0);
     EXPECT_TRUE(seen.insert(*writer).second);
-    EXPECT_EQ(accesses.of(std::get<FileKey>(FileKey::of(plain))).front().state, AccessState::holding);
+    EXPECT_EQ(accesses.of(std::get<KeyedFile>(KeyedFile::of(plain)).key).front().state, AccessState::holding);
     if (i % 2 == 0) {
       writers[static_cast<std::size_t>(*writer)].leave();
     } else {

@@ -123,6 +123,19 @@ TEST_F(FileCoordinationServicerTest, AsksNobodyElseAboutAFileThatTheCallerCannot
   EXPECT_FALSE(watched.calls().empty());
 }
 
+TEST_F(FileCoordinationServicerTest, TheProviderHearsTheFilesOwnURLWhateverLinkLedToIt) {
+  const std::string way = plain.fileSystemPath() + ".way";
+  std::filesystem::create_directory_symlink(storage, way);
+  const QXURL byLink = QXURL::fileURL(way + item.fileSystemPath().substr(storage.size()), QXURLKind::file);
+  const auto caller = anybody();
+  const auto reading = caller.read(byLink, accessID(1));
+  ASSERT_EQ(provider->asked.size(), 1U);
+  EXPECT_EQ(provider->asked.front().url, item);
+  expectSuccess(*caller.didFinishWriting(byLink));
+  ASSERT_EQ(provider->told.size(), 1U);
+  EXPECT_EQ(provider->told.front().second, item);
+}
+
 TEST_F(FileCoordinationServicerTest, WhoMayReadOnlyDoesNotWrite) {
   ASSERT_EQ(::chmod(plain.fileSystemPath().c_str(), 0400), 0);
   const auto caller = anybody();

@@ -19,17 +19,17 @@ struct FileKeyTest : ::testing::Test {
     fs::create_directories(root + "/folder/inner");
     fs::create_directories(root + "/second");
   }
-  static std::variant<FileKey, QXError> keyOfURL(const std::string& text) { return FileKey::of(*QXURL::fromString("file://" + text)); }
+  static std::variant<KeyedFile, QXError> placed(const std::string& text) { return KeyedFile::of(*QXURL::fromString("file://" + text)); }
   // A key of nothing when there is none.
   static FileKey key(const std::string& path) {
-    const auto answer = FileKey::of(QXURL::fileURL(path, QXURLKind::file));
-    const auto* found = std::get_if<FileKey>(&answer);
+    const auto answer = KeyedFile::of(QXURL::fileURL(path, QXURLKind::file));
+    const auto* found = std::get_if<KeyedFile>(&answer);
     EXPECT_NE(found, nullptr) << path << ": " << std::get<QXError>(answer).description();
-    return found != nullptr ? *found : FileKey{};
+    return found != nullptr ? found->key : FileKey{};
   }
   static void expectNone(const std::string& path, int error) {
     const QXURL url = QXURL::fileURL(path, QXURLKind::file);
-    const auto answer = FileKey::of(url);
+    const auto answer = KeyedFile::of(url);
     const auto* failure = std::get_if<QXError>(&answer);
     ASSERT_NE(failure, nullptr) << path;
     EXPECT_EQ(failure->domain, kQXSystemErrorDomain) << path;
@@ -49,7 +49,25 @@ TEST_F(FileKeyTest, IsTheSameByWhateverWayTheDirectoryIsReached) {
   EXPECT_EQ(key(root + "/folder/inner/../x.txt"), straight);
   EXPECT_EQ(key(root + "/folder/./x.txt"), straight);
   EXPECT_EQ(key(root + "//folder//x.txt"), straight);
-  EXPECT_EQ(std::get<FileKey>(keyOfURL(root + "/folder/%78.txt")), straight);
+  EXPECT_EQ(std::get<KeyedFile>(placed(root + "/folder/%78.txt")).key, straight);
+}
+
+TEST_F(FileKeyTest, TheFilesOwnURLHasNoLinkOnTheWayToItsDirectory) {
+  fs::create_directory_symlink(root + "/folder", root + "/way");
+  const auto urlOf = [](const std::string& path) { return std::get<KeyedFile>(placed(path)).url.absoluteString(); };
+  const std::string folder = "file://" + fs::canonical(root).string() + "/folder";
+  EXPECT_EQ(urlOf(root + "/way/x.txt"), folder + "/x.txt");
+  EXPECT_EQ(urlOf(root + "/way/inner/../%78%20y"), folder + "/x%20y");
+  EXPECT_EQ(urlOf(root + "/way/inner/"), folder + "/inner/");
+  EXPECT_EQ(urlOf("/etc"), "file:///etc");
+  fs::create_symlink(root + "/elsewhere", root + "/folder/link");
+  EXPECT_EQ(urlOf(root + "/way/link"), folder + "/link") << "the name itself is not followed";
+}
+
+TEST_F(FileKeyTest, ADirectoryWhosePathIsNoTextHasNoKey) {
+  fs::create_directory(root + "/\xff");
+  fs::create_directory_symlink(root + "/\xff", root + "/odd");
+  expectNone(root + "/odd/x.txt", EILSEQ);
 }
 
 TEST_F(FileKeyTest, TellsNamesAndDirectoriesApart) {
@@ -88,8 +106,8 @@ TEST_F(FileKeyTest, DoesNotFollowALinkThatBearsTheName) {
 TEST_F(FileKeyTest, KnowsADirectoryWithAndWithoutAFinalSlash) {
   const FileKey plain = key(root + "/folder");
   EXPECT_EQ(plain.name, "folder");
-  EXPECT_EQ(std::get<FileKey>(keyOfURL(root + "/folder/")), plain);
-  EXPECT_EQ(std::get<FileKey>(keyOfURL(root + "/folder//")), plain);
+  EXPECT_EQ(std::get<KeyedFile>(placed(root + "/folder/")).key, plain);
+  EXPECT_EQ(std::get<KeyedFile>(placed(root + "/folder//")).key, plain);
 }
 
 TEST_F(FileKeyTest, NamesADirectoryThatIsWrittenWithDots) {

@@ -125,9 +125,9 @@ TEST_F(AccessProgress, IsAbsentWhileTheAccessWaitsForItsTurnAndAfterItsEndThereI
 
 TEST_F(AccessProgress, IsOfARegularFileThatIsStillWhereTheURLLed) {
   const auto known = [this](const QXURL& url) {
-    auto key = FileKey::of(url);
-    EXPECT_TRUE(std::holds_alternative<FileKey>(key));
-    return std::get<FileKey>(std::move(key));
+    const auto placed = KeyedFile::of(url);
+    EXPECT_TRUE(std::holds_alternative<KeyedFile>(placed));
+    return std::get<KeyedFile>(placed).key;
   };
   const FileKey key = known(item);
   EXPECT_EQ(BytesPresent::of(key, item), (BytesPresent{8, 8}));

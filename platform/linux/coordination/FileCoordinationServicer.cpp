@@ -33,14 +33,6 @@ QXError notPermitted(AccessKind kind, const QXURL& url) {
   return makeCoordinationError(FileCoordinationErrorCode::notPermitted, description, url);
 }
 
-// Of what is not there only an unconfined process is told: it could look for itself.
-QXError unreachable(AccessKind kind, const QXURL& url, const PeerIdentity* caller) {
-  if (caller == nullptr || caller->standing != Standing::unconfined) return notPermitted(kind, url);
-  const auto key = FileKey::of(url);
-  const auto* reason = std::get_if<QXError>(&key);
-  return reason != nullptr && reason->code == ENOENT ? noDirectory(url, *reason) : notPermitted(kind, url);
-}
-
 const char* nameOf(AccessKind kind) { return kind == AccessKind::reading ? "reading" : "writing"; }
 
 const char* nameOf(AccessState state) {
@@ -90,14 +82,13 @@ void FileCoordinationServicer::coordinate(AccessKind kind, const Request& reques
   if (auto refusal = session_->refusalOf(request.accessID)) return completionHandler(std::move(refusal));
   const auto admission = admit(kind, request.url, request.token);
   if (const auto* refusal = std::get_if<QXError>(&admission)) return completionHandler(*refusal);
-  const PeerIdentity& caller = *std::get<std::shared_ptr<const PeerIdentity>>(admission);
-  auto key = FileKey::of(*request.url);
-  if (const auto* reason = std::get_if<QXError>(&key)) return completionHandler(noDirectory(*request.url, *reason));
-  if (isExempt(caller, surroundings_.coordinator.providerOf(*request.url))) {
+  const auto& [peer, file] = std::get<Admitted>(admission);
+  const PeerIdentity& caller = *peer;
+  if (isExempt(caller, surroundings_.coordinator.providerOf(file.url))) {
     session_->beginExempt(*request.accessID);
     return completionHandler(/*error=*/{});
   }
-  FileAccess access{std::get<FileKey>(std::move(key)), *request.url, kind, AccessParty{caller.token, request.party.value_or(0)},
+  FileAccess access{file.key, file.url, kind, AccessParty{caller.token, request.party.value_or(0)},
                     AccessHolder{caller.pid, caller.bundleIdentifier}};
   session_->begin(*request.accessID, std::move(access), std::move(completionHandler));
 }
@@ -119,13 +110,11 @@ void FileCoordinationServicer::holdersOfItemAtURL(std::optional<QXURL> url, std:
   if (!completionHandler) return;
   const auto admission = admit(AccessKind::reading, url, token);
   if (const auto* refusal = std::get_if<QXError>(&admission)) return completionHandler(*refusal, /*holders=*/{});
-  const PeerIdentity& caller = *std::get<std::shared_ptr<const PeerIdentity>>(admission);
-  const auto key = FileKey::of(*url);
-  if (const auto* reason = std::get_if<QXError>(&key)) return completionHandler(noDirectory(*url, *reason), /*holders=*/{});
+  const auto& [caller, file] = std::get<Admitted>(admission);
   QXArray holders;
-  for (const KnownAccess& known : surroundings_.accesses.of(std::get<FileKey>(key))) {
+  for (const KnownAccess& known : surroundings_.accesses.of(file.key)) {
     if (holders.size() == kMaximumHoldersNamed) break;
-    holders.emplace_back(described(known, caller));
+    holders.emplace_back(described(known, *caller));
   }
   completionHandler(/*error=*/{}, std::move(holders));
 }
@@ -134,28 +123,35 @@ void FileCoordinationServicer::writerDidFinishWritingForURL(std::optional<QXURL>
   completionHandler = always(std::move(completionHandler));
   const auto admission = admit(AccessKind::writing, url, /*token=*/{});
   if (const auto* refusal = std::get_if<QXError>(&admission)) return completionHandler(*refusal);
-  const PeerIdentity& caller = *std::get<std::shared_ptr<const PeerIdentity>>(admission);
-  const auto key = FileKey::of(*url);
-  const auto* file = std::get_if<FileKey>(&key);
-  if (file != nullptr && surroundings_.accesses.isWriting(caller.token, *file)) return completionHandler(/*error=*/{});
-  const auto provider = surroundings_.coordinator.providerOf(*url);
+  const auto& [peer, file] = std::get<Admitted>(admission);
+  const PeerIdentity& caller = *peer;
+  if (surroundings_.accesses.isWriting(caller.token, file.key)) return completionHandler(/*error=*/{});
+  const auto provider = surroundings_.coordinator.providerOf(file.url);
   if (!provider) {
     return completionHandler(makeCoordinationError(FileCoordinationErrorCode::noProvider, "the file belongs to no provider", url));
   }
   if (isExempt(caller, provider)) return completionHandler(/*error=*/{});
-  surroundings_.coordinator.tellFinishedWriting(provider, caller.pid, *url,
+  surroundings_.coordinator.tellFinishedWriting(provider, caller.pid, file.url,
                                                 [completionHandler = std::move(completionHandler)] { completionHandler(/*error=*/{}); });
 }
 
-std::variant<std::shared_ptr<const PeerIdentity>, QXError> FileCoordinationServicer::admit(AccessKind kind, const std::optional<QXURL>& url,
-                                                                                           const std::optional<QXData>& token) const {
+std::variant<FileCoordinationServicer::Admitted, QXError> FileCoordinationServicer::admit(AccessKind kind, const std::optional<QXURL>& url,
+                                                                                          const std::optional<QXData>& token) const {
   if (!url) return makeCoordinationError(FileCoordinationErrorCode::missingURL, "the URL is missing", /*url=*/{});
   const auto connection = connection_.lock();
-  const QXAuditToken caller = connection ? connection->auditToken() : QXAuditToken{};
+  const QXAuditToken callerToken = connection ? connection->auditToken() : QXAuditToken{};
+  auto caller = surroundings_.peers.find(callerToken);
+  auto placed = KeyedFile::of(*url);
+  if (const auto* reason = std::get_if<QXError>(&placed)) {
+    // Of what is not there only an unconfined process is told: it could look for itself.
+    const bool mayKnow = caller && caller->standing == Standing::unconfined && (reason->code == ENOENT || reason->code == EINVAL);
+    return mayKnow ? noDirectory(*url, *reason) : notPermitted(kind, *url);
+  }
+  auto& file = std::get<KeyedFile>(placed);
   const auto text = token ? std::optional(token->text()) : std::nullopt;
-  auto peer = surroundings_.peers.find(caller);
-  if (peer && surroundings_.sandbox.mayReach(caller, operationOf(kind), url->fileSystemPath(), text)) return peer;
-  return unreachable(kind, *url, peer.get());
+  if (!caller || !surroundings_.sandbox.mayReach(callerToken, operationOf(kind), file.url.fileSystemPath(), text))
+    return notPermitted(kind, *url);
+  return Admitted{std::move(caller), std::move(file)};
 }
 
 }  // namespace docuvend::linux_platform

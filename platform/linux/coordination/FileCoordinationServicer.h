@@ -54,9 +54,14 @@ class FileCoordinationServicer final : public QXFileCoordination {
     std::optional<std::int64_t> party;
   };
   void coordinate(AccessKind kind, const Request& request, ErrorReply completionHandler);
-  // The caller, if it can reach the file in that way; else why it is not served.
-  [[nodiscard]] std::variant<std::shared_ptr<const PeerIdentity>, QXError> admit(AccessKind kind, const std::optional<QXURL>& url,
-                                                                                 const std::optional<QXData>& token) const;
+  struct Admitted {
+    std::shared_ptr<const PeerIdentity> caller;
+    KeyedFile file;
+  };
+  // The caller and the file, if the one can reach the other in that way; else why it is not served. Everything after this goes by the
+  // file's own URL: a link on the caller's way to it may lead elsewhere by then.
+  [[nodiscard]] std::variant<Admitted, QXError> admit(AccessKind kind, const std::optional<QXURL>& url,
+                                                      const std::optional<QXData>& token) const;
 
   const Surroundings surroundings_;
   const std::weak_ptr<QXRpcConnection> connection_;

@@ -19,7 +19,7 @@ bool endsInDots(const std::string& path) { return path.ends_with("/.") || path.e
 
 }  // namespace
 
-std::variant<FileKey, QXError> FileKey::of(const QXURL& url) {
+std::variant<KeyedFile, QXError> KeyedFile::of(const QXURL& url) {
   std::string path = url.fileSystemPath();
   if (endsInDots(path)) {
     auto place = FilePlace::ofDirectory(path);
@@ -28,11 +28,18 @@ std::variant<FileKey, QXError> FileKey::of(const QXURL& url) {
   }
   if (path == "/") return noDirectory(EINVAL, url);
   const std::size_t slash = path.rfind('/');
-  const OpenedPath directory = openDirectory(path.substr(0, slash + 1));
-  if (const auto* failure = std::get_if<SystemFailure>(&directory)) return noDirectory(failure->code, url);
-  const auto status = statusOf(std::get<UniqueDescriptor>(directory).get());
+  const OpenedPath opened = openDirectory(path.substr(0, slash + 1));
+  if (const auto* failure = std::get_if<SystemFailure>(&opened)) return noDirectory(failure->code, url);
+  const int directory = std::get<UniqueDescriptor>(opened).get();
+  const auto status = statusOf(directory);
   if (const auto* failure = std::get_if<SystemFailure>(&status)) return noDirectory(failure->code, url);
-  return FileKey{std::get<ObjectStatus>(status).identity, path.substr(slash + 1)};
+  auto straight = kernelPath(directory);
+  if (!straight) return noDirectory(ENOENT, url);
+  if (!qxIsValidUTF8(*straight)) return noDirectory(EILSEQ, url);
+  std::string name = path.substr(slash + 1);
+  if (*straight != "/") straight->append("/");
+  const QXURLKind kind = url.hasDirectoryPath() ? QXURLKind::directory : QXURLKind::file;
+  return KeyedFile{{std::get<ObjectStatus>(status).identity, name}, QXURL::fileURL(straight->append(name), kind)};
 }
 
 }  // namespace docuvend::linux_platform

@@ -17,10 +17,17 @@ struct FileKey {
   std::string name;
 
   friend auto operator<=>(const FileKey&, const FileKey&) = default;
+};
+
+// A file by its key, and by the one URL whose way to the file's directory has no link: what was found out about that one cannot be made
+// untrue by whoever owns a link on the way of another.
+struct KeyedFile {
+  FileKey key;
+  QXURL url;
 
   // The file need not be there, but its directory must: else the error of the system. A directory has a key like a file, with or without a
-  // final slash; "/" has none.
-  [[nodiscard]] static std::variant<FileKey, QXError> of(const QXURL& url);
+  // final slash; "/" has none. EILSEQ: the directory's path is not UTF-8.
+  [[nodiscard]] static std::variant<KeyedFile, QXError> of(const QXURL& url);
 };
 
 }  // namespace docuvend::linux_platform
