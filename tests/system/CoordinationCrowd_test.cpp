@@ -102,7 +102,7 @@ TEST_F(CoordinationCrowd, LosesNoUpdateSeesNoHalfWriteAndLeavesNobodyBehind) {
   // Longer than a program usually may take.
   EXPECT_TRUE(crowd.hasEndedWithin(static_cast<int>((seconds + std::chrono::seconds(2 * kPatience).count()) * 1000)));
   const Ending& ended = crowd.wait();
-  EXPECT_EQ(ended.status, 0) << ended.errors;
+  ASSERT_EQ(ended.status, 0) << ended.errors;
   EXPECT_EQ(ended.errors, "");
   auto count = figures(ended.output);
   EXPECT_GT(count["reads"], 0);
@@ -110,9 +110,9 @@ TEST_F(CoordinationCrowd, LosesNoUpdateSeesNoHalfWriteAndLeavesNobodyBehind) {
   EXPECT_GT(count["kills"], 0);
 
   for (const QXURL& item : items) awaitHolders(item, {});
-  EXPECT_THAT(
-      house_.loggedBeginning("[INFO] QXFileCoordinator is telling us "),
-      AllOf(Ge(count["writes"] + count["killed writes"]), Le(count["writes"] + count["killed writes"] + count["perhaps killed writes"])))
+  const int tellings = house_.loggedBeginning("[INFO] QXFileCoordinator is telling us ");
+  EXPECT_THAT(tellings, AllOf(Ge(count["writes"] + count["killed writes"]),
+                              Le(count["writes"] + count["killed writes"] + count["perhaps killed writes"])))
       << "of each write that had begun the provider is told once";
   for (const QXURL& item : items) {
     const std::string name = fs::path(item.fileSystemPath()).filename();
@@ -124,8 +124,9 @@ TEST_F(CoordinationCrowd, LosesNoUpdateSeesNoHalfWriteAndLeavesNobodyBehind) {
     return after.descriptors <= before.descriptors && after.processes <= before.processes;
   });
   std::cout << seconds << " s, " << kMembers << " members, " << kItems << " items\n"
-            << ended.output << "descriptors: " << before.descriptors << ", " << after.descriptors << "\nprocesses: " << before.processes
-            << ", " << after.processes << "\nbefore " << before.memory << "\nafter " << after.memory << "\n";
+            << ended.output << "tellings: " << tellings << "\ndescriptors: " << before.descriptors << ", " << after.descriptors
+            << "\nprocesses: " << before.processes << ", " << after.processes << "\nbefore " << before.memory << "\nafter " << after.memory
+            << "\n";
 }
 
 TEST_F(CoordinationCrowd, ReadsOfOneProvidersItemSucceedWhileAnotherProviderHangs) {
