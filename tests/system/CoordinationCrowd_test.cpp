@@ -7,14 +7,13 @@
 #include <cstdint>
 #include <cstdlib>
 #include <filesystem>
-#include <fstream>
 #include <iostream>
-#include <iterator>
 #include <map>
 #include <sstream>
 #include <string>
 #include <vector>
 
+#include "tests/system/house/Burden.h"
 #include "tests/system/house/TurnTest.h"
 
 namespace docuvend::tests {
@@ -44,31 +43,7 @@ long given(const char* variable, long otherwise) {
 
 class CoordinationCrowd : public TurnTest {
  protected:
-  struct Burden {
-    std::size_t descriptors = 0;
-    std::size_t processes = 0;
-    std::string memory;
-  };
-  [[nodiscard]] Burden burden() {
-    const fs::path daemon = "/proc/" + std::to_string(house_.daemon().pid());
-    Burden result;
-    result.descriptors = static_cast<std::size_t>(std::distance(fs::directory_iterator(daemon / "fd"), fs::directory_iterator()));
-    result.processes = descendants(std::to_string(house_.daemon().pid()));
-    std::ifstream status(daemon / "status");
-    for (std::string line; std::getline(status, line);) {
-      if (line.starts_with("VmRSS:")) result.memory = line;
-    }
-    return result;
-  }
-  static std::size_t descendants(const std::string& process) {
-    std::size_t result = 0;
-    std::error_code ignored;
-    for (const auto& task : fs::directory_iterator("/proc/" + process + "/task", ignored)) {
-      std::istringstream children(contentsOf(task.path() / "children"));
-      for (std::string child; children >> child;) result += 1 + descendants(child);
-    }
-    return result;
-  }
+  [[nodiscard]] Burden burden() { return burdenOf(house_.daemon().pid()); }
   [[nodiscard]] Command turntaker(const std::vector<std::string>& words) const {
     Command command{{std::string(DOCUVEND_BIN) + "/docuvend-turntaker"}, house_.environment(), {}};
     command.words.insert(command.words.end(), words.begin(), words.end());

@@ -20,6 +20,7 @@
 #include "platform/linux/bundles/BundleInstaller.h"
 #include "platform/linux/files/LinuxPropertyLists.h"
 #include "sdk/BlockingCall.h"
+#include "tests/system/house/Burden.h"
 #include "tests/system/house/DaemonHouse.h"
 
 namespace docuvend::tests {
@@ -343,28 +344,9 @@ class Tally {
 
 class Churn : public LiveRegistry {
  protected:
-  [[nodiscard]] std::size_t descriptors() {
-    const fs::path path = "/proc/" + std::to_string(house_.daemon().pid()) + "/fd";
-    return static_cast<std::size_t>(std::distance(fs::directory_iterator(path), fs::directory_iterator()));
-  }
-  [[nodiscard]] std::string memory() {
-    std::ifstream status("/proc/" + std::to_string(house_.daemon().pid()) + "/status");
-    for (std::string line; std::getline(status, line);) {
-      if (line.starts_with("VmRSS:")) return line;
-    }
-    return "unknown";
-  }
-  // Of a process, whatever they are called.
-  static std::size_t descendants(const std::string& process) {
-    std::size_t result = 0;
-    std::error_code ignored;
-    for (const auto& task : fs::directory_iterator("/proc/" + process + "/task", ignored)) {
-      std::istringstream children(contentsOf(task.path() / "children"));
-      for (std::string child; children >> child;) result += 1 + descendants(child);
-    }
-    return result;
-  }
-  [[nodiscard]] std::size_t processes() { return descendants(std::to_string(house_.daemon().pid())); }
+  [[nodiscard]] std::size_t descriptors() { return burdenOf(house_.daemon().pid()).descriptors; }
+  [[nodiscard]] std::string memory() { return burdenOf(house_.daemon().pid()).memory; }
+  [[nodiscard]] std::size_t processes() { return burdenOf(house_.daemon().pid()).processes; }
 
   // Does the work again and again with a client of its own until the end.
   void keepDoing(std::function<void(Client&)> work) {

@@ -24,13 +24,6 @@ constexpr auto kPatience = std::chrono::seconds(60);
 // Every second member may be killed.
 constexpr std::size_t kKindsOfFate = 2;
 
-std::string contentsOf(const std::string& path) {
-  const std::ifstream file(path, std::ios::binary);
-  std::ostringstream contents;
-  contents << file.rdbuf();
-  return std::move(contents).str();
-}
-
 }  // namespace
 
 Crowd::Crowd(CrowdPlan plan, Board& board) : plan_(std::move(plan)), board_(board), random_(plan_.members) {}

@@ -1,8 +1,9 @@
 #include "tests/system/turntaker/Ledger.h"
 
 #include <cstdint>
-#include <cstdio>
+#include <fstream>
 #include <sstream>
+#include <utility>
 
 namespace docuvend::turntaker {
 namespace {
@@ -15,6 +16,13 @@ std::string lastLine(const std::string& body) {
 }
 
 }  // namespace
+
+std::string contentsOf(const std::string& path) {
+  const std::ifstream file(path, std::ios::binary);
+  std::ostringstream contents;
+  contents << file.rdbuf();
+  return std::move(contents).str();
+}
 
 std::string ledgerText(const std::vector<std::string>& entries) {
   std::string body;

@@ -8,6 +8,8 @@
 
 namespace docuvend::turntaker {
 
+// All that a file holds, and nothing when there is none.
+[[nodiscard]] std::string contentsOf(const std::string& path);
 [[nodiscard]] std::string ledgerText(const std::vector<std::string>& entries);
 // None when the text is no whole ledger.
 [[nodiscard]] std::optional<std::vector<std::string>> parseLedger(const std::string& text);

@@ -5,9 +5,7 @@
 
 #include <cerrno>
 #include <cstdio>
-#include <fstream>
 #include <random>
-#include <sstream>
 #include <string_view>
 #include <thread>
 #include <utility>
@@ -24,13 +22,6 @@ using linux_platform::UniqueDescriptor;
 constexpr int kTurnsForAWrite = 3;
 
 QXURL urlOf(const std::string& path) { return QXURL::fileURL(path, QXURLKind::file); }
-
-std::string contentsOf(const std::string& path) {
-  const std::ifstream file(path, std::ios::binary);
-  std::ostringstream contents;
-  contents << file.rdbuf();
-  return std::move(contents).str();
-}
 
 Failure writeAll(const UniqueDescriptor& file, std::string_view text) {
   while (!text.empty()) {
