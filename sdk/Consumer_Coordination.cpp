@@ -9,6 +9,7 @@
 #include <algorithm>
 #include <atomic>
 #include <cerrno>
+#include <initializer_list>
 #include <utility>
 
 #include "platform/linux/wire/FileCoordinationProtocol.h"
@@ -61,16 +62,12 @@ void tellProgress(const Connection& connection, const QXUUID& accessID, TimePoin
   progress({static_cast<std::uint64_t>(*present), static_cast<std::uint64_t>(*size)});
 }
 
-std::optional<CoordinationKind> kindOf(const std::string& text) {
-  if (text == "reading") return CoordinationKind::reading;
-  if (text == "writing") return CoordinationKind::writing;
-  return std::nullopt;
-}
-
-std::optional<FileHolder::State> stateOf(const std::string& text) {
-  if (text == "holding") return FileHolder::State::holding;
-  if (text == "providing") return FileHolder::State::providing;
-  if (text == "waiting") return FileHolder::State::waiting;
+// The value that is called so.
+template <class T>
+std::optional<T> named(const std::string& text, std::initializer_list<T> values) {
+  for (const T value : values) {
+    if (text == nameOf(value)) return value;
+  }
   return std::nullopt;
 }
 
@@ -81,8 +78,9 @@ std::optional<FileHolder> holderFrom(const QXValue& value) {
   const auto* stateText = qxFind<std::string>(*entry, "state");
   const auto* own = qxFind<bool>(*entry, "own");
   if (kindText == nullptr || stateText == nullptr || own == nullptr) return std::nullopt;
-  const auto kind = kindOf(*kindText);
-  const auto state = stateOf(*stateText);
+  using State = FileHolder::State;
+  const auto kind = named(*kindText, {CoordinationKind::reading, CoordinationKind::writing});
+  const auto state = named(*stateText, {State::holding, State::providing, State::waiting});
   if (!kind || !state) return std::nullopt;
   FileHolder holder{*kind, *state, *own, std::nullopt, std::nullopt};
   if (const auto* process = qxFind<std::int64_t>(*entry, "processIdentifier")) holder.processIdentifier = *process;

@@ -54,6 +54,20 @@ struct FileHolder {
   friend bool operator==(const FileHolder&, const FileHolder&) = default;
 };
 
+// As they are called on the wire.
+[[nodiscard]] constexpr const char* nameOf(CoordinationKind kind) { return kind == CoordinationKind::reading ? "reading" : "writing"; }
+[[nodiscard]] constexpr const char* nameOf(FileHolder::State state) {
+  switch (state) {
+    case FileHolder::State::holding:
+      return "holding";
+    case FileHolder::State::providing:
+      return "providing";
+    case FileHolder::State::waiting:
+      break;
+  }
+  return "waiting";
+}
+
 // Made by Consumer::coordinateReading and coordinateWriting; may outlive the Consumer. For one thread at a time. The access ends with this
 // object, which then waits for the end like `end`; one that was moved from, or has ended, holds nothing.
 class CoordinatedAccess {

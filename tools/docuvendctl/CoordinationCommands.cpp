@@ -17,20 +17,6 @@ namespace {
 
 using linux_platform::UniqueDescriptor;
 
-const char* nameOf(CoordinationKind kind) { return kind == CoordinationKind::reading ? "reading" : "writing"; }
-
-const char* nameOf(FileHolder::State state) {
-  switch (state) {
-    case FileHolder::State::holding:
-      return "holding";
-    case FileHolder::State::providing:
-      return "providing";
-    case FileHolder::State::waiting:
-      break;
-  }
-  return "waiting";
-}
-
 Result<Answer> read(Consumer& consumer, const Call& call) {
   auto url = parseURL(call.operands[0]);
   if (auto* error = std::get_if<QXError>(&url)) return *error;

@@ -10,18 +10,6 @@ constexpr auto kPatience = std::chrono::seconds(60);
 constexpr auto kBetweenLooks = std::chrono::milliseconds(2);
 constexpr const char* kNoTurn = "no turn";
 
-const char* name(FileHolder::State state) {
-  switch (state) {
-    case FileHolder::State::holding:
-      return "holding";
-    case FileHolder::State::providing:
-      return "providing";
-    case FileHolder::State::waiting:
-      break;
-  }
-  return "waiting";
-}
-
 }  // namespace
 
 std::optional<std::string> Turns::perform(const std::string& verb, Words& words) {
@@ -83,7 +71,7 @@ std::string Turns::holders(const QXURL& url) {
   std::string line;
   for (const FileHolder& holder : std::get<std::vector<FileHolder>>(result)) {
     if (!line.empty()) line += ", ";
-    line.append(holder.kind == CoordinationKind::reading ? "reading " : "writing ").append(name(holder.state));
+    line.append(nameOf(holder.kind)).append(" ").append(nameOf(holder.state));
     if (holder.isOwnProcess) line += " own";
     if (holder.processIdentifier) line.append(" process");
     if (holder.bundleIdentifier) line.append(" ").append(holder.bundleIdentifier->value);
