@@ -128,9 +128,10 @@ FilePlace::Result FilePlace::ofItem(const std::string& path) {
   return EAGAIN;
 }
 
-FilePlace::Result FilePlace::ofDirectory(const std::string& path) {
+FilePlace::Result FilePlace::ofDirectory(const std::string& path, LastLink lastLink) {
+  const int flags = O_PATH | O_DIRECTORY | O_CLOEXEC | (lastLink == LastLink::refused ? O_NOFOLLOW : 0);
   for (int round = 0; round < kRounds; ++round) {
-    const UniqueDescriptor file(::open(path.c_str(), O_PATH | O_DIRECTORY | O_CLOEXEC));
+    const UniqueDescriptor file(::open(path.c_str(), flags));
     if (!file) return errno;
     Text name = kernelName(file.get());
     if (auto* existing = std::get_if<std::string>(&name)) return FilePlace{std::move(*existing), {}};

@@ -6,6 +6,9 @@
 
 namespace docuvend::linux_platform {
 
+// What becomes of a link that is the path's last component. A link that is refused is no directory.
+enum class LastLink { followed, refused };
+
 struct FilePlace {
   std::string existing;  // absolute, without links, "." and ".."
   std::string missing;   // components below it, without "." and ".."; empty when all of the path exists
@@ -15,8 +18,8 @@ struct FilePlace {
 
   // Links are followed, those too that point to what does not exist yet. ENOENT when a missing component is followed by "..".
   [[nodiscard]] static Result ofItem(const std::string& path);
-  // ENOENT when there is no such directory, ENOTDIR when it is something else.
-  [[nodiscard]] static Result ofDirectory(const std::string& path);
+  // ENOENT when there is no such directory, ENOTDIR when it is something else. Links on the way are followed.
+  [[nodiscard]] static Result ofDirectory(const std::string& path, LastLink lastLink = LastLink::followed);
 
   // True when this place is somewhere below that directory; false for the directory itself.
   [[nodiscard]] bool isBelow(const FilePlace& directory) const;

@@ -49,7 +49,8 @@ std::optional<QXError> LinuxFileSystem::createDirectory(const std::string& path)
 }
 
 std::variant<QXRelationship, QXError> LinuxFileSystem::relationship(const QXURL& directory, const QXURL& item) {
-  const auto directoryPlace = FilePlace::ofDirectory(directory.fileSystemPath());
+  // Whoever may write beside a directory of documents could make it a link to somebody else's, which would be his then.
+  const auto directoryPlace = FilePlace::ofDirectory(directory.fileSystemPath(), LastLink::refused);
   if (const int* error = std::get_if<int>(&directoryPlace)) {
     return *error == ENOENT ? noSuchDirectory(directory) : systemError(*error, directory);
   }
