@@ -70,7 +70,7 @@ prctl_mm_map ownMemory() {
   std::vector<std::uint64_t> fields(3, 0);
   std::string state;
   rest >> state;
-  for (std::int64_t value = 0; rest >> value;) fields.push_back(static_cast<std::uint64_t>(value));
+  for (std::string value; rest >> value;) fields.push_back(std::strtoull(value.c_str(), nullptr, 10));
   prctl_mm_map map{};
   map.start_code = fields.at(kStartCode - 1);
   map.end_code = fields.at(kStartCode);
@@ -120,10 +120,10 @@ std::string becomeOrphan() {
 }
 
 std::string put(Words& words) {
-  const UniqueDescriptor file(::open(words.next().c_str(), O_WRONLY | O_CREAT | O_TRUNC | O_CLOEXEC, 0600));
-  if (!file) return outcome(-1);
+  const std::string path = words.next();
   const std::string text = words.next();
-  return outcome(::write(file.get(), text.data(), text.size()));
+  const UniqueDescriptor file(::open(path.c_str(), O_WRONLY | O_CREAT | O_TRUNC | O_CLOEXEC, 0600));
+  return outcome(file ? ::write(file.get(), text.data(), text.size()) : -1);
 }
 
 std::string processes() {

@@ -14,6 +14,7 @@
 
 #include "platform/linux/wire/ConnectToSocket.h"
 #include "platform/linux/wire/SandboxProtocol.h"
+#include "tests/attacks/told.h"
 #include "tests/system/house/Client.h"
 #include "tests/system/knock.h"
 
@@ -22,6 +23,7 @@ namespace {
 
 using linux_platform::UniqueDescriptor;
 using tests::Client;
+using tests::told;
 
 UniqueDescriptor asideForTheNext;
 
@@ -68,12 +70,6 @@ std::string redeem(Words& words) {
 }
 
 }  // namespace
-
-std::string told(const QXError& error) {
-  const std::string own = error.domain + " " + std::to_string(error.code);
-  return error.underlying ? own + " < " + told(*error.underlying) : own;
-}
-std::string told(const std::optional<QXError>& error) { return error ? told(*error) : "ok"; }
 
 std::string publicSocket(const std::string& service) {
   const char* runtime = std::getenv("XDG_RUNTIME_DIR");
