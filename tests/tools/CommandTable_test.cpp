@@ -48,6 +48,7 @@ TEST(CommandTable, HasEveryOperationOfTheDaemonAndOfItsAdministration) {
                            "uninstall",
                            "platform lock-state",
                            "platform first-unlock",
+                           "doctor",
                            "version",
                            "help"}) {
     EXPECT_NE(CommandTable::all().find(name), nullptr) << name;

@@ -9,6 +9,7 @@
 
 #include "platform/QXValue.h"
 #include "sdk/CoordinatedAccess.h"
+#include "tools/docuvendctl/Outcome.h"
 
 namespace docuvend::ctl {
 
@@ -46,6 +47,12 @@ struct Contents {
   std::shared_ptr<CoordinatedAccess> access = {};
 };
 
-using Answer = std::variant<Nothing, Line, Record, List, Page, Contents>;
+// A list that says by itself how the command ends: what it found was not as it should be, though the command was done.
+struct Report {
+  List list;
+  ExitStatus status;
+};
+
+using Answer = std::variant<Nothing, Line, Record, List, Page, Contents, Report>;
 
 }  // namespace docuvend::ctl

@@ -1,4 +1,5 @@
 #include "tools/docuvendctl/CommandTable.h"
+#include "tools/docuvendctl/Doctor.h"
 #include "tools/docuvendctl/Help.h"
 #include "tools/docuvendctl/Operands.h"
 
@@ -32,18 +33,27 @@ Result<Answer> help(const Call& call) {
 }  // namespace
 
 CommandGroup generalCommands() {
-  return {"The daemon and this program",
-          {
-              {"wake", "", {}, "make sure that the daemon answers", "Prints nothing.\n", wake},
-              {"providers",
-               "",
-               {},
-               "list the providers and where their documents lie",
-               "Needs one of Docuvend's entitlements. Prints a list: provider, storage (a URL; unknown, null, where there is none).\n",
-               providers},
-              {"version", "", {}, "print this program's version", "Prints: version.\n", version},
-              {"help", "[COMMAND...]", {}, "explain a command, or all", "Prints: help.\n", help},
-          }};
+  return {
+      "The daemon and this program",
+      {
+          {"wake", "", {}, "make sure that the daemon answers", "Prints nothing.\n", wake},
+          {"providers",
+           "",
+           {},
+           "list the providers and where their documents lie",
+           "Needs one of Docuvend's entitlements. Prints a list: provider, storage (a URL; unknown, null, where there is none).\n",
+           providers},
+          {"doctor",
+           "",
+           {},
+           "examine which protections are in force here",
+           "Tries what can be tried, starts a confined process among it, and asks the daemon when one runs. Not from inside a\n"
+           "confinement. Prints a list: protection, state, finding. The state is in force, missing (the rest works without it) or fatal\n"
+           "(nothing can be started). Exit status: 0 all in force, 11 something is missing, 12 something is fatal.\n",
+           doctor},
+          {"version", "", {}, "print this program's version", "Prints: version.\n", version},
+          {"help", "[COMMAND...]", {}, "explain a command, or all", "Prints: help.\n", help},
+      }};
 }
 
 }  // namespace docuvend::ctl

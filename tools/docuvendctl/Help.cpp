@@ -26,7 +26,8 @@ constexpr std::string_view kOutput =
 constexpr std::string_view kStatuses =
     "\n"
     "Exit status: 0 done, 2 usage, 3 not permitted, 4 not found, 5 the provider failed, 6 invalid input, 7 the daemon cannot be reached,\n"
-    "8 no answer in time, 9 a file could not be used, 10 anything else.\n";
+    "8 no answer in time, 9 a file could not be used, 10 anything else; of doctor also 11 a protection is missing, 12 nothing can be\n"
+    "started.\n";
 
 using Entries = std::vector<std::pair<std::string, std::string_view>>;
 

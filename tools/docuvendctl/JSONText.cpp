@@ -63,6 +63,7 @@ struct AsJSON {
   JSON operator()(const Page& page) const { return {{page.name, page.text}}; }
   JSON operator()(const Contents& contents) const { return {{"url", contents.url.absoluteString()}}; }
   JSON operator()(const List& list) const { return jsonOf(list); }
+  JSON operator()(const Report& report) const { return jsonOf(report.list); }
   JSON operator()(const Record& record) const {
     JSON object = JSON::object();
     for (const auto& [name, value] : record.fields) {

@@ -20,6 +20,8 @@ enum class ExitStatus {
   deadlinePassed = 8,
   fileError = 9,
   other = 10,
+  protectionMissing = 11,
+  nothingStarts = 12,
 };
 
 inline constexpr const char* kControlErrorDomain = "DVControlErrorDomain";

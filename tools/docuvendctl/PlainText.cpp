@@ -47,6 +47,7 @@ struct Plain {
     for (const auto& row : list.rows) text += rowText(row);
     return text;
   }
+  std::string operator()(const Report& report) const { return (*this)(report.list); }
   std::string operator()(const Record& record) const {
     std::string text;
     for (const auto& [name, value] : flattened(record).fields) {

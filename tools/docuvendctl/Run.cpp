@@ -62,7 +62,8 @@ ExitStatus run(const std::vector<std::string>& words) {
 
   if (const auto* error = std::get_if<QXError>(&answer)) return fail(printer, *error);
   if (const auto failure = printer.print(std::get<Answer>(answer))) return fail(printer, *failure);
-  return ExitStatus::done;
+  const auto* report = std::get_if<Report>(&std::get<Answer>(answer));
+  return report == nullptr ? ExitStatus::done : report->status;
 }
 
 }  // namespace docuvend::ctl

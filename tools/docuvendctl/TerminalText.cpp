@@ -98,6 +98,7 @@ struct Terminal {
   std::string operator()(const Page& page) const { return page.text; }
   std::string operator()(const Contents&) const { return {}; }
   std::string operator()(const List& list) const { return table(list, width); }
+  std::string operator()(const Report& report) const { return table(report.list, width); }
   std::string operator()(const Record& record) const {
     const Record flat = flattened(record);
     std::size_t nameWidth = 0;

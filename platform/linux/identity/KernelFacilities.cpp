@@ -17,7 +17,6 @@ namespace docuvend::linux_platform {
 namespace {
 
 constexpr long kPidFileSystem = 0x50494446;
-constexpr int kTruncateLevel = 3;
 
 bool probePeerPidfd() {
   std::array<int, 2> ends{};
@@ -36,7 +35,7 @@ std::string describeConfinement(int level) {
   const std::string name = "Landlock level " + std::to_string(level) + ": ";
   if (level >= kLandlockScopesLevel) return name + "files, abstract sockets and signals are closed to confined processes.";
   const std::string rest = "; applications have no network, and an extension can reach abstract sockets.";
-  if (level >= kTruncateLevel) return name + "files are closed to confined processes" + rest;
+  if (level >= kLandlockTruncateLevel) return name + "files are closed to confined processes" + rest;
   return name + "files are closed to confined processes, truncation by the mount namespace alone" + rest;
 }
 

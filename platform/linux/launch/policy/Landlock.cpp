@@ -20,8 +20,6 @@ namespace docuvend::linux_platform {
 namespace {
 
 constexpr int kReferLevel = 2;
-constexpr int kTruncateLevel = 3;
-constexpr int kIoctlDeviceLevel = 5;
 
 constexpr std::uint64_t kRead = LANDLOCK_ACCESS_FS_READ_FILE | LANDLOCK_ACCESS_FS_READ_DIR;
 constexpr std::uint64_t kWriteFile = LANDLOCK_ACCESS_FS_WRITE_FILE | kernel::kLandlockTruncate;
@@ -37,8 +35,8 @@ constexpr std::uint64_t kFileRights = LANDLOCK_ACCESS_FS_EXECUTE | LANDLOCK_ACCE
 std::uint64_t knownAt(int level) {
   std::uint64_t rights = kEverything;
   if (level < kReferLevel) rights &= ~std::uint64_t{LANDLOCK_ACCESS_FS_REFER};
-  if (level < kTruncateLevel) rights &= ~kernel::kLandlockTruncate;
-  if (level < kIoctlDeviceLevel) rights &= ~kernel::kLandlockIoctlDevice;
+  if (level < kLandlockTruncateLevel) rights &= ~kernel::kLandlockTruncate;
+  if (level < kLandlockDevicesLevel) rights &= ~kernel::kLandlockIoctlDevice;
   return rights;
 }
 

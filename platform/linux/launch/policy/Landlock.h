@@ -9,6 +9,9 @@
 
 namespace docuvend::linux_platform {
 
+// From this level on it has a say over truncation; from this one over what is asked of devices.
+inline constexpr int kLandlockTruncateLevel = 3;
+inline constexpr int kLandlockDevicesLevel = 5;
 // From this level on a confined process can no longer reach abstract sockets or send signals outside.
 inline constexpr int kLandlockScopesLevel = 6;
 
