@@ -4,6 +4,7 @@
 #include <sys/file.h>
 #include <sys/prctl.h>
 #include <sys/resource.h>
+#include <sys/stat.h>
 #include <unistd.h>
 
 #include <algorithm>
@@ -44,6 +45,8 @@ constexpr const char* kClientServiceName = "com.orvane.Docuvend";
 constexpr const char* kAdministrationServiceName = "com.orvane.Administration";
 // A thread that serves a request may wait for a disk; one more at least is left for the others.
 constexpr unsigned kFewestReactorThreads = 4;
+// What this process and the extensions make is the user's alone, whatever a login leaves to others.
+constexpr mode_t kOwnerOnlyMask = 077;
 
 // Confined processes see the public directory and nothing beside it. That the administration is not for them does not rest on this.
 NamedServices namedServices(const Paths& paths) {
@@ -135,6 +138,7 @@ struct LinuxPlatform::Services {
 std::variant<std::unique_ptr<LinuxPlatform>, QXError> LinuxPlatform::create() {
   if (::geteuid() == 0) return QXError::system(EPERM, "a sandbox made by root keeps too much; run as an ordinary user");
   if (::prctl(PR_SET_NO_NEW_PRIVS, 1, 0, 0, 0) != 0) return QXError::system(errno, "cannot give up new privileges");
+  ::umask(kOwnerOnlyMask);
   takeAllDescriptors();
   auto found = Paths::fromEnvironment();
   if (auto* error = std::get_if<QXError>(&found)) return *error;
