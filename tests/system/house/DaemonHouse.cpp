@@ -127,6 +127,7 @@ std::vector<std::string> DaemonHouse::environment() const {
   for (const char* name : {"ASAN_OPTIONS", "UBSAN_OPTIONS", "LSAN_OPTIONS"}) {
     if (const char* value = std::getenv(name)) result.push_back(std::string(name) + "=" + value);
   }
+  result.insert(result.end(), additions_.begin(), additions_.end());
   return result;
 }
 

@@ -10,6 +10,7 @@
 #include <memory>
 #include <optional>
 #include <string>
+#include <utility>
 #include <vector>
 
 #include "platform/linux/base/UniqueDescriptor.h"
@@ -78,6 +79,8 @@ class DaemonHouse {
   Ending ctl(const std::vector<std::string>& arguments, const std::string& input = {}) const;
   Ending confined(const std::string& bundle, const std::vector<std::string>& arguments, const std::string& input = {}) const;
   [[nodiscard]] std::vector<std::string> environment() const;
+  // "NAME=value", for every program that is started from now on.
+  void addToEnvironment(std::string entry) { additions_.push_back(std::move(entry)); }
 
   // Has the picker, confined, grant a consumer a document of the cellar; its bookmarkable string.
   std::string granted(const std::string& path, const std::string& consumer) const;
@@ -106,6 +109,7 @@ class DaemonHouse {
 
   std::string root_;
   std::string home_;
+  std::vector<std::string> additions_;  // to the environment
   linux_platform::UniqueDescriptor logDescriptor_;
   std::unique_ptr<Process> daemon_;
   std::unique_ptr<Client> companion_;

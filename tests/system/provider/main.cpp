@@ -4,8 +4,11 @@
 //   performInitialSetup          waits while the file "hang" lies in its container
 //
 //   identifierForItem  control   an identifier with the character U+0001
-//                      refused   an error
+//                      refused   an error, whose text is the file "says" in its container, if that is there
+//                      prints    prints the file "prints" in its container
 //                      garbage   bytes that are no frame, to the daemon
+//                      unasked   an answer to a message that it was not sent
+//                      leave     closes its connection and stays
 //                      abort     abort()
 //                      knock     what the administration answers at the socket "door" in its group's container
 //                      hoard     has as many descriptors on their way as the kernel allows it, and says so
@@ -27,14 +30,21 @@
 #include <sys/socket.h>
 #include <unistd.h>
 
-#include <array>
 #include <chrono>
+#include <cstdint>
 #include <cstdio>
 #include <cstdlib>
 #include <filesystem>
+#include <fstream>
+#include <iterator>
+#include <span>
 #include <string>
 #include <thread>
+#include <utility>
+#include <variant>
+#include <vector>
 
+#include "platform/linux/wire/Frame.h"
 #include "sdk/Provider.h"
 #include "tests/system/knock.h"
 #include "tests/system/provider/excess.h"
@@ -42,10 +52,24 @@
 namespace docuvend {
 namespace {
 
+using linux_platform::EncodedFrame;
+using linux_platform::encodeFrame;
+using linux_platform::ReplyFrame;
+
 constexpr int kDaemonSocket = 3;
 constexpr int kManyLines = 20'000;
+constexpr std::uint64_t kNeverAsked = 1'000'000'000;
 
-QXError refusal() { return QXError::make("TricksterErrorDomain", 1, "No."); }
+std::string contentsOf(const char* path, std::string otherwise) {
+  std::ifstream file(path, std::ios::binary);
+  return file ? std::string(std::istreambuf_iterator<char>(file), {}) : std::move(otherwise);
+}
+
+QXError refusal() { return QXError::make("TricksterErrorDomain", 1, contentsOf("says", "No.")); }
+
+void sendToDaemon(std::span<const std::uint8_t> bytes) {
+  if (send(kDaemonSocket, bytes.data(), bytes.size(), MSG_NOSIGNAL) < 0) std::abort();
+}
 
 std::string storage(const std::string& group = "com.orvane.trickster.documents") {
   return providerGroupContainer(group).value_or("") + "/Docuvend Storage";
@@ -88,11 +112,10 @@ class Trickster : public Provider {
     if (name == "abort") std::abort();
     if (name == "hoard") std::fprintf(stderr, "has hoarded %d descriptors\n", tests::hoardDescriptors());
     if (name == "knock") return ItemID{tests::knock(storage() + "/../door", {"first-unlock"})};
-    if (name == "garbage") {
-      std::array<unsigned char, 64> bytes{};
-      bytes.fill(0xff);
-      if (send(kDaemonSocket, bytes.data(), bytes.size(), MSG_NOSIGNAL) < 0) std::abort();
-    }
+    if (name == "garbage") sendToDaemon(std::vector<std::uint8_t>(64, 0xff));
+    if (name == "unasked") sendToDaemon(std::get<EncodedFrame>(encodeFrame(ReplyFrame{kNeverAsked, {}})).bytes);
+    if (name == "leave") shutdown(kDaemonSocket, SHUT_RDWR);
+    if (name == "prints") std::fputs(contentsOf("prints", {}).c_str(), stderr);
     return ItemID{name};
   }
 
