@@ -1,5 +1,7 @@
 #include "service/DVSandboxTokens.h"
 
+#include <string>
+
 #include "common/DVErrors.h"
 #include "platform/QXPlatform.h"
 #include "providers/DVExtensionDocuvend.h"
@@ -21,6 +23,15 @@ std::optional<QXData> issuedToken(const QXURL& url) {
   return QXData::fromText(*token);
 }
 
+std::string lastComponent(const std::string& path) { return path.substr(path.rfind('/') + 1); }
+
+// The sibling's URL is the item's text with a dot in it. An escaped slash or a way up makes that the name of another file, for which
+// nobody has asked.
+bool isHiddenBeside(const QXURL& sibling, const QXURL& item) {
+  const std::string name = lastComponent(item.fileSystemPath());
+  return name != "." && name != ".." && lastComponent(sibling.fileSystemPath()) == "." + name;
+}
+
 }  // namespace
 
 std::variant<DVSandboxTokens, QXError> dvIssueTokens(const DVExtensionDocuvend& provider, const std::optional<QXURL>& url) {
@@ -29,7 +40,7 @@ std::variant<DVSandboxTokens, QXError> dvIssueTokens(const DVExtensionDocuvend& 
   DVSandboxTokens tokens;
   tokens.siblingURL = dvHiddenSiblingURL(*url);
   tokens.item = issuedToken(*url);
-  if (tokens.siblingURL) tokens.sibling = issuedToken(*tokens.siblingURL);
+  if (tokens.siblingURL && isHiddenBeside(*tokens.siblingURL, *url)) tokens.sibling = issuedToken(*tokens.siblingURL);
   return tokens;
 }
 
