@@ -5,6 +5,7 @@
 #include <string_view>
 
 #include "platform/linux/files/property_list_scalars.h"
+#include "platform/xml_text.h"
 
 namespace docuvend::linux_platform {
 namespace {
@@ -78,7 +79,7 @@ class Writer {
   }
 
   [[nodiscard]] bool leaf(std::string_view name, std::string_view content) {
-    if (!isXMLText(content)) return false;
+    if (!qxIsXMLText(content)) return false;
     std::string element(1, '<');
     element.append(name).append(1, '>');
     while (!content.empty()) {

@@ -5,8 +5,6 @@
 #include <charconv>
 #include <cmath>
 
-#include "platform/QXURL.h"
-
 namespace docuvend::linux_platform {
 namespace {
 
@@ -29,12 +27,6 @@ std::optional<Number> numberFromText(std::string_view text) {
 }
 
 }  // namespace
-
-bool isXMLText(std::string_view text) {
-  if (!qxIsValidUTF8(text)) return false;
-  if (text.find("\xEF\xBF\xBE") != std::string_view::npos || text.find("\xEF\xBF\xBF") != std::string_view::npos) return false;
-  return std::none_of(text.begin(), text.end(), [](char c) { return static_cast<unsigned char>(c) < ' ' && !isXMLSpace(c); });
-}
 
 std::optional<std::int64_t> integerFromText(std::string_view text) { return numberFromText<std::int64_t>(text); }
 

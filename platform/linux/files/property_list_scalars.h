@@ -16,9 +16,6 @@ inline constexpr std::size_t kPropertyListMaximumBytes = 16UL << 20U;    // of t
 inline constexpr std::size_t kPropertyListMaximumElements = 1UL << 18U;  // tags, <plist> and keys among them
 inline constexpr std::size_t kPropertyListMaximumDepth = 64;             // elements inside each other
 
-// True for valid UTF-8 made of the characters that XML 1.0 can carry.
-[[nodiscard]] bool isXMLText(std::string_view text);
-
 // None when the text is not exactly one number of that kind, or out of its range. White space around it is passed over.
 [[nodiscard]] std::optional<std::int64_t> integerFromText(std::string_view text);
 [[nodiscard]] std::optional<double> realFromText(std::string_view text);

@@ -1,7 +1,7 @@
 #include "platform/linux/wire/Bytes.h"
 
-#include "platform/QXURL.h"
 #include "platform/linux/wire/Limits.h"
+#include "platform/xml_text.h"
 
 namespace docuvend::linux_platform {
 namespace {
@@ -17,15 +17,7 @@ Number littleEndian(std::span<const std::uint8_t> bytes) {
 
 }  // namespace
 
-bool isTransmissibleText(std::string_view text) {
-  if (!qxIsValidUTF8(text)) return false;
-  for (const char c : text) {
-    const auto byte = static_cast<unsigned char>(c);
-    if (byte < 0x20 && c != '\t' && c != '\n' && c != '\r') return false;
-  }
-  // U+FFFE and U+FFFF.
-  return text.find("\xEF\xBF\xBE") == std::string_view::npos && text.find("\xEF\xBF\xBF") == std::string_view::npos;
-}
+bool isTransmissibleText(std::string_view text) { return qxIsXMLText(text); }
 
 void ByteWriter::u32(std::uint32_t value) {
   for (unsigned i = 0; i < sizeof value; ++i) bytes_.push_back(static_cast<std::uint8_t>(value >> (kBitsPerByte * i)));
