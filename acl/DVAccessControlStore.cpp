@@ -5,6 +5,7 @@
 #include <utility>
 #include <variant>
 
+#include "acl/DVGrantLimits.h"
 #include "common/DVLog.h"
 #include "platform/QXPlatform.h"
 
@@ -98,6 +99,13 @@ bool DVAccessControlStore::hasUnwrittenChanges() const {
 void DVAccessControlStore::writeUnwrittenChanges() {
   syncQueue_->sync([&] {
     if (syncQueueHasUnwrittenChanges_) syncQueueCommitAccessControl();
+  });
+}
+
+bool DVAccessControlStore::hasRoomFor(const ProviderID& provider, const ItemID& item, const ConsumerID& consumer) const {
+  return qxSync(*syncQueue_, [&] {
+    const DVGrantTree& tree = *syncQueueAccessControlDict_;
+    return tree.allows(provider, item, consumer) || dvHasRoomFor(tree, {provider, consumer, item});
   });
 }
 

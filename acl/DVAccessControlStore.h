@@ -45,6 +45,10 @@ class DVAccessControlStore final : public DVAccessControl, public std::enable_sh
   // Writes the list once more if that is so.
   void writeUnwrittenChanges();
 
+  // Whether the list has that grant or may be given it (DVGrantLimits.h). Asked before a grant that somebody else names; `allow` and
+  // `disallow` check nothing.
+  [[nodiscard]] bool hasRoomFor(const ProviderID& provider, const ItemID& item, const ConsumerID& consumer) const;
+
   void allowProviderWithIdentifier(const ProviderID& provider, const ItemID& toProvideItemID, const ConsumerID& toConsumerWithIdentifier);
   void disallowProviderWithIdentifier(const ProviderID& provider, const ItemID& fromProvidingItemWithID,
                                       const ConsumerID& toConsumerWithIdentifier);

@@ -71,6 +71,9 @@ class DVRpcServicer final : public DVDaemon, public std::enable_shared_from_this
   [[nodiscard]] std::shared_ptr<DVAccessControlStore> accessControlStore() const;
 
   // --- Grants
+
+  // False, with a line, when the list cannot hold it.
+  [[nodiscard]] bool recordGrant(const ProviderID& provider, const ItemID& item, const ConsumerID& consumer) const;
   void recordGrantAndIssueTokens(const SandboxRequest& request, const std::optional<QXError>& error,
                                  const std::optional<ItemID>& itemID) const;
   void replyWithTokens(const SandboxRequest& request) const;

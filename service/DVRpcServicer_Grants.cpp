@@ -59,6 +59,18 @@ void DVRpcServicer::extendSandboxForFileURL(std::optional<QXURL> url, std::optio
   });
 }
 
+// A grant that no file can hold would keep all later ones off the disk as well.
+bool DVRpcServicer::recordGrant(const ProviderID& provider, const ItemID& item, const ConsumerID& consumer) const {
+  const auto store = accessControlStore();
+  if (!store) return true;
+  if (!store->hasRoomFor(provider, item, consumer)) {
+    dvLog("[ERROR] The access control list cannot hold provider ID %@, item ID “%@” and consumer ID %@.", provider, item, consumer);
+    return false;
+  }
+  store->allowProviderWithIdentifier(provider, item, consumer);
+  return true;
+}
+
 void DVRpcServicer::recordGrantAndIssueTokens(const SandboxRequest& request, const std::optional<QXError>& error,
                                               const std::optional<ItemID>& itemID) const {
   // An extension that answers with neither error nor identifier has failed as well: there is no item that could be granted.
@@ -66,7 +78,10 @@ void DVRpcServicer::recordGrantAndIssueTokens(const SandboxRequest& request, con
     dvReplyWithError(request.reply, DVPluginOperationFailedError(error));
     return;
   }
-  if (const auto store = accessControlStore()) store->allowProviderWithIdentifier(request.providerID, *itemID, request.consumerID);
+  if (!recordGrant(request.providerID, *itemID, request.consumerID)) {
+    dvReplyWithError(request.reply, DVNotPermittedError());
+    return;
+  }
   replyWithTokens(request);
 }
 
@@ -121,7 +136,10 @@ void DVRpcServicer::recordGrantAndReplyWithString(const BookmarkRequest& request
     return;
   }
   const ProviderID providerID = request.provider->identifier().value_or(ProviderID{});
-  if (const auto store = accessControlStore()) store->allowProviderWithIdentifier(providerID, *itemID, request.consumerID);
+  if (!recordGrant(providerID, *itemID, request.consumerID)) {
+    dvReplyWithError(request.reply, DVNotPermittedError());
+    return;
+  }
   std::string string = DVBookmarkableString{providerID, *itemID}.text();
   dvLog("[DEBUG] Successfully generated bookmarkable string “%@” from URL %@.", string, request.url);
   if (request.reply) request.reply(std::move(string), /*error=*/std::nullopt);

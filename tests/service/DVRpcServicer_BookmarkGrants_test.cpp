@@ -1,4 +1,5 @@
 // Passing a document on to another application, by one that may write it.
+#include "acl/DVGrantLimits.h"
 #include "tests/service/ServicerFixture.h"
 
 namespace docuvend {
@@ -137,6 +138,33 @@ TEST_F(DVRpcServicerBookmarkGrantsTest, AGrantThatCannotBeWrittenStillAnswersWit
   extend(kReport, kStranger);
   EXPECT_EQ(lateAnswer().string, kString);
   EXPECT_TRUE(isGranted(kStranger));
+}
+
+TEST_F(DVRpcServicerBookmarkGrantsTest, AConsumerThatTheListCannotHoldIsNotPermittedAndLaterGrantsAreWritten) {
+  for (const std::string& name : {std::string("\x01"), std::string(kDVLongestGrantedConsumerID + 1, 'c')}) {
+    platform_.log.clear();
+    extend(kReport, ConsumerID{name});
+    const Answer answer = lateAnswer();
+    EXPECT_EQ(answer.error, DVNotPermittedError());
+    EXPECT_TRUE(answer.hasNoValue());
+    EXPECT_FALSE(isGranted(ConsumerID{name}));
+    EXPECT_EQ(logged().back(),
+              (fake_platform::FakeLogEntry{
+                  QXLogType::fault, "[ERROR] The access control list cannot hold provider ID com.orvane.cellar, item ID “" + kItem.value +
+                                        "” and consumer ID " + name + "."}));
+    EXPECT_TRUE(platform_.propertyLists.writes().empty());
+    answers_.clear();
+  }
+  extend(kReport, kStranger);
+  EXPECT_EQ(lateAnswer().string, kString);
+  EXPECT_TRUE(isGranted(kStranger));
+}
+
+TEST_F(DVRpcServicerBookmarkGrantsTest, AnItemThatTheListCannotHoldIsNotPermitted) {
+  answerItemID(*cellar_, /*error=*/std::nullopt, "\x01");
+  extend(kReport, kStranger);
+  EXPECT_EQ(lateAnswer().error, DVNotPermittedError());
+  EXPECT_TRUE(platform_.propertyLists.writes().empty());
 }
 
 TEST_F(DVRpcServicerBookmarkGrantsTest, NoTokensAreIssued) {

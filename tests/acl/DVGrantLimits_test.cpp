@@ -1,0 +1,98 @@
+#include "acl/DVGrantLimits.h"
+
+#include <gtest/gtest.h>
+
+#include <string>
+
+#include "platform/linux/files/PropertyListWriter.h"
+#include "platform/linux/files/property_list_scalars.h"
+
+namespace docuvend {
+namespace {
+
+using linux_platform::propertyListXML;
+
+const ProviderID kCellar{"com.orvane.cellar"};
+const ConsumerID kEditor{"com.example.editor"};
+const ItemID kItem{"1"};
+
+bool isTaken(DVGrantTree& tree, const DVGrant& grant) {
+  return dvHasRoomFor(tree, grant) && tree.allow(grant.provider, grant.item, grant.consumer);
+}
+
+TEST(DVGrantLimits, AConsumersIdentifierIsNoLongerThanItsLimit) {
+  const std::string longest(kDVLongestGrantedConsumerID, 'c');
+  EXPECT_TRUE(dvHasRoomFor({}, {kCellar, ConsumerID{longest}, kItem}));
+  EXPECT_FALSE(dvHasRoomFor({}, {kCellar, ConsumerID{longest + "c"}, kItem}));
+}
+
+TEST(DVGrantLimits, AnItemsIdentifierIsNoLongerThanItsLimit) {
+  const std::string longest(kDVLongestGrantedItemID, 'i');
+  EXPECT_TRUE(dvHasRoomFor({}, {kCellar, kEditor, ItemID{longest}}));
+  EXPECT_FALSE(dvHasRoomFor({}, {kCellar, kEditor, ItemID{longest + "i"}}));
+}
+
+TEST(DVGrantLimits, WhatTheFileCannotCarryIsNotTaken) {
+  for (const std::string& text : {std::string("\x01"), std::string("a\0b", 3), std::string("\xEF\xBF\xBE"), std::string("\xFF")}) {
+    EXPECT_FALSE(dvHasRoomFor({}, {ProviderID{text}, kEditor, kItem}));
+    EXPECT_FALSE(dvHasRoomFor({}, {kCellar, ConsumerID{text}, kItem}));
+    EXPECT_FALSE(dvHasRoomFor({}, {kCellar, kEditor, ItemID{text}}));
+  }
+  EXPECT_TRUE(dvHasRoomFor({}, {kCellar, ConsumerID{""}, ItemID{"drafts/Q&A\n<\xE2\x80\xAE>"}}));
+}
+
+TEST(DVGrantLimits, AnItemHasNoMoreConsumersThanItsLimit) {
+  DVGrantTree tree;
+  for (std::size_t i = 0; i < kDVMaximumConsumersOfItem; ++i) {
+    EXPECT_TRUE(isTaken(tree, {kCellar, ConsumerID{"com.example." + std::to_string(i)}, kItem})) << i;
+  }
+  EXPECT_FALSE(dvHasRoomFor(tree, {kCellar, kEditor, kItem}));
+  EXPECT_TRUE(dvHasRoomFor(tree, {kCellar, kEditor, ItemID{"2"}}));
+  EXPECT_TRUE(dvHasRoomFor(tree, {ProviderID{"com.orvane.attic"}, kEditor, kItem}));
+}
+
+// As DVGrantLimits.cpp counts them.
+constexpr std::size_t kBytesAroundItem = 32;
+constexpr std::size_t kBytesAroundConsumer = 160;
+constexpr std::size_t kItemLength = 480;
+constexpr std::size_t kBytesOfItem = kItemLength + kBytesAroundItem;
+
+TEST(DVGrantLimits, AProvidersGrantsTakeNoMoreThanItsShareAndOthersHaveTheirOwn) {
+  DVGrantTree tree;
+  const std::size_t room = kDVMaximumBytesOfProvider - kBytesAroundConsumer - kEditor.value.size();
+  const auto numbered = [](std::size_t number, std::size_t length) {
+    const std::string text = std::to_string(number);
+    return ItemID{std::string(length - text.size(), 'i') + text};
+  };
+  std::size_t taken = 0;
+  for (; taken + 2 <= room / kBytesOfItem; ++taken) ASSERT_TRUE(tree.allow(kCellar, numbered(taken, kItemLength), kEditor));
+  const std::size_t rest = room - taken * kBytesOfItem - kBytesAroundItem;
+  EXPECT_FALSE(dvHasRoomFor(tree, {kCellar, kEditor, numbered(taken, rest + 1)}));
+  EXPECT_TRUE(isTaken(tree, {kCellar, kEditor, numbered(taken, rest)}));
+  EXPECT_FALSE(dvHasRoomFor(tree, {kCellar, kEditor, ItemID{""}}));
+  EXPECT_TRUE(dvHasRoomFor(tree, {ProviderID{"com.orvane.attic"}, kEditor, kItem}));
+}
+
+// The worst that eight providers can do: many small elements, or escapes alone.
+void expectWritable(const std::string& consumerBeginning, const std::string& itemBeginning, std::size_t itemsOfConsumer) {
+  DVGrantTree one;
+  std::size_t number = 0;
+  // Asked seldom, for it counts all there is: a few more come in than may.
+  while (number % 512 != 0 || dvHasRoomFor(one, {kCellar, ConsumerID{consumerBeginning}, ItemID{itemBeginning + "x"}})) {
+    const ConsumerID consumer{consumerBeginning + std::to_string(number / itemsOfConsumer)};
+    ASSERT_TRUE(one.allow(kCellar, ItemID{itemBeginning + std::to_string(number)}, consumer));
+    ++number;
+  }
+  QXDictionary all;
+  for (int i = 0; i < 8; ++i) all["com.orvane." + std::to_string(i)] = one.dictionary().begin()->second;
+  EXPECT_TRUE(propertyListXML(all)) << number;
+}
+
+TEST(DVGrantLimits, EightProvidersThatTakeAllTheyCanStillLeaveAListThatCanBeWritten) {
+  expectWritable("c", "", 100);
+  expectWritable("c", "", 1);
+  expectWritable(std::string(100, '&'), std::string(100, '&'), 1);
+}
+
+}  // namespace
+}  // namespace docuvend
