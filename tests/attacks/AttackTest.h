@@ -19,6 +19,15 @@ class AttackTest : public SystemTest {
   }
   // What the attacker, confined, prints for its acts, a line each.
   [[nodiscard]] std::vector<std::string> attack(const std::vector<std::string>& words) const;
+  // The same, started by the running daemon as an extension, a new one each time. It serves nobody.
+  [[nodiscard]] std::vector<std::string> attackAsExtension(const std::vector<std::string>& words);
+  // The same, unconfined.
+  [[nodiscard]] std::vector<std::string> unconfined(const std::vector<std::string>& words) const;
+
+ private:
+  int extensions_ = 0;
 };
+
+[[nodiscard]] std::vector<std::string> linesOf(const std::string& text);
 
 }  // namespace docuvend::tests

@@ -31,5 +31,6 @@ using Acts = std::map<std::string, Act>;
 [[nodiscard]] Acts identityActs();
 [[nodiscard]] Acts fileActs();
 [[nodiscard]] Acts surroundingsActs();
+[[nodiscard]] Acts pressureActs();
 
 }  // namespace docuvend::attacker

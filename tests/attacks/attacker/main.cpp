@@ -1,7 +1,10 @@
 // An application that tries what it must not be able to do. It does what its words say, one thing after another, and prints a line for
 // each. The same program does the honest version, where that is allowed. Relative paths begin in its container.
+//
+// An extension is started without words: then they are the lines of the file "acts" in its container, and "done" is its last line.
 #include <cerrno>
 #include <cstring>
+#include <fstream>
 #include <iostream>
 
 #include "tests/attacks/attacker/Acts.h"
@@ -11,6 +14,16 @@ namespace docuvend::attacker {
 
 std::string outcome(long result) { return result >= 0 ? "ok" : ::strerrorname_np(errno); }
 
+namespace {
+
+std::vector<std::string> linesOf(const char* path) {
+  std::vector<std::string> lines;
+  std::ifstream file(path);
+  for (std::string line; std::getline(file, line);) lines.push_back(line);
+  return lines;
+}
+
+}  // namespace
 }  // namespace docuvend::attacker
 
 int main(int count, char** arguments) {
@@ -19,7 +32,9 @@ int main(int count, char** arguments) {
   acts.merge(requestActs());
   acts.merge(fileActs());
   acts.merge(surroundingsActs());
-  Words words({arguments + 1, arguments + count});
+  acts.merge(pressureActs());
+  const bool isExtension = count == 1;
+  Words words(isExtension ? linesOf("acts") : std::vector<std::string>(arguments + 1, arguments + count));
   while (!words.isAtEnd()) {
     const std::string word = words.next();
     const auto act = acts.find(word);
@@ -29,5 +44,6 @@ int main(int count, char** arguments) {
     }
     std::cout << act->second(words) << std::endl;
   }
+  if (isExtension) std::cout << "done" << std::endl;
   return 0;
 }

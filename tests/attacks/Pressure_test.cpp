@@ -1,0 +1,170 @@
+// Stopping the daemon, and starving others of it: an application or a provider takes more than its part, and everybody else is served as
+// if it were not there.
+#include <gmock/gmock.h>
+#include <gtest/gtest.h>
+
+#include <filesystem>
+
+#include "common/DVErrors.h"
+#include "platform/linux/coordination/AccessSession.h"
+#include "platform/linux/rpc/ConnectionLimiter.h"
+#include "platform/linux/wire/FileCoordinationProtocol.h"
+#include "platform/linux/wire/Limits.h"
+#include "platform/linux/wire/SandboxProtocol.h"
+#include "tests/attacks/AttackTest.h"
+
+namespace docuvend::tests {
+namespace {
+
+using linux_platform::AccessSession;
+using linux_platform::FileCoordinationErrorCode;
+using linux_platform::kFileCoordinationServiceName;
+using linux_platform::kMaximumConnectionsPerPeer;
+using linux_platform::kMaximumPendingCalls;
+using linux_platform::kSandboxServiceName;
+using ::testing::ElementsAre;
+
+const ProviderID kTricksterID{kTrickster};
+
+class Pressure : public AttackTest {
+ protected:
+  void SetUp() override {
+    AttackTest::SetUp();
+    installAttacker(trueEntry("com.orvane.docuvend.acl-write"));
+    for (const auto& bundle : {kCellar, kEditor, kPicker}) house_.install(bundle);
+    house_.installTrickster();
+    letter_ = house_.putInCloud("letter.txt", "Dear all\n");
+    house_.startDaemon();
+    letterString_ = house_.granted(letter_, kEditor);
+  }
+
+  // The attacker, confined, that does these acts and keeps what it took until it is let go.
+  [[nodiscard]] std::unique_ptr<Process> holdingAttacker(std::vector<std::string> acts, const std::string& name) const {
+    acts.insert(acts.begin(), {std::string(DOCUVEND_BIN) + "/docuvend-run", kAttacker});
+    acts.insert(acts.end(), {"hold", name});
+    auto process = std::make_unique<Process>(Command{acts, house_.environment(), {}});
+    eventually("the attacker has what it wants", [this, &name, &process] {
+      return std::filesystem::exists(house_.container(kAttacker) + "/" + name + ".holding") || !process->isRunning();
+    });
+    return process;
+  }
+  // What it had to say.
+  [[nodiscard]] std::vector<std::string> letGo(Process& attacker, const std::string& name) const {
+    EXPECT_TRUE(attacker.isRunning());
+    writeFile(house_.container(kAttacker) + "/" + name + ".go", "");
+    const Ending& ending = attacker.wait();
+    EXPECT_EQ(ending.status, 0) << ending.errors;
+    auto lines = linesOf(ending.output);
+    if (!lines.empty() && lines.back() == "ok") lines.pop_back();
+    return lines;
+  }
+
+  // An application opens a document, and a program takes a turn at it.
+  void expectOthersAreServed() const {
+    EXPECT_EQ(house_.confined(kEditor, {"show", letterString_}).output, "Dear all\n");
+    const Ending read = house_.ctl({"read", letter_});
+    EXPECT_EQ(read.output, "Dear all\n") << read.errors;
+  }
+  [[nodiscard]] QXURL item(const std::string& name) const {
+    return QXURL::fileURL(house_.storage(kTrickster) + "/" + name, QXURLKind::file);
+  }
+  [[nodiscard]] std::optional<QXError> grantItem(const std::string& name) const {
+    return errorOf(house_.client(kPicker)->ask<&DVDaemon::extendSandboxForFileURL>(item(name), kTricksterID, ConsumerID{kAttacker}));
+  }
+
+  std::string letter_;
+  std::string letterString_;
+};
+
+TEST_F(Pressure, AnApplicationHasItsNumberOfConnectionsHoweverManyItsProcessesAre) {
+  const std::size_t half = kMaximumConnectionsPerPeer / 2;
+  const auto first = holdingAttacker({"crowd", kDVServiceName, std::to_string(half)}, "first");
+  const auto second = holdingAttacker({"crowd", kSandboxServiceName, std::to_string(half + 7)}, "second");
+  expectOthersAreServed();
+  EXPECT_THAT(attack({"crowd", kFileCoordinationServiceName, "1"}), ElementsAre("0 served, 1 refused"));
+  const std::string served = std::to_string(half) + " served, ";
+  EXPECT_THAT(letGo(*first, "first"), ElementsAre(served + "0 refused"));
+  EXPECT_THAT(letGo(*second, "second"), ElementsAre(served + "7 refused"));
+  // The places come back.
+  eventually("it is served again", [this] {
+    return attack({"crowd", kDVServiceName, "1"}) == std::vector<std::string>{"1 served, 0 refused"};
+  });
+}
+
+TEST_F(Pressure, GarbageEndsItsConnectionAndNothingElse) {
+  for (const char* service : {kDVServiceName, kSandboxServiceName, kFileCoordinationServiceName}) {
+    EXPECT_THAT(attack({"garble", service, "crowd", service, "1"}), ElementsAre("9 of 9 ended", "1 served, 0 refused")) << service;
+  }
+  expectOthersAreServed();
+  EXPECT_TRUE(house_.daemon().isRunning());
+}
+
+TEST_F(Pressure, HalfFramesOccupyTheirOwnConnectionsAlone) {
+  const auto attacker = holdingAttacker({"half", kDVServiceName, "20", "half", kFileCoordinationServiceName, "20"}, "halves");
+  expectOthersAreServed();
+  EXPECT_THAT(letGo(*attacker, "halves"), ElementsAre("ok", "ok"));
+}
+
+TEST_F(Pressure, WhoReadsNoAnswersIsDroppedAndTheNextRequestIsServed) {
+  EXPECT_THAT(attack({"deaf", kDVServiceName, "crowd", kDVServiceName, "1"}), ElementsAre("ended", "1 served, 0 refused"));
+  EXPECT_TRUE(house_.awaitLog(": the peer does not read what is sent to it"));
+  expectOthersAreServed();
+}
+
+TEST_F(Pressure, TurnsThatAreNeverEndedAreTheirOwnersAndOfALimitedNumber) {
+  ASSERT_THAT(attack({"terminal"}), ElementsAre("none"));  // now its container is there
+  const std::string own = house_.container(kAttacker) + "/own";
+  writeFile(own, "");
+  constexpr std::size_t kMost = AccessSession::kMaximumAccesses;
+  const std::string tooMany = std::string(linux_platform::kQXFileCoordinationErrorDomain) + " " +
+                              std::to_string(static_cast<int>(FileCoordinationErrorCode::tooManyAccesses));
+  const auto attacker = holdingAttacker({"turns", own, std::to_string(kMost + 1), "turns", letter_, "1"}, "turns");
+  expectOthersAreServed();
+  EXPECT_EQ(house_.ctl({"write", letter_}, "Dear nobody\n").status, 0) << "nor is a writer of another file held up";
+  const auto lines = letGo(*attacker, "turns");
+  ASSERT_EQ(lines.size(), 2U);
+  EXPECT_EQ(lines[0], std::to_string(kMost) + ", then " + tooMany);
+  EXPECT_TRUE(lines[1].starts_with("0, then " + std::string(linux_platform::kQXFileCoordinationErrorDomain) + " " +
+                                   std::to_string(static_cast<int>(FileCoordinationErrorCode::notPermitted))))
+      << lines[1];
+}
+
+TEST_F(Pressure, RequestsThatAProviderNeverAnswersAreOfALimitedNumberAndHoldUpNoOtherProvider) {
+  ASSERT_EQ(grantItem("stuck"), std::nullopt);
+  const std::string path = item("stuck").fileSystemPath();
+  const auto attacker = holdingAttacker(
+      {"start", path, kTrickster, kAttacker, std::to_string(kMaximumPendingCalls + 1), "crowd", kDVServiceName, "1"}, "pile");
+  ASSERT_TRUE(house_.awaitLog("com.orvane.trickster: is stuck"));
+  expectOthersAreServed();
+  const auto lines = letGo(*attacker, "pile");
+  ASSERT_EQ(lines.size(), 2U);
+  EXPECT_TRUE(lines[0].starts_with(std::to_string(kMaximumPendingCalls + 1) + ": QXRpcErrorDomain 5")) << lines[0];
+  EXPECT_EQ(lines[1], "1 served, 0 refused");
+  writeFile(house_.container(kTrickster) + "/free", "");
+}
+
+class FaultyProvider : public Pressure, public ::testing::WithParamInterface<const char*> {};
+
+// Whoever asked is told, and the next request finds a new process.
+TEST_P(FaultyProvider, HarmsItself) {
+  ASSERT_EQ(grantItem("honest"), std::nullopt);
+  const auto before = house_.processesOf("docuvend-trickster");
+  ASSERT_EQ(before.size(), 1U);
+  const auto error = grantItem(GetParam());
+  ASSERT_TRUE(error);
+  EXPECT_EQ(error->domain, kDVErrorDomain);
+  EXPECT_EQ(error->code, static_cast<std::int64_t>(DVErrorCode::pluginOperationFailed));
+  eventually("it is ended", [this, &before] {
+    const auto now = house_.processesOf("docuvend-trickster");
+    return now.empty() || now != before;
+  });
+  expectOthersAreServed();
+  eventually("it works again", [this] { return grantItem("honest") == std::nullopt; });
+}
+
+// It closes its connection, sends what is no frame, answers what nobody asked, crashes.
+INSTANTIATE_TEST_SUITE_P(OneThatSays, FaultyProvider, ::testing::Values("leave", "garbage", "unasked", "abort"),
+                         [](const auto& info) { return std::string(info.param); });
+
+}  // namespace
+}  // namespace docuvend::tests

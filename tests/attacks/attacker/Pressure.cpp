@@ -1,0 +1,206 @@
+// More than its part of what the daemon shares out. What it takes it keeps until it ends.
+//
+//   crowd SERVICE COUNT     opens connections and has each answered; how many were served, how many refused
+//   garble SERVICE          sends, each over a connection of its own, what is no frame; how many of these connections were ended for it
+//   half SERVICE COUNT      opens connections and sends each the beginning of a frame
+//   deaf SERVICE            sends requests and reads no answer, until the connection ends
+//   turns URL COUNT         takes turns at a file and does not end them; how many it got, and the error of the first that it did not get
+//   start URL PROVIDER CONSUMER COUNT
+//                           asks for an item again and again and waits for no answer but the last one's; that one
+//   hold NAME               makes the file NAME.holding and waits until NAME.go is there
+#include <sys/socket.h>
+#include <sys/time.h>
+
+#include <chrono>
+#include <cstdint>
+#include <cstring>
+#include <filesystem>
+#include <fstream>
+#include <memory>
+#include <thread>
+#include <utility>
+#include <variant>
+#include <vector>
+
+#include "platform/linux/wire/ConnectToSocket.h"
+#include "platform/linux/wire/FileCoordinationProtocol.h"
+#include "platform/linux/wire/Limits.h"
+#include "platform/rpc_errors.h"
+#include "tests/attacks/attacker/Acts.h"
+#include "tests/attacks/attacker/Requests.h"
+#include "tests/system/house/Client.h"
+#include "tests/wire/RawPeer.h"
+
+namespace docuvend::attacker {
+namespace {
+
+using namespace linux_platform;
+using tests::bytesOf;
+using tests::RawPeer;
+using Bytes = std::vector<std::uint8_t>;
+
+constexpr const char* kWakeUp = "wakeUpCompletion:";
+constexpr const char* kStart = "startProvidingItemAtURL:fromProviderID:forConsumerID:completionHandler:";
+constexpr std::uint64_t kMostRequests = 2'000'000;
+
+// What is kept to the end.
+struct Hoard {
+  std::vector<RawPeer> peers;
+  std::vector<std::unique_ptr<tests::Client>> clients;
+};
+Hoard& hoard() {
+  static Hoard all;
+  return all;
+}
+
+RawPeer connectTo(const std::string& service) {
+  auto connected = connectToSocket(publicSocket(service));
+  auto* socket = std::get_if<UniqueDescriptor>(&connected);
+  if (socket == nullptr) return RawPeer({});
+  const timeval patience{tests::kPatience.count(), 0};
+  ::setsockopt(socket->get(), SOL_SOCKET, SO_RCVTIMEO, &patience, sizeof patience);
+  ::setsockopt(socket->get(), SOL_SOCKET, SO_SNDTIMEO, &patience, sizeof patience);
+  return RawPeer(std::move(*socket));
+}
+
+// The code for which the connection was ended; none when it did not end so.
+std::optional<std::int64_t> endOf(const RawPeer& peer) {
+  while (const auto frame = peer.read()) {
+    if (const auto* end = std::get_if<EndFrame>(&*frame)) return end->error.code;
+  }
+  return std::nullopt;
+}
+
+Bytes operator+(Bytes first, const Bytes& second) {
+  first.insert(first.end(), second.begin(), second.end());
+  return first;
+}
+Bytes hello() { return bytesOf(Hello{kProtocolVersion, std::nullopt}); }
+Bytes request(std::uint64_t number) { return bytesOf(RequestFrame{number, true, kWakeUp, {}}); }
+
+std::string crowd(Words& words) {
+  const std::string service = words.next();
+  int served = 0;
+  int refused = 0;
+  for (int i = std::stoi(words.next()); i > 0; --i) {
+    RawPeer peer = connectTo(service);
+    // One that has been closed already still says why.
+    peer.write(hello() + request(1));
+    if (peer.read<Hello>()) {
+      const auto answer = peer.read();
+      if (answer && std::holds_alternative<EndFrame>(*answer)) {
+        refused += std::get<EndFrame>(*answer).error.code == static_cast<std::int64_t>(QXRpcErrorCode::refused) ? 1 : 0;
+      } else if (answer) {
+        ++served;  // with an answer or with an error
+      }
+    }
+    hoard().peers.push_back(std::move(peer));
+  }
+  return std::to_string(served) + " served, " + std::to_string(refused) + " refused";
+}
+
+std::string garble(Words& words) {
+  const std::string service = words.next();
+  const std::vector<Bytes> garbage = {
+      Bytes(4096, 0xff),
+      Bytes(4096, 0),
+      {'G', 'E', 'T', ' ', '/', '\r', '\n', '\r', '\n'},
+      request(1),
+      hello() + hello(),
+      hello() + request(7) + request(7),
+      hello() + bytesOf(ReplyFrame{1, {}}),
+      hello() + Bytes{2, 0, 0, 0, 0xee, 0},
+      hello() + Bytes{1, 0, 0x10, 0},
+  };
+  int ended = 0;
+  for (const Bytes& bytes : garbage) {
+    const RawPeer peer = connectTo(service);
+    peer.write(bytes);
+    if (endOf(peer) == static_cast<std::int64_t>(QXRpcErrorCode::malformedFrame)) ++ended;
+  }
+  return std::to_string(ended) + " of " + std::to_string(garbage.size()) + " ended";
+}
+
+std::string sendHalves(Words& words) {
+  const std::string service = words.next();
+  const Bytes whole = hello() + request(1);
+  for (int i = std::stoi(words.next()); i > 0; --i) {
+    hoard().peers.push_back(connectTo(service));
+    if (!hoard().peers.back().write(std::span(whole).first(whole.size() - 1))) return "ended";
+  }
+  return "ok";
+}
+
+std::string stayDeaf(Words& words) {
+  const RawPeer peer = connectTo(words.next());
+  if (!peer.sayHello()) return "ended at once";
+  Bytes batch;
+  for (std::uint64_t number = 0; number < kMostRequests;) {
+    batch.clear();
+    for (int i = 0; i < 200; ++i) batch = std::move(batch) + bytesOf(RequestFrame{++number, true, std::string(250, 'x'), {}});
+    if (!peer.write(batch)) return "ended";
+  }
+  return "served for ever";
+}
+
+// An access's identifier is the connection's own matter.
+QXUUID accessID(int number) {
+  QXUUID result;
+  std::memcpy(result.bytes.data(), &number, sizeof number);
+  return result;
+}
+
+std::string takeTurns(Words& words) {
+  const QXURL url = QXURL::fileURL(words.next(), QXURLKind::file);
+  hoard().clients.push_back(std::make_unique<tests::Client>(publicSocket(kFileCoordinationServiceName), std::nullopt));
+  tests::Client& client = *hoard().clients.back();
+  const int count = std::stoi(words.next());
+  for (int i = 0; i < count; ++i) {
+    const auto error = tests::errorOf(client.ask<&QXFileCoordination::coordinateReadingItemAtURL>(
+        std::optional(url), std::optional<QXData>(), std::optional(accessID(i)), std::optional<std::int64_t>(i)));
+    if (error) return std::to_string(i) + ", then " + told(error);
+  }
+  return std::to_string(count);
+}
+
+std::string startAgainAndAgain(Words& words) {
+  const QXURL url = QXURL::fileURL(words.next(), QXURLKind::file);
+  const std::string provider = words.next();
+  const std::string consumer = words.next();
+  const std::uint64_t count = std::stoull(words.next());
+  hoard().peers.push_back(connectTo(kDVServiceName));
+  const RawPeer& peer = hoard().peers.back();
+  if (!peer.sayHello()) return "ended at once";
+  for (std::uint64_t number = 1; number <= count; ++number) {
+    if (!peer.write(Frame(RequestFrame{number, true, kStart, {url, provider, consumer}}))) return "ended";
+  }
+  while (const auto frame = peer.read()) {
+    if (const auto* failure = std::get_if<FailureFrame>(&*frame)) {
+      return std::to_string(failure->callID) + ": " + told(failure->error);
+    }
+    if (std::holds_alternative<ReplyFrame>(*frame)) return "answered";
+  }
+  return "no answer";
+}
+
+std::string hold(Words& words) {
+  constexpr std::chrono::milliseconds kBetweenLooks{2};
+  const std::string name = words.next();
+  std::ofstream(name + ".holding").close();
+  const auto deadline = std::chrono::steady_clock::now() + tests::kPatience;
+  while (!std::filesystem::exists(name + ".go")) {
+    if (std::chrono::steady_clock::now() > deadline) return "nobody came";
+    std::this_thread::sleep_for(kBetweenLooks);
+  }
+  return "ok";
+}
+
+}  // namespace
+
+Acts pressureActs() {
+  return {{"crowd", crowd},   {"garble", garble},   {"half", sendHalves},
+          {"deaf", stayDeaf}, {"turns", takeTurns}, {"start", startAgainAndAgain},
+          {"hold", hold}};
+}
+
+}  // namespace docuvend::attacker
