@@ -19,8 +19,6 @@ namespace docuvend::tests {
 namespace {
 
 namespace fs = std::filesystem;
-using ::testing::Contains;
-using ::testing::Not;
 using ::testing::Pair;
 using ::testing::UnorderedElementsAre;
 
