@@ -14,7 +14,6 @@
 
 #include "platform/linux/wire/ConnectToSocket.h"
 #include "platform/linux/wire/SandboxProtocol.h"
-#include "tests/attacks/told.h"
 #include "tests/system/house/Client.h"
 #include "tests/system/knock.h"
 
@@ -23,7 +22,6 @@ namespace {
 
 using linux_platform::UniqueDescriptor;
 using tests::Client;
-using tests::told;
 
 UniqueDescriptor asideForTheNext;
 

@@ -5,8 +5,11 @@
 
 #include "platform/linux/base/UniqueDescriptor.h"
 #include "tests/attacks/attacker/Acts.h"
+#include "tests/attacks/told.h"
 
 namespace docuvend::attacker {
+
+using tests::told;
 
 // Where a service of the daemon's listens, as this process's environment says.
 [[nodiscard]] std::string publicSocket(const std::string& service);
