@@ -1,0 +1,142 @@
+// A provider that exchanges names while the daemon looks at them: a directory with a link to another provider's documents, and a file with
+// a link to one. The daemon must never open, make, rename or write anything where the links lead.
+#include <gmock/gmock.h>
+#include <gtest/gtest.h>
+#include <unistd.h>
+
+#include <filesystem>
+#include <future>
+#include <map>
+
+#include "tests/attacks/FileAttackTest.h"
+
+namespace docuvend::tests {
+namespace {
+
+namespace fs = std::filesystem;
+using ::testing::AnyOf;
+
+// Each round is a request to another process, and the provider exchanges the names several times during each. The check and the use by
+// themselves go through the same races in one process in TokenRedeemer_test.cpp.
+constexpr int kRedemptions = 15'000;
+constexpr int kGrants = 2'000;  // each asks the provider as well
+constexpr int kSaves = 1'000;   // each waits for the disk
+
+class Swaps : public FileAttackTest {
+ protected:
+  void SetUp() override {
+    FileAttackTest::SetUp();
+    // The directory, and a link in its place behind which there are files of the same names.
+    fs::create_directory(place("way"));
+    letter_ = put("way/diary.txt");
+    fs::create_directory_symlink(house_.storage(kCellar), place("way.decoy"));
+    // The file, and a link in its place.
+    note_ = put("note.txt");
+    fs::create_symlink(diary(), place("note.txt.decoy"));
+  }
+  void TearDown() override {
+    stopExchanging();
+    EXPECT_EQ(contentsOf(diary()), kDiaryText);
+    EXPECT_FALSE(fs::exists(house_.document(".diary.txt")));
+  }
+
+  // Has the provider exchange an item and its decoy from now on.
+  void startExchanging(const std::string& name) {
+    ASSERT_EQ(grant(url(place(name))).outcome, "ok");
+    exchanging_ = std::async(std::launch::async, [this, item = url(place(name))] {
+      const auto accomplice = house_.client(kPicker);
+      return errorOf(accomplice->ask<&DVDaemon::startProvidingItemAtURL>(item, ProviderID{kColluder}, ConsumerID{kAttacker}));
+    });
+  }
+  void stopExchanging() {
+    if (!exchanging_.valid()) return;
+    whisper("enough", "");
+    EXPECT_EQ(exchanging_.get(), std::nullopt);
+    EXPECT_TRUE(house_.awaitLog("has exchanged "));
+    fs::remove(house_.container(kColluder) + "/enough");
+  }
+
+  // Redeems the token many times; how often each outcome came.
+  std::map<std::string, int> redeemAgainAndAgain(const std::optional<QXData>& token) {
+    std::map<std::string, int> outcomes;
+    for (int round = 0; round < kRedemptions; ++round) {
+      const Opened opened = redeem(token, round % 2 == 0 ? Access::read : Access::readWrite);
+      ++outcomes[opened.file ? opened.contents() : opened.outcome];
+    }
+    return outcomes;
+  }
+  // The letter was opened, a link was seen and refused, and nothing else ever happened.
+  static void expectOnlyTheLetter(const std::map<std::string, int>& outcomes) {
+    for (const auto& [outcome, count] : outcomes) {
+      EXPECT_THAT(outcome, AnyOf(kLetterText, kNotRegularFile, kBusy, kGone)) << count;
+    }
+    EXPECT_TRUE(outcomes.contains(kLetterText));
+    EXPECT_TRUE(outcomes.contains(kNotRegularFile));
+  }
+
+  std::string letter_;
+  std::string note_;
+  std::future<std::optional<QXError>> exchanging_;
+};
+
+TEST_F(Swaps, ADirectoryExchangedWithALinkIsNeverLeftOnRedemption) {
+  const auto token = grant(url(letter_)).item;
+  ASSERT_EQ(redeem(token).contents(), kLetterText);
+  startExchanging("way");
+  expectOnlyTheLetter(redeemAgainAndAgain(token));
+}
+
+TEST_F(Swaps, AFileExchangedWithALinkIsNeverFollowedOnRedemption) {
+  const auto token = grant(url(note_)).item;
+  ASSERT_EQ(redeem(token).contents(), kLetterText);
+  startExchanging("note.txt");
+  expectOnlyTheLetter(redeemAgainAndAgain(token));
+}
+
+TEST_F(Swaps, NoTokenIsIssuedForWhatLiesBehindALinkThatIsExchanged) {
+  ASSERT_EQ(redeem(grant(url(letter_)).item).contents(), kLetterText);
+  startExchanging("way");
+  std::map<std::string, int> outcomes;
+  std::vector<QXData> issued;
+  for (int round = 0; round < kGrants; ++round) {
+    const Tokens tokens = grant(url(letter_));
+    ++outcomes[tokens.item ? "issued" : tokens.outcome];
+    // A token that was issued while a link was there could only be for where it leads.
+    for (const auto& token : {tokens.item, tokens.sibling}) {
+      EXPECT_TRUE(!token || token->text().find(kCellar + ".documents") == std::string::npos);
+    }
+    if (tokens.item) issued.push_back(*tokens.item);
+  }
+  stopExchanging();
+  EXPECT_GT(outcomes["issued"], 0);
+  // The file lay in another provider's storage, or the way to it was a link.
+  EXPECT_GT(outcomes["DVErrorDomain 9"] + outcomes["ok"], 0);
+  for (const auto& [outcome, count] : outcomes) EXPECT_THAT(outcome, AnyOf("issued", "ok", "DVErrorDomain 9")) << count;
+  for (const QXData& token : issued) EXPECT_THAT(redeem(token).contents(), AnyOf(kLetterText, kNotRegularFile));
+}
+
+TEST_F(Swaps, NoHiddenSiblingIsMadeNorRenamedBehindALinkThatIsExchanged) {
+  const Tokens tokens = grant(url(letter_));
+  ASSERT_EQ(redeem(tokens.sibling, Access::readWrite).outcome, "ok");
+  ASSERT_EQ(replace(tokens.item, tokens.sibling), "ok");
+  writeFile(letter_, kLetterText);
+  startExchanging("way");
+  std::map<std::string, int> made;
+  std::map<std::string, int> replaced;
+  for (int round = 0; round < kSaves; ++round) {
+    const Opened sibling = redeem(tokens.sibling, Access::readWrite);
+    ++made[sibling.outcome];
+    if (sibling.file) {
+      EXPECT_EQ(::pwrite(sibling.file->number, kLetterText, std::string(kLetterText).size(), 0), 8);
+    }
+    ++replaced[replace(tokens.item, tokens.sibling)];
+  }
+  for (const auto& outcomes : {made, replaced}) {
+    EXPECT_TRUE(outcomes.contains("ok"));
+    EXPECT_TRUE(outcomes.contains(kNotRegularFile));
+    for (const auto& [outcome, count] : outcomes) EXPECT_THAT(outcome, AnyOf("ok", kNotRegularFile, kGone, kBusy)) << count;
+  }
+}
+
+}  // namespace
+}  // namespace docuvend::tests
