@@ -8,6 +8,7 @@
 #include <tuple>
 #include <vector>
 
+#include "acl/DVGrantLimits.h"
 #include "tests/support/FakePlatform.h"
 
 namespace docuvend {
@@ -520,6 +521,15 @@ TEST_F(DVAccessControlStoreTest, AGrantRecordedBeforeTheFileCouldBeReadIsCommitt
 }
 
 // --- Log levels
+
+TEST_F(DVAccessControlStoreTest, HasRoomForWhatItHasAlreadyAndForWhatItsLimitsLeave) {
+  const ItemID tooLong{std::string(kDVLongestGrantedItemID + 1, 'i')};
+  EXPECT_FALSE(store().hasRoomFor(kCellar, tooLong, kEditor));
+  EXPECT_TRUE(store().hasRoomFor(kCellar, kReport, kEditor));
+  EXPECT_FALSE(isGranted(kReport)) << "to ask is not to grant";
+  grant(tooLong);
+  EXPECT_TRUE(store().hasRoomFor(kCellar, tooLong, kEditor));
+}
 
 TEST_F(DVAccessControlStoreTest, WithoutInfoLoggingOnlyFaultsAreWritten) {
   platform_.log.setEnabled(QXLogType::info, FakeLogSwitch::off);

@@ -78,7 +78,7 @@ void expectWritable(const std::string& consumerBeginning, const std::string& ite
   DVGrantTree one;
   std::size_t number = 0;
   // Asked seldom, for it counts all there is: a few more come in than may.
-  while (number % 512 != 0 || dvHasRoomFor(one, {kCellar, ConsumerID{consumerBeginning}, ItemID{itemBeginning + "x"}})) {
+  while (number % 1024 != 0 || dvHasRoomFor(one, {kCellar, ConsumerID{consumerBeginning}, ItemID{itemBeginning + "x"}})) {
     const ConsumerID consumer{consumerBeginning + std::to_string(number / itemsOfConsumer)};
     ASSERT_TRUE(one.allow(kCellar, ItemID{itemBeginning + std::to_string(number)}, consumer));
     ++number;

@@ -193,6 +193,17 @@ TEST(PropertyListParser, RefusesMoreElementsThanTheLimit) {
   EXPECT_NE(std::get<QXError>(result).description().find("too many elements"), std::string::npos);
 }
 
+TEST(PropertyListParser, TakesTheGreatestLengthAndNotAByteMore) {
+  const std::size_t around = listOf("<string></string>").size();
+  const auto ofLength = [around](std::size_t length) {
+    return parsed(listOf("<string>" + std::string(length - around, 'x') + "</string>"));
+  };
+  EXPECT_TRUE(std::holds_alternative<QXValue>(ofLength(kPropertyListMaximumBytes)));
+  const auto over = ofLength(kPropertyListMaximumBytes + 1);
+  ASSERT_TRUE(std::holds_alternative<QXError>(over));
+  EXPECT_NE(std::get<QXError>(over).description().find("the text is too long"), std::string::npos);
+}
+
 TEST(PropertyListParser, StopsReadingBeyondTheGreatestLength) {
   PropertyListParser parser;
   ASSERT_TRUE(parser.feed(std::string(kHead) + "<string>"));

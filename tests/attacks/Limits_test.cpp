@@ -1,0 +1,76 @@
+// To fill what others need as well: the list of grants.
+#include <gmock/gmock.h>
+#include <gtest/gtest.h>
+
+#include "acl/DVGrantLimits.h"
+#include "tests/attacks/AttackTest.h"
+
+namespace docuvend::tests {
+namespace {
+
+using ::testing::Each;
+using ::testing::HasSubstr;
+using ::testing::Not;
+
+constexpr const char* kRefused = "DVErrorDomain 2";
+
+class LimitAttacks : public AttackTest {
+ protected:
+  void SetUp() override {
+    AttackTest::SetUp();
+    for (const auto& bundle : {kCellar, kEditor, kPicker}) house_.install(bundle);
+    installAttacker();
+    letter_ = house_.putInCloud("letter.txt", "Dear all\n");
+    other_ = house_.putInCloud("other.txt", "Another one\n");
+    house_.startDaemon();
+    string_ = house_.granted(letter_, kAttacker);
+  }
+
+  // What the attacker, who may write the letter, is told as it passes it on to each of those names.
+  [[nodiscard]] std::vector<std::string> passOn(const std::vector<std::string>& consumers) const {
+    std::vector<std::string> words = {"redeem-for", "writing", string_};
+    for (const std::string& consumer : consumers) words.insert(words.end(), {"pass-on", letter_, consumer});
+    std::vector<std::string> outcomes = attack(words);
+    if (outcomes.size() != consumers.size() + 1) {
+      ADD_FAILURE() << outcomes.size() << " outcomes";
+      return {};
+    }
+    EXPECT_EQ(outcomes.front(), "ok");
+    outcomes.erase(outcomes.begin());
+    return outcomes;
+  }
+  // Somebody else's grant is still written.
+  void expectRoomForOthers() const {
+    (void)house_.granted(other_, kEditor);
+    EXPECT_THAT(house_.accessControl(), HasSubstr("<key>" + kEditor + "</key>"));
+  }
+
+  std::string letter_;
+  std::string other_;
+  std::string string_;
+};
+
+TEST_F(LimitAttacks, ANameOfGreatLengthDoesNotFillTheList) {
+  const std::string longest(kDVLongestGrantedConsumerID, 'c');
+  const auto outcomes = passOn({longest, longest + "c", std::string(std::size_t{1} << 15U, 'c')});
+  EXPECT_EQ(outcomes, (std::vector<std::string>{"ok", kRefused, kRefused}));
+  EXPECT_THAT(house_.accessControl(), HasSubstr("<key>" + longest + "</key>"));
+  EXPECT_THAT(house_.accessControl(), Not(HasSubstr(longest + "c")));
+  expectRoomForOthers();
+}
+
+TEST_F(LimitAttacks, OneDocumentPassedOnToManyNamesDoesNotFillTheList) {
+  std::vector<std::string> names;
+  for (std::size_t i = 1; i < kDVMaximumConsumersOfItem + 3; ++i) names.push_back("com.example." + std::to_string(i));
+  auto outcomes = passOn(names);
+  ASSERT_EQ(outcomes.size(), names.size());
+  // The attacker is one of the letter's consumers itself.
+  const auto first = outcomes.begin() + static_cast<std::ptrdiff_t>(kDVMaximumConsumersOfItem - 1);
+  EXPECT_THAT(std::vector<std::string>(outcomes.begin(), first), Each("ok"));
+  EXPECT_THAT(std::vector<std::string>(first, outcomes.end()), Each(kRefused));
+  EXPECT_EQ(house_.loggedContaining("The access control list cannot hold"), 3);
+  expectRoomForOthers();
+}
+
+}  // namespace
+}  // namespace docuvend::tests
