@@ -1,18 +1,14 @@
 #include "providers/DVExtensionDocuvend.h"
 
 #include <cassert>
-#include <string_view>
 #include <utility>
 
 #include "common/DVLog.h"
 #include "platform/QXPlatform.h"
+#include "platform/provider_extension.h"
 
 namespace docuvend {
 namespace {
-
-constexpr std::string_view kInfoPlistExtensionKey = "QXExtension";
-constexpr std::string_view kDocumentGroupKey = "QXExtensionDocuvendDocumentGroup";
-constexpr std::string_view kProvidedItemsDirectoryName = "Docuvend Storage";
 
 std::optional<QXURL> providedItemsURLOf(const std::shared_ptr<QXExtension>& extension, const std::optional<ProviderID>& identifier) {
   std::optional<QXApplicationRecord> record;
@@ -21,12 +17,12 @@ std::optional<QXURL> providedItemsURLOf(const std::shared_ptr<QXExtension>& exte
     dvLog("[ERROR] Cannot instantiate a Bundlery proxy for %@", extension);
     return std::nullopt;
   }
-  const QXDictionary* dictionary = record->infoDictionaryForKey(kInfoPlistExtensionKey);
+  const QXDictionary* dictionary = record->infoDictionaryForKey(kQXExtensionDictionaryKey);
   if (dictionary == nullptr) {
     dvLog("[ERROR] Cannot read QXExtension dictionary from the Info.plist of %@", extension);
     return std::nullopt;
   }
-  const std::string* group = qxFind<std::string>(*dictionary, kDocumentGroupKey);
+  const std::string* group = qxFind<std::string>(*dictionary, kQXProviderDocumentGroupKey);
   if (group == nullptr) {
     dvLog("[ERROR] Cannot read QXExtensionDocuvendDocumentGroup key from the Info.plist of %@", extension);
     return std::nullopt;
@@ -36,7 +32,7 @@ std::optional<QXURL> providedItemsURLOf(const std::shared_ptr<QXExtension>& exte
     dvLog("[ERROR] Cannot deduce the provided items URL for %@", extension);
     return std::nullopt;
   }
-  return container->second.appendingPathComponent(kProvidedItemsDirectoryName, QXURLKind::directory);
+  return container->second.appendingPathComponent(kQXProvidedItemsDirectoryName, QXURLKind::directory);
 }
 
 std::optional<ProviderID> identifierOf(const QXExtension& extension) {

@@ -5,6 +5,7 @@
 
 #include "common/DVLog.h"
 #include "platform/QXPlatform.h"
+#include "platform/provider_extension.h"
 #include "providers/DVExtensionDocuvend.h"
 #include "providers/DVProviderRegistry.h"
 #include "providers/DVRefreshPass.h"
@@ -13,7 +14,6 @@
 namespace docuvend {
 namespace {
 
-constexpr const char* kExtensionPoint = "com.orvane.docuvend-nonui";
 constexpr std::int32_t kRegistrationTries = 3;
 constexpr const char* kDocumentStorageURLKey = "documentStorageURL";
 constexpr const char* kProviderIdentifierKey = "providerIdentifier";
@@ -29,7 +29,7 @@ void startDiscovery(DVExtensionDocuvend::Completion completion) {
   const QXExtensionContextClass contextClass{_QXDocuvendExtensionHostContext::_extensionAuxiliaryHostProtocol(),
                                              _QXDocuvendExtensionHostContext::_extensionAuxiliaryVendorProtocol()};
   registry.setMatch(QXPlatform::current().extensionHost.beginMatching(
-      {{std::string(kQXExtensionPointName), kExtensionPoint}}, contextClass,
+      {{std::string(kQXExtensionPointName), std::string(kQXProviderExtensionPoint)}}, contextClass,
       [](std::vector<std::shared_ptr<QXExtension>> extensions, std::optional<QXError>) { refresh(std::move(extensions)); }));
 }
 

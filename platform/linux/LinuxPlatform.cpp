@@ -21,6 +21,7 @@
 #include "platform/linux/coordination/FileCoordinationListenerDelegate.h"
 #include "platform/linux/coordination/LinuxFileCoordinator.h"
 #include "platform/linux/extension_host/LinuxExtensionHost.h"
+#include "platform/linux/extension_host/Matching.h"
 #include "platform/linux/files/LinuxDeviceLock.h"
 #include "platform/linux/files/LinuxFileSystem.h"
 #include "platform/linux/files/LinuxNotificationCenter.h"
@@ -36,6 +37,7 @@
 #include "platform/linux/wire/FileCoordinationProtocol.h"
 #include "platform/linux/wire/Reactor.h"
 #include "platform/linux/wire/SandboxProtocol.h"
+#include "platform/provider_extension.h"
 
 namespace docuvend::linux_platform {
 namespace {
@@ -78,6 +80,20 @@ void takeAllDescriptors() {
   static_cast<void>(::setrlimit(RLIMIT_NOFILE, &limit));  // with fewer, clients are refused sooner
 }
 
+std::vector<InstalledStorage> installedStorages(BundleRegistry& bundles) {
+  std::vector<InstalledStorage> storages;
+  for (const Bundle& bundle : bundles.all()) {
+    if (!hasAttributes(bundle, {{std::string(kQXExtensionPointName), std::string(kQXProviderExtensionPoint)}})) continue;
+    const auto* extension = qxFind<QXDictionary>(bundle.info, kQXExtensionDictionaryKey);
+    const auto* group = extension == nullptr ? nullptr : qxFind<std::string>(*extension, kQXProviderDocumentGroupKey);
+    const auto container = group == nullptr ? bundle.groups.end() : bundle.groups.find(*group);
+    if (container == bundle.groups.end()) continue;
+    const QXURL directory = QXURL::fileURL(container->second, QXURLKind::directory);
+    storages.push_back({bundle.identifier, directory.appendingPathComponent(kQXProvidedItemsDirectoryName, QXURLKind::directory)});
+  }
+  return storages;
+}
+
 }  // namespace
 
 struct LinuxPlatform::Services {
@@ -103,7 +119,7 @@ struct LinuxPlatform::Services {
   LinuxRpcService rpc;
   LinuxExtensionHost extensionHost{bundles, paths, reactor, log.defaultLog()};
   LinuxStatus status{rpc, extensionHost};
-  LinuxFileCoordinator fileCoordinator{fileSystem};
+  LinuxFileCoordinator fileCoordinator{fileSystem, {[this] { return installedStorages(bundles); }, &KeyedFile::isInPlace}};
   FileAccesses fileAccesses{fileCoordinator};
 
   std::unique_ptr<LinuxSandbox> sandbox;  // made in `create`, never null after it

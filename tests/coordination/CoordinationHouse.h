@@ -153,7 +153,7 @@ class CoordinationHouse : public SandboxHouse {
   fake_platform::FakeQueues queues;
   LinuxSandbox sandbox{loadedSession(), bundles, peers};
   LinuxFileSystem fileSystem{pathsWithHome(home)};
-  LinuxFileCoordinator coordinator{fileSystem};
+  LinuxFileCoordinator coordinator{fileSystem, {.isInPlace = &KeyedFile::isInPlace}};
   FileAccesses accesses{coordinator};
   const FileCoordinationServicer::Surroundings surroundings{coordinator, accesses, sandbox, peers};
   const std::shared_ptr<RecordingProvider> provider =

@@ -7,6 +7,7 @@
 #include <unistd.h>
 
 #include <array>
+#include <cstddef>
 #include <map>
 #include <memory>
 #include <mutex>
@@ -24,6 +25,7 @@
 #include "platform/linux/wire/Endpoint.h"
 #include "platform/linux/wire/Reactor.h"
 #include "tests/sandbox/SandboxHouse.h"
+#include "tests/support/Eventually.h"
 #include "tests/wire/Waiting.h"
 
 namespace docuvend::linux_platform {
@@ -191,6 +193,11 @@ class CoordinationOverSockets : public testing::SandboxHouse {
   }
 
   [[nodiscard]] SocketClient connected() { return {*reactor, socketPath}; }
+  // Until so many have the file or wait for it: a request that was sent is not entered yet.
+  void awaitAccesses(const QXURL& url, std::size_t count) const {
+    const FileKey file = std::get<KeyedFile>(KeyedFile::of(url)).key;
+    tests::eventually(std::to_string(count) + " have the file or wait for it", [&] { return accesses.of(file).size() == count; });
+  }
   const std::string socketPath = directory.path() + "/service";
   const QXURL item = QXURL::fileURL(document, QXURLKind::file);
   const QXURL plain = QXURL::fileURL(outside + "/secret.txt", QXURLKind::file);
@@ -233,6 +240,7 @@ TEST_F(CoordinationOverSockets, WhoLeavesWhileItsProviderHangsHoldsUpNobody) {
   const auto writer = connected();
   Mailbox<Error> answers;
   writer.coordinate<kWrite>(item, [&answers](Error error) { answers.put(std::move(error)); });
+  awaitAccesses(item, 2);
   reader.leave();
   EXPECT_TRUE(isSuccess(answers.take()));
 }
@@ -244,9 +252,11 @@ TEST_F(CoordinationOverSockets, WhoLeavesWhileItWaitsIsForgotten) {
   ASSERT_TRUE(isSuccess(held.take()));
   auto waiter = connected();
   waiter.coordinate<kWrite>(plain, [](const Error&) {});
+  awaitAccesses(plain, 2);
   const auto last = connected();
   Mailbox<Error> answers;
   last.coordinate<kWrite>(plain, [&answers](Error error) { answers.put(std::move(error)); });
+  awaitAccesses(plain, 3);
   waiter.leave();
   holder.end({});
   EXPECT_TRUE(isSuccess(answers.take()));

@@ -373,7 +373,6 @@ TEST_F(FileAccessesTest, KeepsTheTurnUntilTheProviderHasBeenTold) {
   end(writer);
   EXPECT_EQ(news(), Events{});
   EXPECT_EQ(state(writer), "holding");
-  EXPECT_TRUE(accesses.isWriting(processNumber(1), fileNamed(item)));
   EXPECT_EQ(state(next), "waiting");
   end(writer);
   EXPECT_EQ(news(), Events{"1 ended"}) << "a second end has nothing to wait for";
@@ -506,6 +505,7 @@ TEST_F(FileAccessesTest, NamesThoseThatHaveAFileAndThoseThatWaitForIt) {
   EXPECT_EQ(known[2].access.kind, AccessKind::writing);
   EXPECT_EQ(known[3].access.holder.bundleIdentifier, "com.example.104");
   EXPECT_TRUE(accesses.of(fileNamed(elsewhere)).empty());
+  EXPECT_EQ(accesses.of(fileNamed(item), /*most=*/2).size(), 2U);
 }
 
 TEST_F(FileAccessesTest, KnowsWhichProcessWrites) {
@@ -516,6 +516,13 @@ TEST_F(FileAccessesTest, KnowsWhichProcessWrites) {
   EXPECT_FALSE(accesses.isWriting(processNumber(1), fileNamed(elsewhere)));
   end(writer);
   EXPECT_FALSE(accesses.isWriting(processNumber(1), fileNamed(item)));
+}
+
+TEST_F(FileAccessesTest, AWriteWhoseEndIsBeingToldOfTellsOfNothingThatComesLater) {
+  bool wasWriting = true;
+  provider->onTold = [this, &wasWriting] { wasWriting = accesses.isWriting(processNumber(1), fileNamed(item)); };
+  end(write(item, a));
+  EXPECT_FALSE(wasWriting);
 }
 
 TEST_F(FileAccessesTest, HoldsNoLockWhileItAnswersAsksAndTells) {

@@ -64,6 +64,24 @@ TEST_F(FileKeyTest, TheFilesOwnURLHasNoLinkOnTheWayToItsDirectory) {
   EXPECT_EQ(urlOf(root + "/way/link"), folder + "/link") << "the name itself is not followed";
 }
 
+TEST_F(FileKeyTest, AFileIsInPlaceAsLongAsItsURLLeadsToItsDirectoryWithoutALink) {
+  fs::create_directory_symlink(root + "/folder", root + "/way");
+  const auto keyed = [](const std::string& path) { return std::get<KeyedFile>(KeyedFile::of(QXURL::fileURL(path, QXURLKind::file))); };
+  const KeyedFile file = keyed(root + "/way/x.txt");
+  EXPECT_TRUE(file.isInPlace()) << "it need not be there";
+  fs::create_symlink(root + "/second", root + "/folder/x.txt");
+  EXPECT_FALSE(file.isInPlace()) << "what has its name is a link";
+  fs::remove(root + "/folder/x.txt");
+  EXPECT_TRUE(file.isInPlace());
+  fs::rename(root + "/folder", root + "/moved");
+  EXPECT_FALSE(file.isInPlace());
+  fs::create_directory(root + "/folder");
+  EXPECT_FALSE(file.isInPlace()) << "another directory";
+  fs::remove(root + "/folder");
+  fs::create_directory_symlink(root + "/moved", root + "/folder");
+  EXPECT_FALSE(file.isInPlace()) << "the same directory by a link";
+}
+
 TEST_F(FileKeyTest, ADirectoryWhosePathIsNoTextHasNoKey) {
   fs::create_directory(root + "/\xff");
   fs::create_directory_symlink(root + "/\xff", root + "/odd");

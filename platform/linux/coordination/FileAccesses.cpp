@@ -9,6 +9,7 @@
 
 #include "platform/linux/coordination/FileAccesses.h"
 
+#include <algorithm>
 #include <cassert>
 #include <utility>
 
@@ -28,7 +29,12 @@ QXError endedBeforeItBegan(const QXURL& url) {
 
 }  // namespace
 
-FileAccesses::FileAccesses(LinuxFileCoordinator& coordinator) : coordinator_(coordinator) {}
+FileAccesses::FileAccesses(LinuxFileCoordinator& coordinator) : coordinator_(coordinator) {
+  // This outlives every registration.
+  coordinator_.setRegistrationHandler([this] { lookAgainForAwaited(); });
+}
+
+FileAccesses::~FileAccesses() { coordinator_.setRegistrationHandler({}); }
 
 AccessNumber FileAccesses::newNumber() { return ++lastNumber_; }
 
@@ -72,13 +78,10 @@ void FileAccesses::end(AccessNumber number, std::function<void()> ended) {
 }
 
 void FileAccesses::tellThenRelease(AccessNumber number, const FileAccess& access, std::function<void()> ended) {
-  const auto provider = coordinator_.providerOf(access.url);
-  if (!provider) {
-    release(number, std::move(ended));
-    return;
-  }
+  const KeyedFile file{access.file, access.url};
   // This outlives the telling.
-  coordinator_.tellFinishedWriting(provider, access.holder.processIdentifier, access.url,
+  coordinator_.tellFinishedWriting(coordinator_.ownerOf(file, LinuxFileCoordinator::DirectoryItself::counts),
+                                   access.holder.processIdentifier, file,
                                    [this, number, ended = std::move(ended)] { release(number, ended); });
 }
 
@@ -100,7 +103,7 @@ void FileAccesses::takeTurn(AccessNumber number, Consequences& consequences) {
     return;
   }
   entry.stage = Stage::providing;
-  consequences.readers.push_back({number, access.file, access.url, access.holder, access.party.process});
+  consequences.readers.push_back(reader(number, entry));
 }
 
 void FileAccesses::hold(Entry& entry, Consequences& consequences) {
@@ -119,6 +122,7 @@ void FileAccesses::remove(AccessNumber number, Consequences& consequences) {
   const FileAccess access = std::move(found->second.access);
   entries_.erase(found);
   provisions_.leave(number);
+  awaiting_.erase(number);
   const std::vector<AccessNumber> come = table_.leave(number);
   if (!table_.hasTurn(access.party.process, access.file)) provisions_.noteTurnIsOver(access.file, access.party.process);
   for (const AccessNumber next : come) takeTurn(next, consequences);
@@ -132,24 +136,44 @@ void FileAccesses::carryOut(Consequences consequences) {
 }
 
 void FileAccesses::provide(const Reader& reader) {
-  const auto provider = coordinator_.providerOf(reader.url, LinuxFileCoordinator::DirectoryItself::doesNotCount);
+  const FileOwner owner = coordinator_.ownerOf({reader.file, reader.url}, LinuxFileCoordinator::DirectoryItself::doesNotCount);
   std::optional<Provisions::Joined> joined;
   Consequences consequences;
   {
     const std::lock_guard lock(mutex_);
     const auto found = entries_.find(reader.number);
     if (found == entries_.end()) return;
-    if (provider) {
-      joined = provisions_.join(provider, reader.file, reader.number, reader.process);
+    if (owner.provider) {
+      joined = provisions_.join(owner.provider, reader.file, reader.number, reader.process);
+    } else if (owner.awaited) {
+      awaiting_.insert(reader.number);
+    } else if (owner.failure) {
+      answerWith(found->second, owner.failure, consequences);
+      remove(reader.number, consequences);
     } else {
       hold(found->second, consequences);
     }
   }
   carryOut(std::move(consequences));
+  if (owner.awaited && coordinator_.hasChangedSince(owner)) lookAgainForAwaited();
   if (!joined || joined->wait == Provisions::Wait::forRunningRequest) return;
   // This outlives the request.
-  coordinator_.askToProvide(provider, reader.holder.processIdentifier, reader.url,
+  coordinator_.askToProvide(owner.provider, reader.holder.processIdentifier, reader.url,
                             [this, request = joined->request](const std::optional<QXError>& error) { requestIsAnswered(request, error); });
+}
+
+void FileAccesses::lookAgainForAwaited() {
+  Consequences consequences;
+  {
+    const std::lock_guard lock(mutex_);
+    for (const AccessNumber number : std::exchange(awaiting_, {})) consequences.readers.push_back(reader(number, entries_.at(number)));
+  }
+  carryOut(std::move(consequences));
+}
+
+FileAccesses::Reader FileAccesses::reader(AccessNumber number, const Entry& entry) {
+  const FileAccess& access = entry.access;
+  return {number, access.file, access.url, access.holder, access.party.process};
 }
 
 void FileAccesses::requestIsAnswered(ProvideRequest request, const std::optional<QXError>& error) {
@@ -177,10 +201,11 @@ void FileAccesses::requestIsAnswered(ProvideRequest request, const std::optional
   carryOut(std::move(consequences));
 }
 
-std::vector<KnownAccess> FileAccesses::of(const FileKey& file) const {
+std::vector<KnownAccess> FileAccesses::of(const FileKey& file, std::size_t most) const {
   const std::lock_guard lock(mutex_);
   std::vector<KnownAccess> known;
   for (const AccessTable::State& state : table_.of(file)) {
+    if (known.size() == most) break;
     const Entry& entry = entries_.at(state.number);
     known.push_back({entry.access, stateOf(entry.stage)});
   }
@@ -209,7 +234,11 @@ AccessState FileAccesses::stateOf(Stage stage) {
 
 bool FileAccesses::isWriting(const QXAuditToken& process, const FileKey& file) const {
   const std::lock_guard lock(mutex_);
-  return table_.isWriting(process, file);
+  const auto states = table_.of(file);
+  return std::any_of(states.begin(), states.end(), [this, &process](const AccessTable::State& state) {
+    const Entry& entry = entries_.at(state.number);
+    return entry.stage == Stage::holding && entry.access.kind == AccessKind::writing && entry.access.party.process == process;
+  });
 }
 
 }  // namespace docuvend::linux_platform

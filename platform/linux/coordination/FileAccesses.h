@@ -2,20 +2,23 @@
 //
 // Reading: its turn, then the contents, which are asked of the provider if the file lies below a provider's directory, then it has begun.
 // All readers that wait for one file's contents wait for one request to the provider, also those that come while it runs; a failure is the
-// error of all that wait then, and whoever comes later asks anew. A request goes on when nobody waits for it any more. A read within an
-// access of its own process asks the provider only when no access of this process has had it asked since it has the turn. Writing: its
-// turn, then it has begun. When it has begun and ends, the provider is told once, and only then the turn passes on.
+// error of all that wait then, and whoever comes later asks anew. A request goes on when nobody waits for it any more. A provider that is
+// installed and not registered is waited for. A read within an access of its own process asks the provider only when no access of this
+// process has had it asked since it has the turn. Writing: its turn, then it has begun. When it has begun and ends, the provider is told
+// once, or will be when it is registered, and only then the turn passes on.
 //
 // May be used from any thread. Providers are asked and told with no lock held; answers run with no lock held, on any thread, also inside
 // the call. Outlives every request that a provider may still answer.
 #pragma once
 
 #include <atomic>
+#include <cstddef>
 #include <cstdint>
 #include <functional>
 #include <map>
 #include <mutex>
 #include <optional>
+#include <set>
 #include <string>
 #include <vector>
 
@@ -54,6 +57,7 @@ class FileAccesses {
 
   // The coordinator outlives it.
   explicit FileAccesses(LinuxFileCoordinator& coordinator);
+  ~FileAccesses();
   FileAccesses(const FileAccesses&) = delete;
   FileAccesses& operator=(const FileAccesses&) = delete;
 
@@ -64,10 +68,11 @@ class FileAccesses {
   // FileCoordinationErrorCode. The end of an access that is over already, or is ending, has nothing to wait for.
   void end(AccessNumber number, std::function<void()> ended);
 
-  // Those that have the file, then those that wait for it, in their order.
-  [[nodiscard]] std::vector<KnownAccess> of(const FileKey& file) const;
+  // Those that have the file, then those that wait for it, in their order; no more than that many.
+  [[nodiscard]] std::vector<KnownAccess> of(const FileKey& file, std::size_t most = SIZE_MAX) const;
   // None when the access is over.
   [[nodiscard]] std::optional<AccessState> stateOf(AccessNumber number) const;
+  // A write of that process has begun and its end, which tells the provider, has not.
   [[nodiscard]] bool isWriting(const QXAuditToken& process, const FileKey& file) const;
 
  private:
@@ -96,10 +101,12 @@ class FileAccesses {
   void remove(AccessNumber number, Consequences& consequences);
   static void answerWith(Entry& entry, std::optional<QXError> error, Consequences& consequences);
   [[nodiscard]] static AccessState stateOf(Stage stage);
+  [[nodiscard]] static Reader reader(AccessNumber number, const Entry& entry);
 
   // Without.
   void carryOut(Consequences consequences);
   void provide(const Reader& reader);
+  void lookAgainForAwaited();
   void requestIsAnswered(ProvideRequest request, const std::optional<QXError>& error);
   void tellThenRelease(AccessNumber number, const FileAccess& access, std::function<void()> ended);
   void release(AccessNumber number, std::function<void()> ended);
@@ -111,6 +118,7 @@ class FileAccesses {
   AccessTable table_;
   Provisions provisions_;
   std::map<AccessNumber, Entry> entries_;  // as many as the table has
+  std::set<AccessNumber> awaiting_;        // have the turn, and their provider is not registered
 };
 
 }  // namespace docuvend::linux_platform

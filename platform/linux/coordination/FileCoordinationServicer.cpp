@@ -48,8 +48,9 @@ const char* nameOf(AccessState state) {
 }
 
 // The caller is the provider's own process.
-bool isExempt(const PeerIdentity& caller, const std::shared_ptr<QXDocuvend>& provider) {
-  return provider && caller.bundleIdentifier && caller.bundleIdentifier == provider->_fileReactorID();
+bool isExempt(const PeerIdentity& caller, const FileOwner& owner) {
+  const std::optional<std::string> identifier = owner.provider ? owner.provider->_fileReactorID() : owner.awaited;
+  return identifier && caller.bundleIdentifier == identifier;
 }
 
 // What the caller may know of an access.
@@ -84,7 +85,7 @@ void FileCoordinationServicer::coordinate(AccessKind kind, const Request& reques
   if (const auto* refusal = std::get_if<QXError>(&admission)) return completionHandler(*refusal);
   const auto& [peer, file] = std::get<Admitted>(admission);
   const PeerIdentity& caller = *peer;
-  if (isExempt(caller, surroundings_.coordinator.providerOf(file.url))) {
+  if (isExempt(caller, surroundings_.coordinator.ownerOf(file, LinuxFileCoordinator::DirectoryItself::counts))) {
     session_->beginExempt(*request.accessID);
     return completionHandler(/*error=*/{});
   }
@@ -112,8 +113,7 @@ void FileCoordinationServicer::holdersOfItemAtURL(std::optional<QXURL> url, std:
   if (const auto* refusal = std::get_if<QXError>(&admission)) return completionHandler(*refusal, /*holders=*/{});
   const auto& [caller, file] = std::get<Admitted>(admission);
   QXArray holders;
-  for (const KnownAccess& known : surroundings_.accesses.of(file.key)) {
-    if (holders.size() == kMaximumHoldersNamed) break;
+  for (const KnownAccess& known : surroundings_.accesses.of(file.key, kMaximumHoldersNamed)) {
     holders.emplace_back(described(known, *caller));
   }
   completionHandler(/*error=*/{}, std::move(holders));
@@ -126,12 +126,13 @@ void FileCoordinationServicer::writerDidFinishWritingForURL(std::optional<QXURL>
   const auto& [peer, file] = std::get<Admitted>(admission);
   const PeerIdentity& caller = *peer;
   if (surroundings_.accesses.isWriting(caller.token, file.key)) return completionHandler(/*error=*/{});
-  const auto provider = surroundings_.coordinator.providerOf(file.url);
-  if (!provider) {
+  const FileOwner owner = surroundings_.coordinator.ownerOf(file, LinuxFileCoordinator::DirectoryItself::counts);
+  if (owner.failure) return completionHandler(owner.failure);
+  if (!owner.provider && !owner.awaited) {
     return completionHandler(makeCoordinationError(FileCoordinationErrorCode::noProvider, "the file belongs to no provider", url));
   }
-  if (isExempt(caller, provider)) return completionHandler(/*error=*/{});
-  surroundings_.coordinator.tellFinishedWriting(provider, caller.pid, file.url,
+  if (isExempt(caller, owner)) return completionHandler(/*error=*/{});
+  surroundings_.coordinator.tellFinishedWriting(owner, caller.pid, file,
                                                 [completionHandler = std::move(completionHandler)] { completionHandler(/*error=*/{}); });
 }
 
@@ -144,7 +145,7 @@ std::variant<FileCoordinationServicer::Admitted, QXError> FileCoordinationServic
   auto placed = KeyedFile::of(*url);
   if (const auto* reason = std::get_if<QXError>(&placed)) {
     // Of what is not there only an unconfined process is told: it could look for itself.
-    const bool mayKnow = caller && caller->standing == Standing::unconfined && (reason->code == ENOENT || reason->code == EINVAL);
+    const bool mayKnow = caller && caller->standing == Standing::unconfined && reason->code != EACCES;
     return mayKnow ? noDirectory(*url, *reason) : notPermitted(kind, *url);
   }
   auto& file = std::get<KeyedFile>(placed);

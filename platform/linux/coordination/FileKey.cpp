@@ -1,5 +1,7 @@
 #include "platform/linux/coordination/FileKey.h"
 
+#include <sys/stat.h>
+
 #include <cerrno>
 #include <utility>
 
@@ -40,6 +42,14 @@ std::variant<KeyedFile, QXError> KeyedFile::of(const QXURL& url) {
   if (*straight != "/") straight->append("/");
   const QXURLKind kind = url.hasDirectoryPath() ? QXURLKind::directory : QXURLKind::file;
   return KeyedFile{{std::get<ObjectStatus>(status).identity, name}, QXURL::fileURL(straight->append(name), kind)};
+}
+
+bool KeyedFile::isInPlace() const {
+  const auto again = of(url);
+  const auto* now = std::get_if<KeyedFile>(&again);
+  if (now == nullptr || now->key != key || now->url != url) return false;
+  struct stat status {};
+  return ::lstat(url.fileSystemPath().c_str(), &status) != 0 || !S_ISLNK(status.st_mode);
 }
 
 }  // namespace docuvend::linux_platform

@@ -19,8 +19,7 @@ struct FileKey {
   friend auto operator<=>(const FileKey&, const FileKey&) = default;
 };
 
-// A file by its key, and by the one URL whose way to the file's directory has no link: what was found out about that one cannot be made
-// untrue by whoever owns a link on the way of another.
+// A file by its key, and by the one URL whose way to the file's directory has no link.
 struct KeyedFile {
   FileKey key;
   QXURL url;
@@ -28,6 +27,10 @@ struct KeyedFile {
   // The file need not be there, but its directory must: else the error of the system. A directory has a key like a file, with or without a
   // final slash; "/" has none. EILSEQ: the directory's path is not UTF-8.
   [[nodiscard]] static std::variant<KeyedFile, QXError> of(const QXURL& url);
+
+  // The URL still leads to the same directory without a link, and what has the name there, if anything, is no link. Who owns a directory on
+  // the way can exchange it: what was found out about the URL before holds only where this is so afterwards.
+  [[nodiscard]] bool isInPlace() const;
 };
 
 }  // namespace docuvend::linux_platform

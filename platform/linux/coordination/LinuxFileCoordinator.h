@@ -1,4 +1,8 @@
-// The provider objects that file coordination knows, and the way to the one that holds a file.
+// The provider objects that file coordination knows, and whose a file is.
+//
+// A provider that is installed is not always registered: not while the device is locked, nor before its setup is done, nor while it is
+// being updated, nor after a setup that failed. Its files are its own all the same, and whoever reads one waits for it; what was written
+// meanwhile it is told when it is registered.
 //
 // May be used from any thread. Provider objects are called with no lock held, on their own operation queues; one that has none is called
 // on the caller's thread.
@@ -8,48 +12,100 @@
 #include <cstddef>
 #include <cstdint>
 #include <functional>
+#include <map>
 #include <memory>
 #include <mutex>
+#include <optional>
+#include <string>
+#include <utility>
 #include <vector>
 
 #include "platform/file_coordination.h"
 #include "platform/file_system.h"
+#include "platform/linux/coordination/FileKey.h"
 
 namespace docuvend::linux_platform {
 
+// Of at most one of these there is something; of none for a file of nobody's.
+struct FileOwner {
+  std::shared_ptr<QXDocuvend> provider;
+  std::optional<std::string> awaited;     // the bundle of a provider that is installed and not registered
+  std::optional<QXError> failure;         // it cannot be known
+  std::uint64_t registrationChanges = 0;  // how many there had been when the look began
+};
+
+// Where the provider of an installed bundle keeps its items, whether or not it is registered or the directory is there.
+struct InstalledStorage {
+  std::string bundleIdentifier;
+  QXURL directory;
+};
+
 class LinuxFileCoordinator final : public QXFileCoordinator {
  public:
+  // Asked from any thread; what they use outlives this.
+  struct Outside {
+    // In what order they are looked at; none when empty.
+    std::function<std::vector<InstalledStorage>()> installedStorages = {};
+    // Whether a file is still where it was when it was given its key: else it is nobody's. Always when empty.
+    std::function<bool(const KeyedFile&)> isInPlace = {};
+  };
+
+  // Writes to different files that wait for providers to be told of; more are not told of.
+  static constexpr std::size_t kMaximumUntold = 4096;
+
   // The file system outlives it.
-  explicit LinuxFileCoordinator(QXFileSystem& fileSystem) : fileSystem_(fileSystem) {}
+  explicit LinuxFileCoordinator(QXFileSystem& fileSystem) : LinuxFileCoordinator(fileSystem, Outside{}) {}
+  LinuxFileCoordinator(QXFileSystem& fileSystem, Outside outside) : fileSystem_(fileSystem), outside_(std::move(outside)) {}
 
   void _addDocuvend(std::shared_ptr<QXDocuvend> provider) override;
   void _removeDocuvend(const std::shared_ptr<QXDocuvend>& provider) override;
 
   enum class DirectoryItself { counts, doesNotCount };
-  // Of the objects whose directory contains the file, or is it (where that counts), the one that was added first; null when there is none.
-  [[nodiscard]] std::shared_ptr<QXDocuvend> providerOf(const QXURL& file, DirectoryItself itself = DirectoryItself::counts) const;
+  // Of the objects whose directory contains the file, or is it (where that counts), the one that was added first; if there is none, the
+  // first installed provider of whom this is true.
+  [[nodiscard]] FileOwner ownerOf(const KeyedFile& file, DirectoryItself itself) const;
+
+  // Who has noted that it waits for an owner asks this afterwards: true when a registration has come or gone since that owner was looked
+  // for.
+  [[nodiscard]] bool hasChangedSince(const FileOwner& owner) const { return registrationChanges_ != owner.registrationChanges; }
+  // Called after each addition and removal, with no lock held; one that is running when another handler is set may still run.
+  void setRegistrationHandler(std::function<void()> handler);
 
   // Asks the object for the contents of the file on behalf of a reader of that process, under an identifier that no other reader has.
   // `completion` comes as the object has it: on any thread, also inside the call, and perhaps twice.
   void askToProvide(const std::shared_ptr<QXDocuvend>& provider, int readerProcess, const QXURL& file,
                     QXDocuvend::ProvideCompletion completion);
-  // Tells the object that a writer of that process has finished with the file, under an identifier that no other writer has; `told` runs
-  // after that.
-  void tellFinishedWriting(const std::shared_ptr<QXDocuvend>& provider, int writerProcess, const QXURL& file, std::function<void()> told);
+  // Tells the file's owner that a writer of that process has finished with it, under an identifier that no other writer has; `told` runs
+  // after that, and at once when the owner is awaited or there is none. One that is awaited hears of several writes to one file once.
+  void tellFinishedWriting(const FileOwner& owner, int writerProcess, const KeyedFile& file, std::function<void()> told);
 
  private:
   struct Registration {
     std::shared_ptr<QXDocuvend> provider;
     std::size_t count;
   };
+  struct Untold {
+    int writerProcess;
+    KeyedFile file;
+  };
   [[nodiscard]] std::vector<std::shared_ptr<QXDocuvend>> providers() const;
+  [[nodiscard]] bool contains(const QXURL& directory, const QXURL& file, DirectoryItself itself, std::optional<QXError>& failure) const;
+  void tell(const std::shared_ptr<QXDocuvend>& provider, int writerProcess, const QXURL& file, std::function<void()> told);
+  void remember(Untold untold);
+  void tellUntold();
+  void registrationsChanged();
   // Never used before.
   [[nodiscard]] QXCoordinationID nameFor(const char* role, int process);
 
   QXFileSystem& fileSystem_;
+  const Outside outside_;
   std::atomic<std::uint64_t> names_{0};
+  std::atomic<std::uint64_t> registrationChanges_{0};
   mutable std::mutex mutex_;
-  std::vector<Registration> registrations_;  // guarded by mutex_; in the order of the first additions
+  // Guarded by mutex_.
+  std::vector<Registration> registrations_;  // in the order of the first additions
+  std::map<FileKey, Untold> untold_;
+  std::function<void()> registrationHandler_;
 };
 
 }  // namespace docuvend::linux_platform
