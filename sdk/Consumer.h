@@ -19,7 +19,8 @@
 //
 // Threads. Every call blocks the calling thread until its answer, an error, or its deadline. One Consumer may be used from several threads,
 // all over one connection to each service; it must not go while a call runs. The library has one thread of its own, on which nothing of
-// the caller's runs: handlers run on the thread that made the call, and must not throw.
+// the caller's runs: handlers run on the thread that made the call, and must not throw. A process that forks leaves the Consumer, and what
+// it gave, to the parent: the child calls exec or _exit.
 //
 // Deadlines. Options has those of all calls; `within` makes the same calls with another:
 //

@@ -108,7 +108,7 @@ Result<CoordinatedAccess> Consumer::coordinateWriting(const Document& document, 
 
 Result<CoordinatedAccess> Consumer::coordinate(CoordinationKind kind, const Document& document, const CoordinationOptions& options) {
   const TimePoint until = after(options_.materialisingDeadline);
-  return sdk_detail::withLiveTokens(*this, document, until, [&](const Document& live) {
+  return sdk_detail::withLiveTokens(*this, document, until, options_.deadline, [&](const Document& live) {
     CoordinationOptions ofDocument = options;
     ofDocument.token = live.itemToken;
     return coordinate(kind, live.url, ofDocument, timeLeft(until));

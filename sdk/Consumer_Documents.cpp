@@ -134,7 +134,7 @@ Result<QXDescriptor> Consumer::open(const Document& document, const ProviderID& 
   const auto self = ownIdentifier();
   if (!self) return makeConsumerError(ConsumerErrorCode::noToken, "This process acts for no installed bundle.");
   const TimePoint until = after(options_.materialisingDeadline);
-  return withLiveTokens(*this, document, until, [&](const Document& live) -> Result<QXDescriptor> {
+  return withLiveTokens(*this, document, until, options_.deadline, [&](const Document& live) -> Result<QXDescriptor> {
     if (!live.itemToken) return noTokens(live);
     Consumer hurried = within(timeLeft(until));
     std::function<void()> watch;
@@ -157,7 +157,7 @@ Failure Consumer::replace(const Document& document, const std::function<Failure(
     Locks locks;
   };
   const TimePoint until = after(options_.deadline);
-  auto prepared = withLiveTokens(*this, document, until, [&](const Document& live) -> Result<Locked> {
+  auto prepared = withLiveTokens(*this, document, until, options_.deadline, [&](const Document& live) -> Result<Locked> {
     if (!live.itemToken || !live.siblingToken) return noTokens(live);
     auto item = lock(*this, *live.itemToken, Access::read, until);
     if (auto* error = std::get_if<QXError>(&item)) return std::move(*error);

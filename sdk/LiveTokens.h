@@ -1,6 +1,8 @@
 // Documents outlive their tokens: who has a document's string gets new ones.
 #pragma once
 
+#include <algorithm>
+#include <chrono>
 #include <cstdint>
 #include <utility>
 #include <variant>
@@ -24,13 +26,15 @@ namespace docuvend::sdk_detail {
          error.code == static_cast<std::int64_t>(FileCoordinationErrorCode::notPermitted);
 }
 
-// Does `act` with the document; once more with new tokens when these have become worthless and the library can ask for others.
+// Does `act` with the document; once more with new tokens when these have become worthless and the library can ask for others. Asking for
+// them is an ordinary call, which is never answered when the document's provider is gone: `ordinary` is its deadline.
 template <class Act>
-auto withLiveTokens(Consumer& consumer, const Document& document, TimePoint until, const Act& act) -> decltype(act(document)) {
+auto withLiveTokens(Consumer& consumer, const Document& document, TimePoint until, std::chrono::milliseconds ordinary, const Act& act)
+    -> decltype(act(document)) {
   auto result = act(document);
   const auto* error = std::get_if<QXError>(&result);
   if (error == nullptr || !mayBeOfWorthlessToken(*error) || !document.bookmarkableString) return result;
-  auto renewed = consumer.within(timeLeft(until)).documentURL(*document.bookmarkableString);
+  auto renewed = consumer.within(std::min(timeLeft(until), ordinary)).documentURL(*document.bookmarkableString);
   if (auto* refusal = std::get_if<QXError>(&renewed)) return std::move(*refusal);
   return act(std::get<Document>(renewed));
 }
