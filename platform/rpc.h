@@ -71,7 +71,7 @@ class QXRpcInterface {
 using QXRpcReply = std::function<void(QXArray)>;
 using QXErrorHandler = std::function<void(const QXError&)>;
 
-// The receiving end of an interface. `reply` is empty when the peer wants none.
+// The receiving end of an interface. `reply` is empty, or leads nowhere, when the peer wants none.
 class QXRpcExportedObject {
  public:
   QXRpcExportedObject() = default;

@@ -11,6 +11,7 @@
 #include "platform/linux/wire/FileCoordinationProtocol.h"
 #include "platform/linux/wire/Limits.h"
 #include "platform/linux/wire/SandboxProtocol.h"
+#include "platform/rpc_errors.h"
 #include "tests/attacks/AttackTest.h"
 
 namespace docuvend::tests {
@@ -19,6 +20,7 @@ namespace {
 using linux_platform::AccessSession;
 using linux_platform::FileCoordinationErrorCode;
 using linux_platform::kFileCoordinationServiceName;
+using linux_platform::kMaximumCallsPerPeer;
 using linux_platform::kMaximumConnectionsPerPeer;
 using linux_platform::kMaximumPendingCalls;
 using linux_platform::kSandboxServiceName;
@@ -129,17 +131,41 @@ TEST_F(Pressure, TurnsThatAreNeverEndedAreTheirOwnersAndOfALimitedNumber) {
       << lines[1];
 }
 
-TEST_F(Pressure, RequestsThatAProviderNeverAnswersAreOfALimitedNumberAndHoldUpNoOtherProvider) {
+TEST_F(Pressure, RequestsThatAProviderNeverAnswersAreOfALimitedNumberAndHoldUpNobodyElse) {
   ASSERT_EQ(grantItem("stuck"), std::nullopt);
   const std::string path = item("stuck").fileSystemPath();
+  const std::string tooMany = "QXRpcErrorDomain " + std::to_string(static_cast<int>(QXRpcErrorCode::tooManyCalls));
+  const std::string all = std::to_string(kMaximumPendingCalls + 1);
   const auto attacker = holdingAttacker(
-      {"start", path, kTrickster, kAttacker, std::to_string(kMaximumPendingCalls + 1), "crowd", kDVServiceName, "1"}, "pile");
+      {"start", path, kTrickster, kAttacker, all, "start-silently", path, kTrickster, kAttacker, "1", "crowd", kDVServiceName, "1"},
+      "pile");
   ASSERT_TRUE(house_.awaitLog("com.orvane.trickster: is stuck"));
   expectOthersAreServed();
+  EXPECT_EQ(grantItem("other"), std::nullopt) << "nor may others ask that provider";
   const auto lines = letGo(*attacker, "pile");
-  ASSERT_EQ(lines.size(), 2U);
-  EXPECT_TRUE(lines[0].starts_with(std::to_string(kMaximumPendingCalls + 1) + ": QXRpcErrorDomain 5")) << lines[0];
-  EXPECT_EQ(lines[1], "1 served, 0 refused");
+  ASSERT_EQ(lines.size(), 3U);
+  EXPECT_TRUE(lines[0].starts_with(std::to_string(kMaximumCallsPerPeer + 1) + ": " + tooMany)) << lines[0];
+  EXPECT_TRUE(lines[1].starts_with("1: " + tooMany)) << "over another connection: " << lines[1];
+  EXPECT_EQ(lines[2], "1 served, 0 refused");
+  const auto again = attack({"start", path, kTrickster, kAttacker, "1"});
+  ASSERT_EQ(again.size(), 1U);
+  EXPECT_TRUE(again[0].starts_with("1: " + tooMany)) << "what it left behind is still asked for: " << again[0];
+  writeFile(house_.container(kTrickster) + "/free", "");
+  eventually("it may ask again", [this, &path] {
+    return attack({"start", path, kTrickster, kAttacker, "1"}) == std::vector<std::string>{"answered"};
+  });
+}
+
+TEST_F(Pressure, RequestsWhoseAnswersNobodyWantsCountLikeOthers) {
+  ASSERT_EQ(grantItem("stuck"), std::nullopt);
+  const std::string path = item("stuck").fileSystemPath();
+  const auto attacker =
+      holdingAttacker({"start-silently", path, kTrickster, kAttacker, std::to_string(kMaximumPendingCalls + 1)}, "silence");
+  ASSERT_TRUE(house_.awaitLog("com.orvane.trickster: is stuck"));
+  EXPECT_EQ(grantItem("other"), std::nullopt);
+  const auto lines = letGo(*attacker, "silence");
+  ASSERT_EQ(lines.size(), 1U);
+  EXPECT_TRUE(lines[0].starts_with(std::to_string(kMaximumCallsPerPeer + 1) + ": QXRpcErrorDomain 5")) << lines[0];
   writeFile(house_.container(kTrickster) + "/free", "");
 }
 

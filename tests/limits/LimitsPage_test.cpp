@@ -47,6 +47,8 @@ std::vector<Limit> limits() {
           {"kMaximumOutputBytes", kMaximumOutputBytes},
           {"kMaximumConnectionsPerPeer", kMaximumConnectionsPerPeer},
           {"kMaximumUnconfinedConnections", kMaximumUnconfinedConnections},
+          {"kMaximumCallsPerPeer", kMaximumCallsPerPeer},
+          {"kMaximumUnconfinedCalls", kMaximumUnconfinedCalls},
           {"kMaximumAccesses", AccessSession::kMaximumAccesses},
           {"kMaximumHoldersNamed", FileCoordinationServicer::kMaximumHoldersNamed},
           {"kDVMaximumGrantsOfPage", kDVMaximumGrantsOfPage},

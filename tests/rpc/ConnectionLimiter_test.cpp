@@ -13,7 +13,9 @@ class ConnectionLimiterTest : public testing::Test {
  protected:
   static constexpr std::size_t kLimit = 3;
 
-  ConnectionLimiter::Admission admit(const std::string& peer) { return limiter->admit(peer, kLimit); }
+  static constexpr std::size_t kCalls = 2;
+
+  ConnectionLimiter::Admission admit(const std::string& peer, std::size_t limit = kLimit) { return limiter->admit(peer, {limit, kCalls}); }
   void fill(const std::string& peer) {
     for (std::size_t i = 0; i < kLimit; ++i) {
       auto admission = admit(peer);
@@ -35,11 +37,11 @@ TEST_F(ConnectionLimiterTest, OnePeersLimitIsNotAnothers) {
 TEST_F(ConnectionLimiterTest, APeerMayHaveAnotherLimit) {
   fill("one");
   for (std::size_t i = 0; i < kLimit + 1; ++i) {
-    auto admission = limiter->admit("two", kLimit + 1);
+    auto admission = admit("two", kLimit + 1);
     ASSERT_EQ(admission.verdict, Verdict::admitted);
     places.push_back(std::move(admission.place));
   }
-  EXPECT_EQ(limiter->admit("two", kLimit + 1).verdict, Verdict::refused);
+  EXPECT_EQ(admit("two", kLimit + 1).verdict, Verdict::refused);
 }
 
 TEST_F(ConnectionLimiterTest, TheFirstRefusalIsToldFromTheOnesThatFollow) {
@@ -66,6 +68,42 @@ TEST_F(ConnectionLimiterTest, OpenConnectionsAreThoseOfAllPeersTogether) {
   EXPECT_EQ(limiter->openConnections(), kLimit + 1);
   places.clear();
   EXPECT_EQ(limiter->openConnections(), 1U);
+}
+
+TEST_F(ConnectionLimiterTest, OnePeersConnectionsShareItsBudgetOfRequestsAndAnotherHasItsOwn) {
+  const auto first = admit("one");
+  const auto second = admit("one");
+  const auto share = first.budget->take();
+  const auto another = second.budget->take();
+  ASSERT_TRUE(share && another);
+  EXPECT_FALSE(first.budget->take());
+  EXPECT_FALSE(second.budget->take());
+  EXPECT_TRUE(admit("two").budget->take());
+}
+
+TEST_F(ConnectionLimiterTest, APeerThatComesBackFindsTheRequestsThatItLeftBehind) {
+  std::vector<std::unique_ptr<CallBudget::Share>> left;
+  {
+    const auto admission = admit("one");
+    for (std::size_t i = 0; i < kCalls; ++i) left.push_back(admission.budget->take());
+  }
+  EXPECT_EQ(limiter->openConnections(), 0U);
+  EXPECT_EQ(admit("two").verdict, Verdict::admitted) << "whose leaving forgets those who left nothing";
+  const auto back = admit("one");
+  EXPECT_FALSE(back.budget->take());
+  left.pop_back();
+  EXPECT_TRUE(back.budget->take());
+}
+
+TEST_F(ConnectionLimiterTest, APeerThatLeftNothingBehindIsForgotten) {
+  std::weak_ptr<CallBudget> budget;
+  {
+    auto admission = admit("one");
+    budget = admission.budget;
+    admission.budget.reset();
+    EXPECT_FALSE(budget.expired());
+  }
+  EXPECT_TRUE(budget.expired());
 }
 
 }  // namespace

@@ -299,6 +299,45 @@ TEST_F(LinuxRpcServiceTest, OnePeersConnectionsAreLimitedAndOthersAreServed) {
   EXPECT_TRUE(admitted);
 }
 
+// Whose requests are not answered. Each connection asks for all that it may.
+class LinuxRpcServiceBudgetTest : public LinuxRpcServiceTest, public testing::WithParamInterface<std::pair<Standing, std::size_t>> {};
+
+TEST_P(LinuxRpcServiceBudgetTest, OnePeersUnansweredRequestsAreLimitedOverAllItsConnectionsAndOthersAreServed) {
+  serve();
+  const auto [standing, limit] = GetParam();
+  driver.peers.setNextPeer(standing, standing == Standing::confined ? std::optional<std::string>("com.example.App") : std::nullopt, {});
+  const auto refusals = std::make_shared<Mailbox<QXError>>();  // the clients fill it once more when they go
+  std::vector<LinuxDriver::Client> clients;
+  std::optional<QXRemote<TestProtocol>> remote;
+  for (std::size_t asked = 0; asked < limit; ++asked) {
+    if (asked % (limit / 4) == 0) {
+      clients.push_back(driver.connect());
+      remote.emplace(clients.back().proxy([refusals](const QXError& error) { refusals->put(error); }));
+    }
+    remote->call<&TestProtocol::list>([](const auto&...) { ADD_FAILURE() << "answered"; });
+  }
+  // Each connection's requests run one after another: when its last one has been refused, the ones before it have been counted.
+  for (const auto& client : clients) {
+    Mailbox<QXError> unknown;
+    client.proxy([&unknown](const QXError& error) { unknown.put(error); })->send({"unheard:of:", {}, {}}, {}, {});
+    ASSERT_THAT(unknown.take(), IsRpcError(QXRpcErrorCode::unknownOperation));
+  }
+  EXPECT_EQ(refusals->count(), 0U);
+  EXPECT_FALSE(roundTrip(clients.front()));
+  EXPECT_FALSE(roundTrip(driver.connect()));
+  driver.peers.setNextPeer(Standing::confined, "com.example.Other", {});
+  EXPECT_TRUE(roundTrip(driver.connect()));
+}
+
+INSTANTIATE_TEST_SUITE_P(Of, LinuxRpcServiceBudgetTest,
+                         testing::Values(std::pair(Standing::confined, kMaximumCallsPerPeer),
+                                         std::pair(Standing::nobody, kMaximumCallsPerPeer),
+                                         std::pair(Standing::unconfined, kMaximumUnconfinedCalls)),
+                         [](const auto& info) {
+                           if (info.param.first == Standing::confined) return "ABundle";
+                           return info.param.first == Standing::nobody ? "ProcessesWithoutAnIdentity" : "UnconfinedProcesses";
+                         });
+
 TEST_F(LinuxRpcServiceTest, WithoutFreeDescriptorsAClientIsDroppedAndTheServiceGoesOn) {
   serve();
   const auto served = driver.connect();

@@ -88,7 +88,7 @@ class EndpointTest : public testing::Test {
     std::shared_ptr<Mailbox<Hello>> hellos = std::make_shared<Mailbox<Hello>>();
   };
 
-  Side makeSide(UniqueDescriptor socket, Hello hello = {}) {
+  Side makeSide(UniqueDescriptor socket, Hello hello = {}, std::shared_ptr<CallBudget> budget = {}) {
     Side side;
     Endpoint::Handlers handlers;
     handlers.onHello = [hellos = side.hellos](const Hello& said) -> std::optional<QXError> {
@@ -97,7 +97,7 @@ class EndpointTest : public testing::Test {
     };
     handlers.onClose = [closed = side.closed](const QXError& reason) { closed->put(reason); };
     handlers.onMisbehaviour = [blamed = side.blamed](const QXError& reason) { blamed->put(reason); };
-    side.endpoint = Endpoint::create(*reactor, std::move(socket), std::move(hello), std::move(handlers));
+    side.endpoint = Endpoint::create(*reactor, std::move(socket), std::move(hello), std::move(handlers), std::move(budget));
     return side;
   }
 
@@ -113,9 +113,9 @@ class EndpointTest : public testing::Test {
   }
 
   // An endpoint that exports `object`, and a peer written by hand.
-  RawPeer connectRaw(std::shared_ptr<QXRpcExportedObject> object) {
+  RawPeer connectRaw(std::shared_ptr<QXRpcExportedObject> object, std::shared_ptr<CallBudget> budget = {}) {
     auto [one, two] = socketPair();
-    server = makeSide(std::move(one));
+    server = makeSide(std::move(one), {}, std::move(budget));
     server.endpoint->setExportedInterface(testInterface());
     server.endpoint->setExportedObject(std::move(object));
     server.endpoint->resume();
@@ -203,12 +203,23 @@ TEST_F(EndpointTest, AReplyMayBeCalledAfterTheConnectionIsOver) {
   request->reply({QXValue("later")});
 }
 
-TEST_F(EndpointTest, AMessageWithoutAReplyHandlerReachesTheObjectWithoutAReply) {
+TEST_F(EndpointTest, AMessageWithoutAReplyHandlerReachesTheObject) {
   connect(recorder);
   proxy()->send(kEcho, {QXValue("a")}, {});
-  auto request = recorder->requests.take();
+  const auto request = recorder->requests.take();
   ASSERT_TRUE(request);
-  EXPECT_FALSE(request->reply);
+  EXPECT_EQ(request->arguments, QXArray{QXValue("a")});
+}
+
+TEST_F(EndpointTest, ARequestThatWantsNoReplyGetsNone) {
+  auto raw = connectRaw(std::make_shared<Answerer>([](QXArray arguments) { return arguments; }));
+  raw.sayHello();
+  ASSERT_TRUE(raw.read<Hello>());
+  raw.write(Frame(RequestFrame{1, false, kEcho.name, {QXValue("a")}}));
+  raw.write(Frame(RequestFrame{2, true, kEcho.name, {QXValue("b")}}));
+  const auto reply = raw.read<ReplyFrame>();
+  ASSERT_TRUE(reply);
+  EXPECT_EQ(reply->callID, 2U);
 }
 
 TEST_F(EndpointTest, AMessageWithoutAReplyHandlerIsRefusedToItsErrorHandler) {
@@ -764,7 +775,7 @@ TEST_F(EndpointTest, APeerMayNotKeepTooManyRequestsUnanswered) {
   ASSERT_TRUE(raw.read<Hello>());
   std::vector<Recorder::Request> held;
   for (std::size_t i = 1; i <= kMaximumPendingCalls; ++i) {
-    raw.write(Frame(RequestFrame{i, true, kEcho.name, {QXValue("a")}}));
+    raw.write(Frame(RequestFrame{i, i % 2 == 0, kEcho.name, {QXValue("a")}}));  // whether it wants an answer or not
     auto request = recorder->requests.take();
     ASSERT_TRUE(request);
     held.push_back(*std::move(request));
@@ -776,6 +787,31 @@ TEST_F(EndpointTest, APeerMayNotKeepTooManyRequestsUnanswered) {
   EXPECT_EQ(refused->error.code, code(QXRpcErrorCode::tooManyCalls));
   held.pop_back();  // dropping a reply makes room too
   raw.write(Frame(RequestFrame{kMaximumPendingCalls + 2, true, kEcho.name, {QXValue("b")}}));
+  EXPECT_TRUE(recorder->requests.take());
+}
+
+TEST_F(EndpointTest, ConnectionsOfOneBudgetHaveTogetherNoMoreRequestsUnansweredThanItGives) {
+  const auto budget = std::make_shared<CallBudget>(1U);
+  auto first = connectRaw(recorder, budget);
+  const Side other = std::exchange(server, {});
+  auto second = connectRaw(recorder, budget);
+  for (const auto* peer : {&first, &second}) {
+    peer->sayHello();
+    ASSERT_TRUE(peer->read<Hello>());
+  }
+  first.write(Frame(RequestFrame{1, true, kEcho.name, {QXValue("a")}}));
+  auto held = recorder->requests.take();
+  ASSERT_TRUE(held);
+  second.write(Frame(RequestFrame{1, true, kEcho.name, {QXValue("b")}}));
+  const auto refused = second.read<FailureFrame>();
+  ASSERT_TRUE(refused);
+  EXPECT_EQ(refused->error.code, code(QXRpcErrorCode::tooManyCalls));
+
+  first.leave();
+  ASSERT_TRUE(other.closed->take());
+  EXPECT_FALSE(budget->take()) << "the request outlives its connection";
+  held->reply({QXValue("a")});
+  second.write(Frame(RequestFrame{2, true, kEcho.name, {QXValue("c")}}));
   EXPECT_TRUE(recorder->requests.take());
 }
 

@@ -189,6 +189,9 @@ TEST_F(ProtocolPageTest, GivesTheLimits) {
       {"connections of one bundle to the daemon", std::to_string(kMaximumConnectionsPerPeer) + "; one more is ended with error 9"},
       {"connections of all unconfined processes together",
        std::to_string(kMaximumUnconfinedConnections) + "; one more is ended with error 9"},
+      {"requests of one bundle that wait for a reply of the daemon, over all its connections",
+       std::to_string(kMaximumCallsPerPeer) + "; one more fails with error 5"},
+      {"the same of all unconfined processes together", std::to_string(kMaximumUnconfinedCalls) + "; one more fails with error 5"},
       {"accesses of one connection to `com.orvane.FileCoordination`",
        std::to_string(AccessSession::kMaximumAccesses) + "; one more is refused"}};
   for (const auto& limit : limits) EXPECT_EQ(row("Limits", limit.first), (std::vector{limit.first, limit.second}));

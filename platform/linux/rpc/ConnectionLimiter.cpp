@@ -1,19 +1,26 @@
+// A request may outlive its connection: whoever was asked for it, perhaps a provider, is still at it. A peer is therefore remembered while
+// anything holds its budget, and finds it again when it comes back; closing connections gives it nothing new. Who is forgotten is looked
+// for when a place is given back: peers are bundles, and few.
+
 #include "platform/linux/rpc/ConnectionLimiter.h"
 
 #include <utility>
 
 namespace docuvend::linux_platform {
 
-ConnectionLimiter::Admission ConnectionLimiter::admit(const std::string& peer, std::size_t limit) {
+ConnectionLimiter::Admission ConnectionLimiter::admit(const std::string& peer, Limits limits) {
+  std::shared_ptr<CallBudget> budget;
   {
     const std::lock_guard lock(mutex_);
     Count& count = counts_[peer];
-    if (count.open >= limit) {
-      return {std::exchange(count.refusing, true) ? Verdict::refusedAgain : Verdict::refused, nullptr};
+    if (count.open >= limits.connections) {
+      return {std::exchange(count.refusing, true) ? Verdict::refusedAgain : Verdict::refused, /*place=*/{}, /*budget=*/{}};
     }
+    if (!count.budget) count.budget = std::make_shared<CallBudget>(limits.calls);
+    budget = count.budget;
     ++count.open;
   }
-  return {Verdict::admitted, std::make_unique<Place>(shared_from_this(), peer)};
+  return {Verdict::admitted, std::make_unique<Place>(shared_from_this(), peer), std::move(budget)};
 }
 
 std::size_t ConnectionLimiter::openConnections() const {
@@ -27,7 +34,9 @@ void ConnectionLimiter::giveBack(const std::string& peer) {
   const std::lock_guard lock(mutex_);
   const auto found = counts_.find(peer);
   found->second.refusing = false;
-  if (--found->second.open == 0) counts_.erase(found);
+  --found->second.open;
+  // What this map alone holds nobody can take hold of meanwhile.
+  std::erase_if(counts_, [](const auto& counted) { return counted.second.open == 0 && counted.second.budget.use_count() == 1; });
 }
 
 }  // namespace docuvend::linux_platform

@@ -1,4 +1,5 @@
-// How many connections one peer may hold open. May be used from any thread.
+// How many connections one peer may hold open, and how many requests it may have without an answer over all of them together. Limits of the
+// second kind keep a peer from using up what the daemon may ask of a provider: they are well below that. May be used from any thread.
 #pragma once
 
 #include <cstddef>
@@ -7,11 +8,15 @@
 #include <mutex>
 #include <string>
 
+#include "platform/linux/wire/CallBudget.h"
+
 namespace docuvend::linux_platform {
 
 inline constexpr std::size_t kMaximumConnectionsPerPeer = 64;
+inline constexpr std::size_t kMaximumCallsPerPeer = 256;
 // All unconfined processes are counted as one peer. They are trusted, and there may be hundreds of them at work.
 inline constexpr std::size_t kMaximumUnconfinedConnections = 1024;
+inline constexpr std::size_t kMaximumUnconfinedCalls = 4096;
 
 class ConnectionLimiter : public std::enable_shared_from_this<ConnectionLimiter> {
  public:
@@ -36,23 +41,30 @@ class ConnectionLimiter : public std::enable_shared_from_this<ConnectionLimiter>
 
   struct Admission {
     Verdict verdict;
-    std::unique_ptr<Place> place;  // when admitted
+    // When admitted.
+    std::unique_ptr<Place> place;
+    std::shared_ptr<CallBudget> budget;  // the peer's
   };
-  // `peer` is what connections are counted by; a peer has one limit.
-  [[nodiscard]] Admission admit(const std::string& peer, std::size_t limit);
+  struct Limits {
+    std::size_t connections;
+    std::size_t calls;  // requests without an answer
+  };
+  // `peer` is what connections and requests are counted by; its limits are always the same.
+  [[nodiscard]] Admission admit(const std::string& peer, Limits limits);
 
   // Of all peers together.
   [[nodiscard]] std::size_t openConnections() const;
 
  private:
   struct Count {
+    std::shared_ptr<CallBudget> budget;
     std::size_t open = 0;
     bool refusing = false;
   };
   void giveBack(const std::string& peer);
 
   mutable std::mutex mutex_;
-  std::map<std::string, Count> counts_;  // of peers with open connections
+  std::map<std::string, Count> counts_;  // of peers with open connections or requests that outlived theirs
 };
 
 }  // namespace docuvend::linux_platform

@@ -20,14 +20,14 @@ Endpoint::Handlers handlersFor(QXLogHandle& log, int loggedProcess, LinuxRpcConn
 
 std::shared_ptr<LinuxRpcConnection> LinuxRpcConnection::create(Reactor& reactor, PeerDirectory& peers, QXLogHandle& log,
                                                                std::shared_ptr<const PeerIdentity> peer, UniqueDescriptor socket,
-                                                               EndHandler onEnd) {
+                                                               std::shared_ptr<CallBudget> budget, EndHandler onEnd) {
   auto handlers = handlersFor(log, peer->pid, std::move(onEnd));
   std::shared_ptr<LinuxRpcConnection> connection(new LinuxRpcConnection(std::move(peer)));
   handlers.onHello = [&peers, weak = std::weak_ptr(connection)](const Hello& hello) -> std::optional<QXError> {
     const auto strongSelf = weak.lock();
     return strongSelf ? strongSelf->peerSaidHello(peers, hello) : std::nullopt;
   };
-  connection->endpoint_ = Endpoint::create(reactor, std::move(socket), Hello{}, std::move(handlers));
+  connection->endpoint_ = Endpoint::create(reactor, std::move(socket), Hello{}, std::move(handlers), std::move(budget));
   return connection;
 }
 

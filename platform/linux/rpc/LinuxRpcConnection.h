@@ -11,6 +11,7 @@
 
 #include "platform/linux/base/UniqueDescriptor.h"
 #include "platform/linux/identity/PeerIdentity.h"
+#include "platform/linux/wire/CallBudget.h"
 #include "platform/linux/wire/Endpoint.h"
 #include "platform/linux/wire/Reactor.h"
 #include "platform/log.h"
@@ -23,10 +24,11 @@ class LinuxRpcConnection final : public QXRpcConnection, public std::enable_shar
   using EndHandler = std::function<void(const QXError& reason)>;
 
   // A peer that a listener accepted. A bundle that it declares in its hello is put to the directory; a refusal ends the connection. `onEnd`
-  // is called once, on a thread of the reactor; the directory and the log outlive the reactor's threads.
+  // is called once, on a thread of the reactor; the directory and the log outlive the reactor's threads. Requests count in `budget` until
+  // they are answered, also when the connection ends before.
   [[nodiscard]] static std::shared_ptr<LinuxRpcConnection> create(Reactor& reactor, PeerDirectory& peers, QXLogHandle& log,
                                                                   std::shared_ptr<const PeerIdentity> peer, UniqueDescriptor socket,
-                                                                  EndHandler onEnd);
+                                                                  std::shared_ptr<CallBudget> budget, EndHandler onEnd);
 
   void setExportedInterface(QXRpcInterface interface) override;
   void setExportedObject(std::shared_ptr<QXRpcExportedObject> object) override;

@@ -29,8 +29,9 @@ std::string countedAs(const PeerIdentity& peer) {
   return "unconfined processes";
 }
 
-std::size_t limitFor(const PeerIdentity& peer) {
-  return peer.standing == Standing::unconfined ? kMaximumUnconfinedConnections : kMaximumConnectionsPerPeer;
+ConnectionLimiter::Limits limitsFor(const PeerIdentity& peer) {
+  if (peer.standing == Standing::unconfined) return {kMaximumUnconfinedConnections, kMaximumUnconfinedCalls};
+  return {kMaximumConnectionsPerPeer, kMaximumCallsPerPeer};
 }
 
 }  // namespace
@@ -118,19 +119,19 @@ void LinuxRpcListener::admit(UniqueDescriptor socket) {
   }
   const std::string counted = countedAs(*peer);
   const int process = peer->pid;
-  const std::size_t limit = limitFor(*peer);
-  auto [verdict, place] = surroundings_.limiter->admit(counted, limit);
+  const ConnectionLimiter::Limits limits = limitsFor(*peer);
+  auto [verdict, place, budget] = surroundings_.limiter->admit(counted, limits);
   if (verdict != ConnectionLimiter::Verdict::admitted) {
     if (verdict == ConnectionLimiter::Verdict::refused) {
       surroundings_.log.write(QXLogType::defaultType, "[NOTICE] Refusing a connection of PID " + std::to_string(process) + ": " + counted +
-                                                          " may not open more than " + std::to_string(limit) + ".");
+                                                          " may not open more than " + std::to_string(limits.connections) + ".");
     }
     refuse(std::move(socket), "too many connections");
     return;
   }
   const std::uint64_t number = nextNumber_++;
   auto connection = LinuxRpcConnection::create(surroundings_.reactor, surroundings_.peers, surroundings_.log, std::move(peer),
-                                               std::move(socket), [weak = weak_from_this(), number](const QXError&) {
+                                               std::move(socket), std::move(budget), [weak = weak_from_this(), number](const QXError&) {
                                                  if (const auto strongSelf = weak.lock()) strongSelf->forget(number);
                                                });
   {

@@ -52,8 +52,9 @@ enum class Cause {
 
 class Endpoint::State final : public AnswerSink, public std::enable_shared_from_this<State> {
  public:
-  State(Reactor& reactor, UniqueDescriptor socket, Handlers handlers)
-      : reactor_(reactor),
+  State(Reactor& reactor, UniqueDescriptor socket, Handlers handlers, std::shared_ptr<CallBudget> budget)
+      : incoming(std::move(budget)),
+        reactor_(reactor),
         post_(reactor.poster()),
         handlers_(std::move(handlers)),
         socket_(std::make_shared<const UniqueDescriptor>(std::move(socket))) {}
@@ -450,8 +451,9 @@ Endpoint::Endpoint(std::shared_ptr<State> state) : state_(std::move(state)) {}
 
 Endpoint::~Endpoint() { state_->close(QXError::system(ECONNABORTED, "the connection was released"), Farewell::silent); }
 
-std::shared_ptr<Endpoint> Endpoint::create(Reactor& reactor, UniqueDescriptor socket, Hello hello, Handlers handlers) {
-  auto state = std::make_shared<State>(reactor, std::move(socket), std::move(handlers));
+std::shared_ptr<Endpoint> Endpoint::create(Reactor& reactor, UniqueDescriptor socket, Hello hello, Handlers handlers,
+                                           std::shared_ptr<CallBudget> budget) {
+  auto state = std::make_shared<State>(reactor, std::move(socket), std::move(handlers), std::move(budget));
   auto endpoint = std::shared_ptr<Endpoint>(new Endpoint(state));
   state->sendHello(std::move(hello));
   return endpoint;

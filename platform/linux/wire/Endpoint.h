@@ -14,6 +14,7 @@
 #include <variant>
 
 #include "platform/linux/base/UniqueDescriptor.h"
+#include "platform/linux/wire/CallBudget.h"
 #include "platform/linux/wire/Frame.h"
 #include "platform/linux/wire/OutgoingCalls.h"
 #include "platform/linux/wire/Reactor.h"
@@ -36,8 +37,10 @@ class Endpoint : public std::enable_shared_from_this<Endpoint> {
   };
 
   // Takes a connected socket and sends the hello; its version is put in when it is 0. Nothing is read before `resume`. The endpoint lives
-  // as long as its owner holds it: released, it closes the connection.
-  [[nodiscard]] static std::shared_ptr<Endpoint> create(Reactor& reactor, UniqueDescriptor socket, Hello hello, Handlers handlers);
+  // as long as its owner holds it: released, it closes the connection. The peer's unanswered requests also count in `budget`, which may be
+  // shared with other endpoints.
+  [[nodiscard]] static std::shared_ptr<Endpoint> create(Reactor& reactor, UniqueDescriptor socket, Hello hello, Handlers handlers,
+                                                        std::shared_ptr<CallBudget> budget = {});
   ~Endpoint();
   Endpoint(const Endpoint&) = delete;
   Endpoint& operator=(const Endpoint&) = delete;

@@ -1,5 +1,6 @@
 #include "platform/linux/wire/IncomingCalls.h"
 
+#include <atomic>
 #include <optional>
 #include <string>
 #include <utility>
@@ -25,19 +26,12 @@ std::string quote(const std::string& operation) {
 // One request's right to be answered once.
 struct IncomingCalls::Answer {
   Answer(std::weak_ptr<AnswerSink> to, std::uint64_t id, std::shared_ptr<const QXRpcInterface> exported, std::size_t index,
-         std::shared_ptr<std::atomic<std::size_t>> count)
-      : sink(std::move(to)), callID(id), interface(std::move(exported)), operation(index), unanswered(std::move(count)) {
-    ++*unanswered;
-  }
-  Answer(const Answer&) = delete;
-  Answer& operator=(const Answer&) = delete;
-  ~Answer() {
-    if (!given.exchange(true)) --*unanswered;
-  }
+         std::unique_ptr<CallBudget::Share> taken)
+      : sink(std::move(to)), callID(id), interface(std::move(exported)), operation(index), share(std::move(taken)) {}
 
   void give(QXArray values) {
     if (given.exchange(true)) return;
-    --*unanswered;
+    share.reset();
     const auto open = sink.lock();
     if (!open) return;
     if (auto mismatch = qxReplyMismatch(*interface, operation, values)) {
@@ -47,13 +41,16 @@ struct IncomingCalls::Answer {
     }
   }
 
-  const std::weak_ptr<AnswerSink> sink;
+  const std::weak_ptr<AnswerSink> sink;  // empty: the peer wants no answer
   const std::uint64_t callID;
   const std::shared_ptr<const QXRpcInterface> interface;
   const std::size_t operation;
-  const std::shared_ptr<std::atomic<std::size_t>> unanswered;
   std::atomic<bool> given = false;
+  std::unique_ptr<CallBudget::Share> share;  // of whoever gives the answer, and of the destructor
 };
+
+IncomingCalls::IncomingCalls(std::shared_ptr<CallBudget> shared)
+    : budget_(std::make_shared<CallBudget>(kMaximumPendingCalls, std::move(shared))) {}
 
 void IncomingCalls::setInterface(QXRpcInterface interface) {
   const std::lock_guard lock(mutex_);
@@ -84,16 +81,15 @@ void IncomingCalls::run(RequestFrame request, const std::shared_ptr<AnswerSink>&
     sink->sendFailure({request.callID, failure(QXRpcErrorCode::invalidArguments, request.operation + ": " + *mismatch)});
     return;
   }
-  QXRpcReply reply;
-  if (request.wantsReply) {
-    if (*unanswered_ >= kMaximumPendingCalls) {
-      sink->sendFailure({request.callID, failure(QXRpcErrorCode::tooManyCalls, "too many requests wait for their answers")});
-      return;
-    }
-    const auto answer = std::make_shared<Answer>(sink, request.callID, std::move(interface), *operation, unanswered_);
-    reply = [answer](QXArray values) { answer->give(std::move(values)); };
+  auto share = budget_->take();
+  if (!share) {
+    sink->sendFailure({request.callID, failure(QXRpcErrorCode::tooManyCalls, "too many requests wait for their answers")});
+    return;
   }
-  object->invoke(*operation, std::move(request.arguments), std::move(reply));
+  // A request that wants no answer is as much work as one that does.
+  const auto answer =
+      std::make_shared<Answer>(request.wantsReply ? sink : nullptr, request.callID, std::move(interface), *operation, std::move(share));
+  object->invoke(*operation, std::move(request.arguments), [answer](QXArray values) { answer->give(std::move(values)); });
 }
 
 }  // namespace docuvend::linux_platform

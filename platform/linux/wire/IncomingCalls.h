@@ -3,11 +3,10 @@
 // May be used from any thread; a request runs on the thread that gives it.
 #pragma once
 
-#include <atomic>
-#include <cstddef>
 #include <memory>
 #include <mutex>
 
+#include "platform/linux/wire/CallBudget.h"
 #include "platform/linux/wire/Frame.h"
 #include "platform/rpc.h"
 
@@ -27,9 +26,13 @@ class AnswerSink {
 
 class IncomingCalls {
  public:
+  // What the requests take besides the own budget of these calls; may be empty.
+  explicit IncomingCalls(std::shared_ptr<CallBudget> shared);
+
   void setInterface(QXRpcInterface interface);
   void setObject(std::shared_ptr<QXRpcExportedObject> object);
-  // Lets the exported object go; answers to requests that it still holds are dropped with their sink.
+  // Lets the exported object go; answers to requests that it still holds are dropped with their sink, and keep their share of the budget
+  // until then: what was asked for is still at work.
   void release();
 
   // Runs the request, or refuses it.
@@ -42,8 +45,8 @@ class IncomingCalls {
   std::shared_ptr<const QXRpcInterface> interface_;
   std::shared_ptr<QXRpcExportedObject> object_;
 
-  // Requests whose replies are not answered and not dropped yet; the answers share it, for they may live longer.
-  const std::shared_ptr<std::atomic<std::size_t>> unanswered_ = std::make_shared<std::atomic<std::size_t>>(0);
+  // Of requests whose replies are not called and not dropped yet, wanted or not.
+  const std::shared_ptr<CallBudget> budget_;
 };
 
 }  // namespace docuvend::linux_platform

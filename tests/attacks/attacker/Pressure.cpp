@@ -6,7 +6,9 @@
 //   deaf SERVICE            sends requests and reads no answer, until the connection ends
 //   turns URL COUNT         takes turns at a file and does not end them; how many it got, and the error of the first that it did not get
 //   start URL PROVIDER CONSUMER COUNT
-//                           asks for an item again and again and waits for no answer but the last one's; that one
+//                           asks for an item again and again, and what the first answer is
+//   start-silently URL PROVIDER CONSUMER COUNT
+//                           the same, and wants no answers; the first failure
 //   hold NAME               makes the file NAME.holding and waits until NAME.go is there
 #include <sys/socket.h>
 #include <sys/time.h>
@@ -163,7 +165,9 @@ std::string takeTurns(Words& words) {
   return std::to_string(count);
 }
 
-std::string startAgainAndAgain(Words& words) {
+enum class Answers { wanted, unwanted };
+
+std::string startAgainAndAgain(Words& words, Answers answers) {
   const QXURL url = QXURL::fileURL(words.next(), QXURLKind::file);
   const std::string provider = words.next();
   const std::string consumer = words.next();
@@ -172,7 +176,7 @@ std::string startAgainAndAgain(Words& words) {
   const RawPeer& peer = hoard().peers.back();
   if (!peer.sayHello()) return "ended at once";
   for (std::uint64_t number = 1; number <= count; ++number) {
-    if (!peer.write(Frame(RequestFrame{number, true, kStart, {url, provider, consumer}}))) return "ended";
+    if (!peer.write(Frame(RequestFrame{number, answers == Answers::wanted, kStart, {url, provider, consumer}}))) return "ended";
   }
   while (const auto frame = peer.read()) {
     if (const auto* failure = std::get_if<FailureFrame>(&*frame)) {
@@ -198,8 +202,13 @@ std::string hold(Words& words) {
 }  // namespace
 
 Acts pressureActs() {
-  return {{"crowd", crowd},   {"garble", garble},   {"half", sendHalves},
-          {"deaf", stayDeaf}, {"turns", takeTurns}, {"start", startAgainAndAgain},
+  return {{"crowd", crowd},
+          {"garble", garble},
+          {"half", sendHalves},
+          {"deaf", stayDeaf},
+          {"turns", takeTurns},
+          {"start", [](Words& words) { return startAgainAndAgain(words, Answers::wanted); }},
+          {"start-silently", [](Words& words) { return startAgainAndAgain(words, Answers::unwanted); }},
           {"hold", hold}};
 }
 
