@@ -39,10 +39,13 @@ void LinuxFileCoordinator::_removeDocuvend(const std::shared_ptr<QXDocuvend>& pr
     const std::lock_guard lock(mutex_);
     const auto found = std::find_if(registrations_.begin(), registrations_.end(),
                                     [&provider](const Registration& registration) { return registration.provider == provider; });
-    if (found == registrations_.end() || --found->count > 0) return;
-    last = std::move(found->provider);
-    registrations_.erase(found);
+    if (found != registrations_.end()) {
+      if (--found->count > 0) return;
+      last = std::move(found->provider);
+      registrations_.erase(found);
+    }
   }
+  // Also of one that never was added, because its setup failed: when its bundle is gone, nobody has it to wait for any more.
   registrationsChanged();
 }
 

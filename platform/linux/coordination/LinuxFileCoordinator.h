@@ -68,7 +68,8 @@ class LinuxFileCoordinator final : public QXFileCoordinator {
   // Who has noted that it waits for an owner asks this afterwards: true when a registration has come or gone since that owner was looked
   // for.
   [[nodiscard]] bool hasChangedSince(const FileOwner& owner) const { return registrationChanges_ != owner.registrationChanges; }
-  // Called after each addition and removal, with no lock held; one that is running when another handler is set may still run.
+  // Called after each addition and removal, also of an object that was never added, with no lock held; one that is running when another
+  // handler is set may still run.
   void setRegistrationHandler(std::function<void()> handler);
 
   // Asks the object for the contents of the file on behalf of a reader of that process, under an identifier that no other reader has.
