@@ -2,17 +2,22 @@
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
 
+#include <cstddef>
+#include <cstdint>
 #include <filesystem>
 #include <memory>
+#include <optional>
 #include <string>
 #include <vector>
 
+#include "platform/linux/coordination/AccessSession.h"
 #include "platform/linux/wire/FileCoordinationProtocol.h"
 #include "tests/system/house/TurnTest.h"
 
 namespace docuvend::tests {
 namespace {
 
+using linux_platform::AccessSession;
 using linux_platform::FileCoordinationErrorCode;
 using linux_platform::kFileCoordinationServiceName;
 using linux_platform::kQXFileCoordinationErrorDomain;
@@ -21,6 +26,11 @@ using ::testing::ElementsAre;
 using ::testing::SizeIs;
 
 constexpr const char* kNotPermitted = "QXFileCoordinationErrorDomain 2";
+
+std::optional<FileCoordinationErrorCode> codeOf(const std::optional<QXError>& error) {
+  if (!error || error->domain != kQXFileCoordinationErrorDomain) return std::nullopt;
+  return static_cast<FileCoordinationErrorCode>(error->code);
+}
 
 class CoordinationCallers : public TurnTest {
  protected:
@@ -148,26 +158,38 @@ TEST_F(CoordinationCallers, AnUnconfinedCallerIsToldOfProcessesAndBundlesAndACon
 
 TEST_F(CoordinationCallers, WhatIsMissingInARequestIsNamed) {
   const auto client = house_.client(std::nullopt, kFileCoordinationServiceName);
-  const auto code = [](const std::optional<QXError>& error) {
-    return error && error->domain == kQXFileCoordinationErrorDomain ? static_cast<FileCoordinationErrorCode>(error->code)
-                                                                    : FileCoordinationErrorCode{};
-  };
   const QXUUID access{{1}};
   const auto reading = [&](const std::optional<QXURL>& file, const std::optional<QXUUID>& id) {
-    return code(errorOf(client->ask<&QXFileCoordination::coordinateReadingItemAtURL>(file, std::nullopt, id, std::nullopt)));
+    return codeOf(errorOf(client->ask<&QXFileCoordination::coordinateReadingItemAtURL>(file, std::nullopt, id, std::nullopt)));
   };
   EXPECT_EQ(reading(std::nullopt, access), FileCoordinationErrorCode::missingURL);
   EXPECT_EQ(reading(letter_, std::nullopt), FileCoordinationErrorCode::invalidAccessID);
   EXPECT_EQ(reading(url(house_.home() + "/none/file"), access), FileCoordinationErrorCode::noDirectory);
   expectNothingHappened();
-  EXPECT_EQ(reading(letter_, access), FileCoordinationErrorCode{});
+  EXPECT_EQ(reading(letter_, access), std::nullopt);
   EXPECT_EQ(reading(letter_, access), FileCoordinationErrorCode::invalidAccessID) << "in use";
-  EXPECT_EQ(code(errorOf(client->ask<&QXFileCoordination::endAccess>(QXUUID{{2}}))), FileCoordinationErrorCode::invalidAccessID);
+  EXPECT_EQ(codeOf(errorOf(client->ask<&QXFileCoordination::endAccess>(QXUUID{{2}}))), FileCoordinationErrorCode::invalidAccessID);
   // Another connection's access.
-  EXPECT_EQ(code(errorOf(house_.client(std::nullopt, kFileCoordinationServiceName)->ask<&QXFileCoordination::endAccess>(access))),
+  EXPECT_EQ(codeOf(errorOf(house_.client(std::nullopt, kFileCoordinationServiceName)->ask<&QXFileCoordination::endAccess>(access))),
             FileCoordinationErrorCode::invalidAccessID);
   EXPECT_EQ(errorOf(client->ask<&QXFileCoordination::endAccess>(access)), std::nullopt);
-  EXPECT_EQ(code(errorOf(client->ask<&QXFileCoordination::endAccess>(access))), FileCoordinationErrorCode::invalidAccessID) << "over";
+  EXPECT_EQ(codeOf(errorOf(client->ask<&QXFileCoordination::endAccess>(access))), FileCoordinationErrorCode::invalidAccessID) << "over";
+}
+
+TEST_F(CoordinationCallers, OneConnectionHasOnlySoManyAccesses) {
+  const QXURL own = url(house_.home() + "/own.txt");
+  const auto reading = [&own](Client& client, std::size_t number) {
+    QXUUID access;
+    access.bytes = {static_cast<std::uint8_t>(number), static_cast<std::uint8_t>(number >> 8U)};
+    return errorOf(client.ask<&QXFileCoordination::coordinateReadingItemAtURL>(own, std::nullopt, access, std::nullopt));
+  };
+  const auto greedy = house_.client(std::nullopt, kFileCoordinationServiceName);
+  for (std::size_t i = 0; i < AccessSession::kMaximumAccesses; ++i) ASSERT_EQ(reading(*greedy, i), std::nullopt) << i;
+  EXPECT_EQ(codeOf(reading(*greedy, AccessSession::kMaximumAccesses)), FileCoordinationErrorCode::tooManyAccesses);
+  EXPECT_THAT(holders(own), SizeIs(AccessSession::kMaximumAccesses));
+  EXPECT_EQ(reading(*house_.client(std::nullopt, kFileCoordinationServiceName), 0), std::nullopt) << "somebody else's";
+  EXPECT_EQ(errorOf(greedy->ask<&QXFileCoordination::endAccess>(QXUUID{})), std::nullopt);
+  EXPECT_EQ(reading(*greedy, AccessSession::kMaximumAccesses), std::nullopt) << "there is room again";
 }
 
 }  // namespace

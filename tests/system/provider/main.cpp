@@ -1,7 +1,7 @@
 // A provider that does what the name of an item says, and takes any name below its storage for an item.
 //
 //   at the start                 if the file "flood" lies in its container, removes it, floods the daemon with frames and ends
-//   performInitialSetup          waits while the file "hang" lies in its container
+//   performInitialSetup          waits while the file "hang" lies in its container, and fails while "unwell" does
 //
 //   identifierForItem  control   an identifier with the character U+0001
 //                      refused   an error, whose text is the file "says" in its container, if that is there
@@ -84,6 +84,7 @@ class Trickster : public Provider {
  public:
   [[nodiscard]] Failure performInitialSetup() override {
     while (access("hang", F_OK) == 0) std::this_thread::sleep_for(std::chrono::milliseconds(1));
+    if (access("unwell", F_OK) == 0) return refusal();
     std::error_code error;
     std::filesystem::create_directory(storage(), error);
     if (error) return QXError::system(error.value(), "cannot make the storage");
