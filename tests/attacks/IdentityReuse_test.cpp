@@ -20,6 +20,7 @@
 #include "platform/fake/FakeLog.h"
 #include "platform/linux/identity/LinuxPeerDirectory.h"
 #include "tests/attacks/namespaces.h"
+#include "tests/support/Sanitizers.h"
 
 namespace docuvend::tests {
 namespace {
@@ -162,6 +163,7 @@ std::string inNamespaces(const std::function<std::string()>& work) {
 
 TEST(IdentityReuse, AProcessThatGotTheNumberOfOneThatConnectedIsNotTakenForIt) {
   ASSERT_NE(::geteuid(), 0U) << "run this test as an unprivileged user";
+  if (tests::kThreadSanitizer) GTEST_SKIP() << "the sanitizer has a thread of its own, and two threads cannot enter a user namespace";
   if (!KernelFacilities::probe().peerPidfd) GTEST_SKIP() << "this kernel tells a peer by its number alone";
   EXPECT_EQ(inNamespaces(connectAndLeaveTheNumber), "nobody nobody unconfined unconfined");
 }

@@ -9,6 +9,7 @@
 #include <map>
 
 #include "tests/attacks/FileAttackTest.h"
+#include "tests/support/Sanitizers.h"
 
 namespace docuvend::tests {
 namespace {
@@ -18,9 +19,9 @@ using ::testing::AnyOf;
 
 // Each round is a request to another process, and the provider exchanges the names several times during each. The check and the use by
 // themselves go through the same races in one process in TokenRedeemer_test.cpp.
-constexpr int kRedemptions = 15'000;
-constexpr int kGrants = 2'000;  // each asks the provider as well
-constexpr int kSaves = 1'000;   // each waits for the disk
+constexpr int kRedemptions = kSanitized ? 500 : 5'000;
+constexpr int kGrants = kSanitized ? 50 : 500;  // each asks the provider as well
+constexpr int kSaves = kSanitized ? 50 : 500;   // each waits for the disk
 
 class Swaps : public FileAttackTest {
  protected:

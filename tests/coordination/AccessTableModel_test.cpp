@@ -13,6 +13,7 @@
 
 #include "platform/linux/coordination/AccessTable.h"
 #include "tests/coordination/Turns.h"
+#include "tests/support/Sanitizers.h"
 
 namespace docuvend::linux_platform {
 namespace {
@@ -20,7 +21,7 @@ namespace {
 using Entry = AccessTable::Entry;
 using Numbers = std::vector<AccessNumber>;
 
-constexpr int kSequences = 200;
+constexpr int kSequences = tests::kSanitized ? 20 : 200;
 constexpr int kSteps = 400;
 constexpr std::uint8_t kProcesses = 4;
 constexpr int kPartiesOfAProcess = 2;

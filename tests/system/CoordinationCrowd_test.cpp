@@ -13,6 +13,7 @@
 #include <string>
 #include <vector>
 
+#include "tests/support/Sanitizers.h"
 #include "tests/system/house/Burden.h"
 #include "tests/system/house/TurnTest.h"
 
@@ -27,12 +28,8 @@ using ::testing::Le;
 constexpr long kSeconds = 5;
 constexpr long kRounds = 20;
 constexpr int kItems = 20;
-#if defined(__SANITIZE_ADDRESS__) || defined(__SANITIZE_THREAD__)
 // A process with a sanitizer takes many times the memory, and many times as long to start.
-constexpr int kMembers = 40;
-#else
-constexpr int kMembers = 200;
-#endif
+constexpr int kMembers = kSanitized ? 40 : 200;
 // A ledger without an entry, as turntaker/Ledger.cpp writes it.
 constexpr const char* kEmptyLedger = "sum 14695981039346656037 of 0\n";
 

@@ -359,18 +359,22 @@ TEST_F(OverScriptedServices, TheContentsProgressIsGoneBeforeTheyArePrinted) {
 }
 
 TEST_F(OverScriptedServices, AFileThatCannotBeHadIsAFailureThatSaysWhy) {
-  startCoordination();
   for (const auto& [code, status] : std::map<FileCoordinationErrorCode, int>{{FileCoordinationErrorCode::notPermitted, 3},
                                                                              {FileCoordinationErrorCode::noDirectory, 4},
                                                                              {FileCoordinationErrorCode::wouldDeadlock, 8}}) {
     script_.accessError = script_.error = coordinationError(code);
+    startCoordination();
     for (const char* name : {"read", "write", "holders"}) {
       const Ending ending = ended({name, path_}, "new");
       EXPECT_EQ(ending.status, status) << name;
       EXPECT_THAT(ending.errors, HasSubstr("of a test"));
       EXPECT_EQ(ending.output, "");
     }
+    // Each service makes its socket anew; the next one's script is set while nobody reads it.
+    coordination_.reset();
+    daemon_.reset();
   }
+  startCoordination();
   EXPECT_EQ(tests::contentsOf(path_).size(), std::filesystem::file_size(path_));
   EXPECT_EQ(ended({"read", "relative"}).status, 6);
   EXPECT_EQ(ended({"write", "relative"}).status, 6);
@@ -397,8 +401,8 @@ TEST_F(OverScriptedServices, AFileThatCannotBeOpenedIsGivenBack) {
 }
 
 TEST_F(OverScriptedServices, AReaderWhoseTurnIsLostWhileItPrintsSaysSo) {
-  script_.ending = [this](const QXFileCoordination::ErrorReply&) { coordination_->endConnections(); };
   startCoordination();
+  script_.ending = [this](const QXFileCoordination::ErrorReply&) { coordination_->endConnections(); };
   const Ending ending = ended({"read", path_});
   EXPECT_EQ(ending.status, 7);
   EXPECT_EQ(ending.output, tests::contentsOf(path_));
