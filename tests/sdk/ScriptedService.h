@@ -30,8 +30,9 @@ class ScriptedService {
       return;
     }
     // `this` is safe: the reactor has run its last handler before anything else of the service goes.
-    registration_ = reactor_->watch(socket_->descriptor(), EPOLLIN, [this](std::uint32_t) -> std::uint32_t {
-      accept();
+    // So is the reactor's address, not the pointer to it: that is empty already while `stop` waits for the last handler.
+    registration_ = reactor_->watch(socket_->descriptor(), EPOLLIN, [this, &reactor = *reactor_](std::uint32_t) -> std::uint32_t {
+      accept(reactor);
       return EPOLLIN;
     });
   }
@@ -68,7 +69,7 @@ class ScriptedService {
   }
 
  private:
-  void accept() {
+  void accept(linux_platform::Reactor& reactor) {
     linux_platform::UniqueDescriptor client(::accept4(socket_->descriptor(), nullptr, nullptr, SOCK_CLOEXEC));
     if (!client) return;
     linux_platform::Endpoint::Handlers handlers;
@@ -77,7 +78,7 @@ class ScriptedService {
       declared_.push_back(hello.declaredBundle);
       return refusal_;
     };
-    auto endpoint = linux_platform::Endpoint::create(*reactor_, std::move(client), {}, std::move(handlers));
+    auto endpoint = linux_platform::Endpoint::create(reactor, std::move(client), {}, std::move(handlers));
     endpoint->setExportedInterface(qxInterfaceOf<Protocol>());
     endpoint->setExportedObject(std::make_shared<QXRpcExport<Protocol>>(object_));
     {
