@@ -32,5 +32,6 @@ using Acts = std::map<std::string, Act>;
 [[nodiscard]] Acts fileActs();
 [[nodiscard]] Acts surroundingsActs();
 [[nodiscard]] Acts pressureActs();
+[[nodiscard]] Acts pretenceActs();
 
 }  // namespace docuvend::attacker
