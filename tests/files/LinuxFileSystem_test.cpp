@@ -13,6 +13,7 @@
 #include <vector>
 
 #include "platform/linux/base/UniqueDescriptor.h"
+#include "platform/linux/files/StraightURL.h"
 #include "tests/files/TemporaryDirectory.h"
 
 namespace docuvend::linux_platform {
@@ -37,6 +38,10 @@ class LinuxFileSystemTest : public ::testing::Test {
 
   [[nodiscard]] std::string path(const std::string& name) const { return directory_.path(name); }
 
+  // Where it leads, by its one name.
+  [[nodiscard]] std::string straight(const std::string& item) const {
+    return straightURL(QXURL::fileURL(path(item), QXURLKind::file)).fileSystemPath();
+  }
   // The relationship as a number, or minus the error's code.
   [[nodiscard]] int lies(const std::string& item, const std::string& directory = "items") {
     return liesAt(QXURL::fileURL(path(directory), QXURLKind::directory), QXURL::fileURL(path(item), QXURLKind::file));
@@ -84,33 +89,70 @@ TEST_F(LinuxFileSystemTest, NewDirectoriesHaveTheModeThatTheMaskLeaves) {
   EXPECT_EQ(status.st_mode & 07777U, 0750U);
 }
 
-TEST_F(LinuxFileSystemTest, LinksAreFollowedOnBothSides) {
+TEST_F(LinuxFileSystemTest, AnItemThatIsNamedThroughALinkLiesElsewhereWhereverTheLinkLeads) {
   fs::create_symlink(path("outside/file"), path("items/out"));
   fs::create_symlink(path("items/file"), path("outside/in"));
   fs::create_directory_symlink("items", path("alias"));
   fs::create_directory_symlink("../../outside", path("items/sub/away"));
   EXPECT_EQ(lies("items/out"), kOther);
-  EXPECT_EQ(lies("outside/in"), kContains);
-  EXPECT_EQ(lies("alias/file"), kContains);
-  EXPECT_EQ(lies("alias"), kSame);
+  EXPECT_EQ(lies("outside/in"), kOther);
+  EXPECT_EQ(lies("alias/file"), kOther);
+  EXPECT_EQ(lies("alias"), kOther);
   EXPECT_EQ(lies("items/sub/away/file"), kOther);
   EXPECT_EQ(lies("items/sub/away/missing"), kOther);
-  EXPECT_EQ(lies("items/sub/away/../items/missing"), kContains);
+  EXPECT_EQ(lies("items/sub/away/../items/missing"), kOther);
+  EXPECT_EQ(lies("outside/../items/file"), kContains) << "no link on the way";
 }
 
-TEST_F(LinuxFileSystemTest, ALinkToWhatDoesNotExistYetLiesWhereItPoints) {
+TEST_F(LinuxFileSystemTest, LinksOnTheWayToTheDirectoryAreFollowed) {
+  fs::create_directory(path("real"));
+  fs::rename(path("items"), path("real/items"));
+  fs::create_directory_symlink("real", path("alias"));
+  EXPECT_EQ(lies("real/items/file", "alias/items"), kContains);
+  EXPECT_EQ(lies("real/items", "alias/items"), kSame);
+}
+
+TEST_F(LinuxFileSystemTest, AStraightNameHasNoLinksAndNoDots) {
+  fs::create_symlink(path("outside/file"), path("items/out"));
+  fs::create_symlink("out", path("items/chain"));
+  fs::create_directory_symlink("../../outside", path("items/sub/away"));
+  EXPECT_EQ(straight("items/file"), path("items/file"));
+  EXPECT_EQ(straight("items/missing/below"), path("items/missing/below"));
+  EXPECT_EQ(straight("items/out"), path("outside/file"));
+  EXPECT_EQ(straight("items/chain"), path("outside/file"));
+  EXPECT_EQ(straight("items/sub/away/file"), path("outside/file"));
+  EXPECT_EQ(straight("items/sub/away/missing"), path("outside/missing"));
+  EXPECT_EQ(straight("items/sub/away/../items/file"), path("items/file")) << "up from where the link leads";
+  EXPECT_EQ(straight("items/./sub//../file"), path("items/file"));
+  EXPECT_EQ(straight("items/missing/./x"), path("items/missing/x"));
+  EXPECT_EQ(straight("items/missing/../file"), path("items/missing/../file")) << "leads nowhere";
+}
+
+TEST_F(LinuxFileSystemTest, AStraightURLKeepsItsTextAndALinkedOnesKind) {
+  fs::create_directory_symlink("items", path("alias"));
+  const auto escaped = QXURL::fromString("file://" + path("items/%66ile"));
+  ASSERT_TRUE(escaped);
+  EXPECT_EQ(straightURL(*escaped), *escaped);
+  const QXURL directory = QXURL::fileURL(path("items/sub"), QXURLKind::directory);
+  EXPECT_EQ(straightURL(directory), directory);
+  EXPECT_EQ(straightURL(QXURL::fileURL(path("alias/sub"), QXURLKind::directory)), directory);
+  EXPECT_EQ(straightURL(QXURL::fileURL(path("alias/file"), QXURLKind::file)), QXURL::fileURL(path("items/file"), QXURLKind::file));
+}
+
+TEST_F(LinuxFileSystemTest, ALinkToWhatDoesNotExistYetLeadsWhereItPoints) {
   fs::create_symlink(path("outside/missing"), path("items/out"));
   fs::create_symlink(path("items/missing"), path("outside/in"));
   fs::create_symlink("../items/missing", path("outside/relative"));
   fs::create_symlink("relative", path("outside/chain"));
   fs::create_symlink("../outside/missing", path("items/directory"));
   fs::create_symlink("missing/../../items/x", path("outside/up"));
-  EXPECT_EQ(lies("items/out"), kOther);
-  EXPECT_EQ(lies("outside/in"), kContains);
-  EXPECT_EQ(lies("outside/relative"), kContains);
-  EXPECT_EQ(lies("outside/chain"), kContains);
-  EXPECT_EQ(lies("items/directory/below"), kOther);
-  EXPECT_EQ(lies("outside/in/below"), kContains);
+  EXPECT_EQ(straight("items/out"), path("outside/missing"));
+  EXPECT_EQ(straight("outside/in"), path("items/missing"));
+  EXPECT_EQ(straight("outside/relative"), path("items/missing"));
+  EXPECT_EQ(straight("outside/chain"), path("items/missing"));
+  EXPECT_EQ(straight("items/directory/below"), path("outside/missing/below"));
+  EXPECT_EQ(straight("outside/in/below"), path("items/missing/below"));
+  EXPECT_EQ(straight("outside/up"), path("outside/up")) << "leads nowhere";
   EXPECT_EQ(lies("outside/up"), -ENOENT);
 }
 
@@ -119,7 +161,6 @@ TEST_F(LinuxFileSystemTest, AMissingComponentCannotBeLeftUpwards) {
   EXPECT_EQ(lies("items/missing/../../outside/file"), -ENOENT);
   EXPECT_EQ(lies("outside/missing/../../items/file"), -ENOENT);
   EXPECT_EQ(lies("items/missing/.."), -ENOENT);
-  EXPECT_EQ(lies("items/missing/./x"), kContains);
 }
 
 TEST_F(LinuxFileSystemTest, ALoopOfLinksIsAnError) {

@@ -2,6 +2,8 @@
 
 #include <utility>
 
+#include "platform/linux/rpc/StraightURLs.h"
+
 namespace docuvend::linux_platform {
 
 std::optional<QXValue> ExtensionConnection::valueForEntitlement(const std::string& name) const {
@@ -11,10 +13,11 @@ std::optional<QXValue> ExtensionConnection::valueForEntitlement(const std::strin
 }
 
 std::shared_ptr<QXRpcProxy> ExtensionConnection::remoteObjectProxy(QXErrorHandler errorHandler) {
-  return process_->remoteObjectProxy([onFailedMessage = onFailedMessage_, errorHandler = std::move(errorHandler)](const QXError& error) {
-    onFailedMessage();
-    if (errorHandler) errorHandler(error);
-  });
+  return withStraightReplies(
+      process_->remoteObjectProxy([onFailedMessage = onFailedMessage_, errorHandler = std::move(errorHandler)](const QXError& error) {
+        onFailedMessage();
+        if (errorHandler) errorHandler(error);
+      }));
 }
 
 }  // namespace docuvend::linux_platform

@@ -20,6 +20,7 @@
 #include <array>
 #include <cerrno>
 #include <climits>
+#include <filesystem>
 #include <optional>
 #include <string_view>
 
@@ -138,6 +139,18 @@ FilePlace::Result FilePlace::ofDirectory(const std::string& path, LastLink lastL
     if (std::get<int>(name) != EAGAIN) return std::get<int>(name);
   }
   return EAGAIN;
+}
+
+std::string FilePlace::path() const {
+  if (missing.empty()) return existing;
+  return existing.ends_with('/') ? existing + missing : existing + "/" + missing;
+}
+
+// "." and ".." mean the same to a reader of the text and to the kernel as long as there is no link.
+bool FilePlace::isNamedBy(const std::string& path) const {
+  std::string text = std::filesystem::path(path).lexically_normal().string();
+  if (text.size() > 1 && text.ends_with('/')) text.pop_back();
+  return text == this->path();
 }
 
 bool FilePlace::isBelow(const FilePlace& directory) const {

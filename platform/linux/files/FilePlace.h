@@ -21,6 +21,10 @@ struct FilePlace {
   // ENOENT when there is no such directory, ENOTDIR when it is something else. Links on the way are followed.
   [[nodiscard]] static Result ofDirectory(const std::string& path, LastLink lastLink = LastLink::followed);
 
+  // Its one name without links.
+  [[nodiscard]] std::string path() const;
+  // True when that path, which leads here, does so over no link.
+  [[nodiscard]] bool isNamedBy(const std::string& path) const;
   // True when this place is somewhere below that directory; false for the directory itself.
   [[nodiscard]] bool isBelow(const FilePlace& directory) const;
 

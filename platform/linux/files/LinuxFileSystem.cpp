@@ -58,6 +58,8 @@ std::variant<QXRelationship, QXError> LinuxFileSystem::relationship(const QXURL&
   if (const int* error = std::get_if<int>(&itemPlace)) return systemError(*error, item);
   const auto& above = std::get<FilePlace>(directoryPlace);
   const auto& place = std::get<FilePlace>(itemPlace);
+  // Who owns a link on the way can lead it elsewhere at once: what holds for such a name holds for a moment.
+  if (!place.isNamedBy(item.fileSystemPath())) return QXRelationship::other;
   if (place == above) return QXRelationship::same;
   return place.isBelow(above) ? QXRelationship::contains : QXRelationship::other;
 }

@@ -1,8 +1,8 @@
 // Files and directories of this machine. Without state of its own; may be used from any thread.
 //
 // A relationship is read off the kernel's names of the two places (see the source). One place seen through a bind mount elsewhere is
-// another place. A directory that is itself a link is none. Errors other than the missing directory are of the system's domain, with the
-// errno value.
+// another place. A directory that is itself a link is none. An item that is named through a link lies elsewhere, wherever the link leads
+// (StraightURL.h). Errors other than the missing directory are of the system's domain, with the errno value.
 #pragma once
 
 #include <optional>
