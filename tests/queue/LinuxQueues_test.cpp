@@ -3,6 +3,7 @@
 
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
+#include <sys/resource.h>
 
 #include <atomic>
 #include <chrono>
@@ -10,6 +11,7 @@
 #include <memory>
 #include <optional>
 #include <string>
+#include <system_error>
 #include <thread>
 #include <vector>
 
@@ -522,6 +524,57 @@ TEST(LinuxQueuesDeathTest, WorkMayBeSubmittedWhileTheProcessEnds) {
     std::exit(3);
   };
   EXPECT_EXIT(endWithWork(), testing::ExitedWithCode(3), "");
+}
+
+constexpr int kAsExpected = 3;
+constexpr int kNotAsExpected = 4;
+
+// As when somebody has taken all the processes that the user may have. It stays so for this process.
+void allowNoFurtherThread() {
+  const rlimit none{1, 1};
+  bool isRefused = ::setrlimit(RLIMIT_NPROC, &none) != 0;
+  try {
+    std::thread([] {}).join();
+  } catch (const std::system_error&) {
+    isRefused = true;
+  }
+  if (!isRefused) std::_Exit(kNotAsExpected);
+}
+
+TEST(LinuxQueuesDeathTest, AllWorkIsDoneByTheFirstThreadsWhenTheSystemHasNoOther) {
+  testing::GTEST_FLAG(death_test_style) = "threadsafe";
+  const auto work = [] {
+    Arrivals arrivals;
+    LinuxQueues queues({2, 4});
+    const auto serial = queues.serialQueue("serial");
+    const auto concurrent = queues.concurrentQueue("concurrent");
+    allowNoFurtherThread();
+    serial->after(1ms, [&] { arrivals.arrive("delayed"); });
+    for (int i = 0; i < 3; ++i) {
+      concurrent->async([&] {
+        serial->sync([] {});  // it waits, and no other thread can take its place
+        arrivals.arrive("read");
+      });
+      serial->async([&] { arrivals.arrive("written"); });
+    }
+    queues.globalQueue().async([&] { arrivals.arrive("anywhere"); });
+    std::_Exit(arrivals.waitFor(8) ? kAsExpected : kNotAsExpected);
+  };
+  EXPECT_EXIT(work(), testing::ExitedWithCode(kAsExpected), "");
+}
+
+TEST(LinuxQueuesDeathTest, TheServiceIsNotMadeWithoutItsFirstThreads) {
+  testing::GTEST_FLAG(death_test_style) = "threadsafe";
+  const auto make = [] {
+    allowNoFurtherThread();
+    try {
+      const LinuxQueues queues;
+    } catch (const std::system_error&) {
+      std::_Exit(kAsExpected);
+    }
+    std::_Exit(kNotAsExpected);
+  };
+  EXPECT_EXIT(make(), testing::ExitedWithCode(kAsExpected), "");
 }
 
 }  // namespace

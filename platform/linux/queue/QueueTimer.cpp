@@ -11,6 +11,8 @@ constexpr std::chrono::nanoseconds kLongestDelay = std::chrono::hours(24 * 365 *
 
 }  // namespace
 
+QueueTimer::QueueTimer() : thread_(&QueueTimer::runThread, this) {}
+
 QueueTimer::~QueueTimer() { stop(); }
 
 void QueueTimer::add(std::chrono::nanoseconds delay, QXTask submit) {
@@ -18,11 +20,7 @@ void QueueTimer::add(std::chrono::nanoseconds delay, QXTask submit) {
   const std::lock_guard lock(mutex_);
   if (stopping_) return;  // the caller's copy is destroyed after the lock
   const auto added = tasks_.emplace(due, std::move(submit));
-  if (!thread_.joinable()) {
-    thread_ = std::thread(&QueueTimer::runThread, this);
-  } else if (added == tasks_.begin()) {
-    changed_.notify_one();
-  }
+  if (added == tasks_.begin()) changed_.notify_one();
 }
 
 void QueueTimer::stop() {

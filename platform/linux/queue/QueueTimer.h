@@ -11,10 +11,11 @@
 
 namespace docuvend::linux_platform {
 
-// All operations may be called from any thread. The thread begins with the first task.
+// All operations may be called from any thread. A delay that cannot be kept for want of a thread has nobody to be told of it, so the
+// thread is made with the timer; std::system_error when the system has none.
 class QueueTimer {
  public:
-  QueueTimer() = default;
+  QueueTimer();
   ~QueueTimer();
   QueueTimer(const QueueTimer&) = delete;
   QueueTimer& operator=(const QueueTimer&) = delete;
@@ -33,8 +34,8 @@ class QueueTimer {
   std::mutex mutex_;  // guards what follows
   std::condition_variable changed_;
   std::multimap<Clock::time_point, QXTask> tasks_;
-  std::thread thread_;
   bool stopping_ = false;
+  std::thread thread_;  // the last of them, since it uses the others
 };
 
 }  // namespace docuvend::linux_platform

@@ -3,13 +3,13 @@
 // piece while more is left, with nobody else looking, wakes the next. So with work in the list and a thread to spare there is always
 // somebody looking, and work that arrives while a thread is between two pieces is picked up by that thread.
 //
-// Threads are begun on demand and kept. A thread that waits in `Blocked` lends its place: if work is left another thread is woken or
+// One thread is there from the beginning, since somebody who uses up the user's processes could keep every later one from being made; the
+// others are begun on demand and kept. A thread that waits in `Blocked` lends its place: if work is left another thread is woken or
 // begun, up to a bound. That bound is no danger to progress: a blocked `sync` runs the work it waits for itself (QueueCore.cpp),
 // whether or not the pool has a thread for it.
 #include "platform/linux/queue/ThreadPool.h"
 
 #include <cassert>
-#include <exception>
 #include <system_error>
 #include <utility>
 
@@ -20,7 +20,11 @@ thread_local ThreadPool* poolOfThisThread = nullptr;
 
 }  // namespace
 
-ThreadPool::ThreadPool(PoolSize size) : size_(size) { assert(size.atOnce > 0 && size.atMost >= size.atOnce); }
+ThreadPool::ThreadPool(PoolSize size) : size_(size), sleeping_(1) {
+  assert(size.atOnce > 0 && size.atMost >= size.atOnce);
+  const std::lock_guard lock(mutex_);
+  pool_.emplace_back(&ThreadPool::runThread, this, Beginning::asleep);
+}
 
 ThreadPool::~ThreadPool() { stop(); }
 
@@ -60,26 +64,32 @@ void ThreadPool::wakeOneOrGrow() {
     awaken_.notify_one();
   } else if (pool_.size() < size_.atMost && pool_.size() - blocked_ < size_.atOnce) {
     try {
-      pool_.emplace_back(&ThreadPool::runThread, this);
+      pool_.emplace_back(&ThreadPool::runThread, this, Beginning::looking);
       ++looking_;
       ++wakeUps_;
     } catch (const std::system_error&) {
-      // The system has no thread to spare: the threads that exist will do, and without any nothing can run at all.
-      if (pool_.empty()) std::terminate();
+      // The system has no thread to spare: those that there are look at the list again when they are done.
     }
   }
 }
 
-void ThreadPool::runThread() {
+// Until it is chosen, or false when the pool stops.
+bool ThreadPool::sleep(std::unique_lock<std::mutex>& lock) {
+  awaken_.wait(lock, [this] { return chosen_ > 0 || stopping_; });
+  if (stopping_) return false;
+  --chosen_;
+  return true;
+}
+
+void ThreadPool::runThread(Beginning beginning) {
   poolOfThisThread = this;
   std::unique_lock lock(mutex_);
+  if (beginning == Beginning::asleep && !sleep(lock)) return;
   while (true) {
     while (work_.empty() && !stopping_) {
       --looking_;
       ++sleeping_;
-      awaken_.wait(lock, [this] { return chosen_ > 0 || stopping_; });
-      if (stopping_) return;
-      --chosen_;
+      if (!sleep(lock)) return;
     }
     if (stopping_) return;
     QXTask work = std::move(work_.front());

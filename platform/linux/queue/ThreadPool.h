@@ -20,6 +20,8 @@ struct PoolSize {
 // All operations may be called from any thread.
 class ThreadPool {
  public:
+  // With its first thread; std::system_error when the system has none. The others come when they are wanted, and when the system has none
+  // to spare the work waits for those that are there.
   explicit ThreadPool(PoolSize size);
   ~ThreadPool();
   ThreadPool(const ThreadPool&) = delete;
@@ -43,11 +45,14 @@ class ThreadPool {
     ThreadPool* const pool_;  // null on a thread of no pool
   };
 
-  // For measurements: how often a sleeping thread was woken or a new one begun.
+  // For measurements: how often a sleeping thread was woken or another one begun.
   [[nodiscard]] std::size_t wakeUps() const;
 
  private:
-  void runThread();
+  enum class Beginning { asleep, looking };
+
+  void runThread(Beginning beginning);
+  [[nodiscard]] bool sleep(std::unique_lock<std::mutex>& lock);
   void wakeOneOrGrow();
 
   const PoolSize size_;
