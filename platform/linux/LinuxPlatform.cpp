@@ -10,6 +10,7 @@
 #include <algorithm>
 #include <cerrno>
 #include <string>
+#include <system_error>
 #include <thread>
 #include <utility>
 #include <vector>
@@ -151,7 +152,8 @@ struct LinuxPlatform::Services {
   }
 };
 
-std::variant<std::unique_ptr<LinuxPlatform>, QXError> LinuxPlatform::create() {
+// Every thread that the daemon cannot do without begins here: later there may be none to be had.
+std::variant<std::unique_ptr<LinuxPlatform>, QXError> LinuxPlatform::create() try {
   if (::geteuid() == 0) return QXError::system(EPERM, "a sandbox made by root keeps too much; run as an ordinary user");
   if (::prctl(PR_SET_NO_NEW_PRIVS, 1, 0, 0, 0) != 0) return QXError::system(errno, "cannot give up new privileges");
   ::umask(kOwnerOnlyMask);
@@ -168,6 +170,8 @@ std::variant<std::unique_ptr<LinuxPlatform>, QXError> LinuxPlatform::create() {
   if (auto* error = std::get_if<QXError>(&sandbox)) return *error;
   services->sandbox = std::get<std::unique_ptr<LinuxSandbox>>(std::move(sandbox));
   return std::unique_ptr<LinuxPlatform>(new LinuxPlatform(std::move(services)));
+} catch (const std::system_error& error) {
+  return QXError::system(error.code().value(), "cannot begin a thread");
 }
 
 LinuxPlatform::LinuxPlatform(std::unique_ptr<Services> services) : services_(std::move(services)) {}

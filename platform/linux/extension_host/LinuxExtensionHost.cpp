@@ -7,6 +7,7 @@
 #include <condition_variable>
 #include <mutex>
 #include <optional>
+#include <system_error>
 #include <thread>
 #include <utility>
 #include <vector>
@@ -128,7 +129,12 @@ LinuxExtensionHost::LinuxExtensionHost(BundleRegistry& bundles, const Paths& pat
                                        const ExtensionTimes& times)
     : state_(std::make_shared<State>(bundles, paths, reactor, log, times)) {
   // The host ends the thread before it lets go of the state.
-  state_->thread = std::thread([state = state_.get()] { state->run(); });
+  try {
+    state_->thread = std::thread([state = state_.get()] { state->run(); });
+  } catch (const std::system_error&) {
+    state_->services->spawner.stop();
+    throw;
+  }
   bundles.onChange([weak = std::weak_ptr(state_)] {
     if (const auto strongState = weak.lock()) strongState->look();
   });
