@@ -15,6 +15,9 @@ namespace docuvend {
 // Names a reader or a writer to the provider; only printed.
 struct QXCoordinationID {
   std::string value;
+  // A writer's is kept as long as the provider is being told of the write: when the last copy goes, the service takes that to be over,
+  // however it went. May be dropped on any thread.
+  std::shared_ptr<const void> untilTold = {};
 };
 
 // What a provider object answers. Called on threads of the service's choosing.

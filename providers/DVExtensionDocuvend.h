@@ -132,8 +132,9 @@ class DVExtensionDocuvend final : public QXDocuvend, public std::enable_shared_f
   void _provideItemAtURL(const QXURL& url, ProvideCompletion completionHandler) override;
   // Tells the provider that owns the URL now, which need not be this one.
   void _writerWithID(const QXCoordinationID& writer, const QXURL& didFinishWritingForURL) override;
-  // Tells the extension; nobody hears of a failure but the log.
-  void itemChangedAtURL(const QXURL& url);
+  // Tells the extension; nobody hears of a failure but the log. What is given to be held is let go when the extension has answered, or
+  // cannot.
+  void itemChangedAtURL(const QXURL& url, std::shared_ptr<const void> untilTold = {});
 
  private:
   explicit DVExtensionDocuvend(std::shared_ptr<QXExtension> extension);
@@ -147,8 +148,8 @@ class DVExtensionDocuvend final : public QXDocuvend, public std::enable_shared_f
 
   void readableItemIDAnswered(const QXURL& url, const std::optional<std::string>& reader, std::optional<QXError> error,
                               ProvideCompletion completionHandler);
-  void changeRequestAnswered(const QXURL& url, const std::optional<QXError>& error, const std::optional<VendorProxy>& proxy,
-                             const FinishHandler& finish);
+  void changeRequestAnswered(const QXURL& url, const std::shared_ptr<const void>& untilTold, const std::optional<QXError>& error,
+                             const std::optional<VendorProxy>& proxy, const FinishHandler& finish);
   void changeAnswered(const QXURL& url, const std::optional<QXError>& error, const FinishHandler& finish);
 
   // Fixed after construction

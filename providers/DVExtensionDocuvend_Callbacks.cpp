@@ -43,32 +43,33 @@ void DVExtensionDocuvend::_writerWithID(const QXCoordinationID& writer, const QX
   const std::shared_ptr<DVExtensionDocuvend> provider = providerForURL(url, &excludedURL);
   if (provider != nullptr) {
     dvLog("[DEBUG] The item at URL %@ is provided by the etxension %@", url, provider->identifier());
-    provider->itemChangedAtURL(url);
+    provider->itemChangedAtURL(url, writer.untilTold);
   } else if (!excludedURL) {
     dvLog("[ERROR] Could not find any extension that provides an item at URL %@", url);
   }
 }
 
-void DVExtensionDocuvend::itemChangedAtURL(const QXURL& url) {
+void DVExtensionDocuvend::itemChangedAtURL(const QXURL& url, std::shared_ptr<const void> untilTold) {
   dvLog("[DEBUG] %s", "-[DVExtensionDocuvend itemChangedAtURL:]");
-  performExtensionRequest(
-      [strongSelf = shared_from_this(), url](std::optional<QXError> error, std::optional<VendorProxy> proxy, FinishHandler finish) {
-        strongSelf->changeRequestAnswered(url, error, proxy, finish);
-      });
+  performExtensionRequest([strongSelf = shared_from_this(), url, untilTold = std::move(untilTold)](
+                              std::optional<QXError> error, std::optional<VendorProxy> proxy, FinishHandler finish) {
+    strongSelf->changeRequestAnswered(url, untilTold, error, proxy, finish);
+  });
 }
 
 // Unlike the forwarded operations and the registration, a change ends its request also when there is no proxy.
-void DVExtensionDocuvend::changeRequestAnswered(const QXURL& url, const std::optional<QXError>& error,
-                                                const std::optional<VendorProxy>& proxy, const FinishHandler& finish) {
+void DVExtensionDocuvend::changeRequestAnswered(const QXURL& url, const std::shared_ptr<const void>& untilTold,
+                                                const std::optional<QXError>& error, const std::optional<VendorProxy>& proxy,
+                                                const FinishHandler& finish) {
   if (error) {
     dvLog("[ERROR] Cannot tell extension %@ that item at URL %@ has changed.", identifier(), url);
     finish();
     return;
   }
-  proxy->call<&_QXDocuvendVendor::_itemChangedAtURL>(url,
-                                                     [strongSelf = shared_from_this(), url, finish](std::optional<QXError> replyError) {
-                                                       strongSelf->changeAnswered(url, replyError, finish);
-                                                     });
+  proxy->call<&_QXDocuvendVendor::_itemChangedAtURL>(
+      url, [strongSelf = shared_from_this(), url, untilTold, finish](std::optional<QXError> replyError) {
+        strongSelf->changeAnswered(url, replyError, finish);
+      });
 }
 
 void DVExtensionDocuvend::changeAnswered(const QXURL& url, const std::optional<QXError>& error, const FinishHandler& finish) {

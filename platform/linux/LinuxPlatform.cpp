@@ -21,6 +21,7 @@
 #include "platform/linux/coordination/FileAccesses.h"
 #include "platform/linux/coordination/FileCoordinationListenerDelegate.h"
 #include "platform/linux/coordination/LinuxFileCoordinator.h"
+#include "platform/linux/coordination/Remnants.h"
 #include "platform/linux/extension_host/LinuxExtensionHost.h"
 #include "platform/linux/extension_host/Matching.h"
 #include "platform/linux/files/LinuxDeviceLock.h"
@@ -120,7 +121,10 @@ struct LinuxPlatform::Services {
   LinuxRpcService rpc;
   LinuxExtensionHost extensionHost{bundles, paths, reactor, log.defaultLog()};
   LinuxStatus status{rpc, extensionHost};
-  LinuxFileCoordinator fileCoordinator{fileSystem, {[this] { return installedStorages(bundles); }, &KeyedFile::isInPlace}};
+  Remnants remnants{fileSystem, QXURL::fileURL(paths.groupContainers, QXURLKind::directory)};
+  LinuxFileCoordinator fileCoordinator{fileSystem,
+                                       {[this] { return installedStorages(bundles); }, &KeyedFile::isInPlace,
+                                        [this](const KeyedFile& file) { return remnants.hasPlaceholder(file); }}};
   FileAccesses fileAccesses{fileCoordinator};
 
   std::unique_ptr<LinuxSandbox> sandbox;  // made in `create`, never null after it
@@ -132,6 +136,8 @@ struct LinuxPlatform::Services {
   std::shared_ptr<QXRpcListener> coordinationListener;
 
   void publish() {
+    // Nothing of this goes before the process does.
+    bundles.onChange([this] { fileCoordinator.installedStoragesChanged(); });
     sandboxDelegate = std::make_shared<SandboxListenerDelegate>(*sandbox, log.defaultLog());
     coordinationDelegate = std::make_shared<FileCoordinationListenerDelegate>(
         FileCoordinationServicer::Surroundings{fileCoordinator, fileAccesses, *sandbox, peers});

@@ -7,6 +7,7 @@
 
 #include "common/DVErrors.h"
 #include "platform/linux/coordination/AccessSession.h"
+#include "platform/linux/coordination/ChangeNotices.h"
 #include "platform/linux/rpc/ConnectionLimiter.h"
 #include "platform/linux/wire/FileCoordinationProtocol.h"
 #include "platform/linux/wire/Limits.h"
@@ -18,6 +19,7 @@ namespace docuvend::tests {
 namespace {
 
 using linux_platform::AccessSession;
+using linux_platform::ChangeNotices;
 using linux_platform::FileCoordinationErrorCode;
 using linux_platform::kFileCoordinationServiceName;
 using linux_platform::kMaximumCallsPerPeer;
@@ -167,6 +169,36 @@ TEST_F(Pressure, RequestsWhoseAnswersNobodyWantsCountLikeOthers) {
   ASSERT_EQ(lines.size(), 1U);
   EXPECT_TRUE(lines[0].starts_with(std::to_string(kMaximumCallsPerPeer + 1) + ": QXRpcErrorDomain 5")) << lines[0];
   writeFile(house_.container(kTrickster) + "/free", "");
+}
+
+// Neither one document that is written again and again nor many documents.
+TEST_F(Pressure, WritesThatASlowProviderIsToldOfLeaveRoomForEverybodyElse) {
+  constexpr int kMost = ChangeNotices::kMaximumNoticesUnderWay;
+  constexpr int kFiles = 2 * kMost;
+  constexpr int kWrites = kMaximumPendingCalls + kMost;
+  const std::string tellings = "[INFO] QXFileCoordinator is telling us the item at URL ";
+  const auto told = [this, &tellings](const std::string& name) {
+    return house_.loggedBeginning(tellings + item(name).absoluteString() + " was changed by writer ID ");
+  };
+  const std::string one = item("laggard-alone").fileSystemPath();
+  EXPECT_THAT(attack({"scribble", one, kTrickster, kAttacker, "1", std::to_string(kWrites)}), ElementsAre(std::to_string(kWrites)));
+  EXPECT_EQ(told("laggard-alone0"), 1);
+  const std::string many = item("laggard").fileSystemPath();
+  EXPECT_THAT(attack({"scribble", many, kTrickster, kAttacker, std::to_string(kFiles), "2"}), ElementsAre(std::to_string(2 * kFiles)));
+  EXPECT_EQ(house_.loggedBeginning(tellings), kMost);
+  expectOthersAreServed();
+  EXPECT_EQ(grantItem("other"), std::nullopt) << "that provider is there for others";
+  EXPECT_EQ(house_.ctl({"write", item("theirs").fileSystemPath()}, "new").status, 0);
+  EXPECT_EQ(told("theirs"), 1) << "and hears of what they write";
+
+  writeFile(house_.container(kTrickster) + "/free", "");
+  eventually("it has been told of every document", [&told] {
+    for (int file = 0; file < kFiles; ++file) {
+      if (told("laggard" + std::to_string(file)) == 0) return false;
+    }
+    return true;
+  });
+  eventually("and of the last write of the first one", [&told] { return told("laggard-alone0") == 2; });
 }
 
 class FaultyProvider : public Pressure, public ::testing::WithParamInterface<const char*> {};

@@ -9,6 +9,7 @@
 
 #include "platform/fake/FakeFileSystem.h"
 #include "platform/linux/coordination/FileAccesses.h"
+#include "platform/linux/wire/FileCoordinationProtocol.h"
 #include "tests/coordination/RecordingProvider.h"
 #include "tests/coordination/Turns.h"
 
@@ -40,7 +41,9 @@ struct AwaitedAccessesTest : ::testing::Test {
   const QXURL storage = QXURL::fileURL("/storage", QXURLKind::directory);
   std::vector<InstalledStorage> installed = {{"com.example.provider", storage}};
   fake_platform::FakeFileSystem fileSystem;
-  LinuxFileCoordinator coordinator{fileSystem, {.installedStorages = [this] { return installed; }}};
+  bool isRemnant = false;
+  LinuxFileCoordinator coordinator{
+      fileSystem, {.installedStorages = [this] { return installed; }, .isRemnant = [this](const KeyedFile&) { return isRemnant; }}};
   FileAccesses accesses{coordinator};
   const std::shared_ptr<RecordingProvider> provider = std::make_shared<RecordingProvider>(storage);
   Answers answers;
@@ -104,6 +107,58 @@ TEST_F(AwaitedAccessesTest, AReaderOfAProviderThatIsUninstalledGoesOnWithTheNext
   fileSystem.addDirectory("/other");
   coordinator._addDocuvend(std::make_shared<RecordingProvider>(QXURL::fileURL("/other", QXURLKind::directory)));
   EXPECT_EQ(answers, Answers{std::nullopt});
+}
+
+TEST_F(AwaitedAccessesTest, AReaderOfAProviderThatIsUninstalledGoesOnAtOnce) {
+  read(1);
+  installed.push_back({"com.example.other", QXURL::fileURL("/other", QXURLKind::directory)});
+  coordinator.installedStoragesChanged();
+  EXPECT_TRUE(answers.empty()) << "another has come";
+  installed.clear();
+  coordinator.installedStoragesChanged();
+  EXPECT_EQ(answers, Answers{std::nullopt});
+}
+
+TEST_F(AwaitedAccessesTest, AReaderWhoseProviderIsUninstalledBetweenTheLookAndTheNoteGoesOnToo) {
+  const auto storages = std::exchange(installed, {});
+  bool isFirst = true;
+  LinuxFileCoordinator racing{fileSystem, {.installedStorages = [&storages, &isFirst, &racing] {
+                                if (!std::exchange(isFirst, false)) return std::vector<InstalledStorage>();
+                                racing.installedStoragesChanged();
+                                return storages;
+                              }}};
+  FileAccesses racingAccesses{racing};
+  racingAccesses.begin(racingAccesses.newNumber(),
+                       {fileNamed(item), QXURL::fileURL(item, QXURLKind::file), AccessKind::reading, partyOf(1), {1, std::nullopt}},
+                       [this](std::optional<QXError> error) { answers.push_back(std::move(error)); });
+  EXPECT_EQ(answers, Answers{std::nullopt});
+}
+
+TEST_F(AwaitedAccessesTest, AReaderOfAPlaceholderWhoseProviderIsUninstalledHasAnErrorInsteadOfZeros) {
+  isRemnant = true;
+  read(1);
+  EXPECT_TRUE(answers.empty()) << "it is somebody's";
+  installed.clear();
+  coordinator.installedStoragesChanged();
+  ASSERT_EQ(answers.size(), 1U);
+  ASSERT_TRUE(answers[0]);
+  EXPECT_EQ(answers[0]->domain, kQXFileCoordinationErrorDomain);
+  EXPECT_EQ(answers[0]->code, static_cast<std::int64_t>(FileCoordinationErrorCode::noProvider));
+  EXPECT_EQ(answers[0]->url, QXURL::fileURL(item, QXURLKind::file));
+  const AccessNumber writer = write(2);
+  EXPECT_EQ(accesses.stateOf(writer), AccessState::holding) << "the failed read holds nothing, and it may be written";
+  end(writer);
+  EXPECT_EQ(endedCount, 1);
+  coordinator._addDocuvend(provider);
+  read(3);
+  EXPECT_EQ(provider->asked.size(), 1U) << "somebody's again";
+}
+
+TEST_F(AwaitedAccessesTest, WhatIsUntoldOutlivesTheChangeOfAnotherBundle) {
+  end(write(1));
+  coordinator.installedStoragesChanged();
+  coordinator._addDocuvend(provider);
+  EXPECT_EQ(provider->told.size(), 1U);
 }
 
 TEST_F(AwaitedAccessesTest, AWritersEndWaitsForNobodyAndTheProviderHearsOfItLater) {

@@ -93,10 +93,10 @@ TEST_F(LinuxFileCoordinatorTest, TellsAnObjectWithoutAQueueAtOnceAndNamesEveryWr
   const auto provider = added("/a/storage");
   int toldCount = 0;
   provider->onTold = [&toldCount] { EXPECT_EQ(toldCount, 0) << "answered before the object was told"; };
-  coordinator.tellFinishedWriting(ownedBy(provider), 42, {FileKey{}, fileURL("/a/storage/x.txt")}, [&toldCount] { ++toldCount; });
+  coordinator.tellFinishedWriting(ownedBy(provider), {42, {}}, {FileKey{}, fileURL("/a/storage/x.txt")}, [&toldCount] { ++toldCount; });
   EXPECT_EQ(toldCount, 1);
   provider->onTold = {};
-  coordinator.tellFinishedWriting(ownedBy(provider), 42, {FileKey{}, fileURL("/a/storage/x.txt")}, /*told=*/{});
+  coordinator.tellFinishedWriting(ownedBy(provider), {42, {}}, {FileKey{}, fileURL("/a/storage/x.txt")}, /*told=*/{});
   ASSERT_EQ(provider->told.size(), 2U);
   EXPECT_EQ(provider->told[0].first, "writer 42-1");
   EXPECT_EQ(provider->told[1].first, "writer 42-2");
@@ -107,7 +107,7 @@ TEST_F(LinuxFileCoordinatorTest, TellsAnObjectOnItsOwnQueue) {
   fake_platform::FakeQueues queues;
   const auto provider = std::make_shared<RecordingProvider>(directoryURL("/a"), queues.operationQueue());
   bool told = false;
-  coordinator.tellFinishedWriting(ownedBy(provider), 42, {FileKey{}, fileURL("/a/x.txt")}, [&told] { told = true; });
+  coordinator.tellFinishedWriting(ownedBy(provider), {42, {}}, {FileKey{}, fileURL("/a/x.txt")}, [&told] { told = true; });
   EXPECT_TRUE(provider->told.empty());
   EXPECT_FALSE(told);
   queues.runAll();
@@ -145,7 +145,7 @@ TEST_F(LinuxFileCoordinatorTest, HoldsNoLockWhileAnObjectIsTold) {
     EXPECT_EQ(providerOf(fileURL("/a/storage/x.txt")), provider);
     coordinator._removeDocuvend(provider);
   };
-  coordinator.tellFinishedWriting(ownedBy(provider), 42, {FileKey{}, fileURL("/a/storage/x.txt")}, /*told=*/{});
+  coordinator.tellFinishedWriting(ownedBy(provider), {42, {}}, {FileKey{}, fileURL("/a/storage/x.txt")}, /*told=*/{});
   EXPECT_EQ(provider->told.size(), 1U);
 }
 
@@ -159,7 +159,7 @@ struct AwaitedProviderTest : ::testing::Test {
   }
   static KeyedFile fileNamed(const std::string& path) { return {{/*directory=*/{}, path}, QXURL::fileURL(path, QXURLKind::file)}; }
   void finishWriting(const KeyedFile& file) {
-    coordinator.tellFinishedWriting(ownerOf(file), 42, file, [this] { ++toldCount; });
+    coordinator.tellFinishedWriting(ownerOf(file), {42, {}}, file, [this] { ++toldCount; });
   }
 
   std::vector<InstalledStorage> installed = {{"com.example.a", directoryURL("/a/storage")}, {"com.example.b", directoryURL("/b/storage")}};
@@ -205,15 +205,16 @@ TEST_F(AwaitedProviderTest, IsToldWhenItIsRegisteredOfEachFileOnce) {
 TEST_F(AwaitedProviderTest, IsToldAlsoWhenItIsRegisteredBetweenTheLookAndTheNote) {
   const FileOwner before = ownerOf(item);
   coordinator._addDocuvend(provider);
-  coordinator.tellFinishedWriting(before, 42, item, /*told=*/{});
+  coordinator.tellFinishedWriting(before, {42, {}}, item, /*told=*/{});
   EXPECT_EQ(provider->told.size(), 1U);
 }
 
-TEST_F(AwaitedProviderTest, IsToldOfSoManyFilesAndNoMore) {
-  for (std::size_t i = 0; i <= LinuxFileCoordinator::kMaximumUntold; ++i) finishWriting(fileNamed("/b/storage/" + std::to_string(i)));
+TEST_F(AwaitedProviderTest, IsToldOfEveryFileHoweverManyTheyAre) {
+  constexpr std::size_t kMany = 5000;
+  for (std::size_t i = 0; i < kMany; ++i) finishWriting(fileNamed("/b/storage/" + std::to_string(i)));
   finishWriting(fileNamed("/b/storage/0"));
   coordinator._addDocuvend(provider);
-  EXPECT_EQ(provider->told.size(), LinuxFileCoordinator::kMaximumUntold);
+  EXPECT_EQ(provider->told.size(), kMany);
 }
 
 TEST_F(AwaitedProviderTest, AFileThatIsNotInItsPlaceAnyMoreIsNobodys) {
@@ -252,9 +253,13 @@ TEST_F(AwaitedProviderTest, EveryChangeOfTheRegistrationsIsTold) {
   EXPECT_EQ(changes, 3) << "one that only counts down changes nothing";
   coordinator._removeDocuvend(provider);
   EXPECT_EQ(changes, 4) << "the removal of one that was never added may mean that there is nobody to wait for";
+  const FileOwner again = ownerOf(item);
+  coordinator.installedStoragesChanged();
+  EXPECT_EQ(changes, 5);
+  EXPECT_TRUE(coordinator.hasChangedSince(again));
   coordinator.setRegistrationHandler({});
   coordinator._addDocuvend(provider);
-  EXPECT_EQ(changes, 4);
+  EXPECT_EQ(changes, 5);
 }
 
 }  // namespace

@@ -1,6 +1,7 @@
 // A provider object that remembers what it was asked and told; the test answers. One thread at a time.
 #pragma once
 
+#include <cstddef>
 #include <functional>
 #include <memory>
 #include <optional>
@@ -31,6 +32,7 @@ class RecordingProvider final : public QXDocuvend {
   }
   void _writerWithID(const QXCoordinationID& writer, const QXURL& didFinishWritingForURL) override {
     told.emplace_back(writer.value, didFinishWritingForURL);
+    if (isSlow) unanswered.push_back(writer.untilTold);
     if (onTold) onTold();
   }
 
@@ -43,6 +45,14 @@ class RecordingProvider final : public QXDocuvend {
   std::function<void()> onAsked;
   std::vector<std::pair<std::string, QXURL>> told;
   std::function<void()> onTold;
+
+  // What a slow extension is being told.
+  bool isSlow = false;
+  std::vector<std::shared_ptr<const void>> unanswered;
+  void answer(std::size_t index = 0) {
+    const auto answered = unanswered.at(index);
+    unanswered.erase(unanswered.begin() + static_cast<std::ptrdiff_t>(index));
+  }
 
  private:
   const std::optional<QXURL> directory_;

@@ -11,6 +11,7 @@
 #include "platform/linux/bundles/BundleIdentifier.h"
 #include "platform/linux/bundles/BundleScan.h"
 #include "platform/linux/coordination/AccessSession.h"
+#include "platform/linux/coordination/ChangeNotices.h"
 #include "platform/linux/coordination/FileCoordinationServicer.h"
 #include "platform/linux/extension_host/LineAllowance.h"
 #include "platform/linux/extension_host/OutputLines.h"
@@ -50,6 +51,7 @@ std::vector<Limit> limits() {
           {"kMaximumCallsPerPeer", kMaximumCallsPerPeer},
           {"kMaximumUnconfinedCalls", kMaximumUnconfinedCalls},
           {"kMaximumAccesses", AccessSession::kMaximumAccesses},
+          {"ChangeNotices::kMaximumNoticesUnderWay", ChangeNotices::kMaximumNoticesUnderWay},
           {"kMaximumHoldersNamed", FileCoordinationServicer::kMaximumHoldersNamed},
           {"kDVMaximumGrantsOfPage", kDVMaximumGrantsOfPage},
           {"kDVMaximumTextBytesOfPage", kDVMaximumTextBytesOfPage},

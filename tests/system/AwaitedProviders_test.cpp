@@ -20,6 +20,7 @@ namespace {
 
 namespace fs = std::filesystem;
 using ::testing::ElementsAre;
+using ::testing::HasSubstr;
 
 constexpr const char* kDeadlinePassed = "DVConsumerErrorDomain 2";
 
@@ -130,6 +131,45 @@ TEST_F(AwaitedProviders, OneThatIsRemovedIsNotAwaitedAnyMore) {
   EXPECT_THAT(linesOf(*reader), ElementsAre("ok", "ok")) << "the file is nobody's now";
 }
 
+TEST_F(AwaitedProviders, OneThatIsRemovedFromALockedDeviceIsNotAwaitedUntilTheUnlock) {
+  house_.killDaemon();
+  ASSERT_EQ(house_.ctl({"platform", "lock-state", "1", "locked"}).status, 0);
+  house_.startDaemonWithoutWaiting();
+  const auto reader = ask({"reading", trick("read").absoluteString(), "end"});
+  const auto other = ask({"reading", letter_.absoluteString(), "end"});
+  awaitHolders(trick("read"), {"reading providing"});
+  awaitHolders(letter_, {"reading providing"});
+  EXPECT_EQ(house_.ctl({"uninstall", kTrickster}).status, 0);
+  EXPECT_THAT(linesOf(*reader), ElementsAre("ok", "ok")) << "the file is nobody's now";
+  EXPECT_THAT(holders(letter_), ElementsAre("reading providing")) << "the other provider is still there";
+  EXPECT_EQ(house_.ctl({"platform", "first-unlock"}).status, 0);
+  EXPECT_THAT(linesOf(*other), ElementsAre("ok", "ok"));
+}
+
+TEST_F(AwaitedProviders, OneThatIsRemovedWhileAnotherIsSetUpIsNotAwaited) {
+  // Its turn to be set up comes after the trickster's.
+  const std::string last = "com.orvane.wight";
+  const std::string group = last + ".documents";
+  house_.install(last, "docuvend-trickster",
+                 stringEntry("QXBundleIdentifier", last) + "<key>QXGroups</key><array><string>" + group +
+                     "</string></array><key>QXExtension</key><dict>" + stringEntry("QXExtensionPointName", "com.orvane.docuvend-nonui") +
+                     stringEntry("QXExtensionDocuvendDocumentGroup", group) + "</dict>",
+                 /*entitlements=*/{});
+  fs::create_directories(house_.storage(last));
+  const QXURL file = url(house_.storage(last) + "/read");
+  set("hang");
+  restartWithoutWaiting();
+  const auto reader = ask({"reading", file.absoluteString(), "end"});
+  const auto other = ask({"reading", trick("read").absoluteString(), "end"});
+  awaitHolders(file, {"reading providing"});
+  awaitHolders(trick("read"), {"reading providing"});
+  EXPECT_EQ(house_.ctl({"uninstall", last}).status, 0);
+  EXPECT_THAT(linesOf(*reader), ElementsAre("ok", "ok")) << "the file is nobody's now";
+  EXPECT_THAT(holders(trick("read")), ElementsAre("reading providing")) << "the other is set up still";
+  clear("hang");
+  EXPECT_THAT(linesOf(*other), ElementsAre("ok", "ok"));
+}
+
 // --- Over the cellar, whose placeholders say whether the contents were there
 
 class AwaitedCellar : public AwaitedProviders {
@@ -192,6 +232,38 @@ TEST_F(AwaitedCellar, WhoReadsWhileItIsUpdatedAgainAndAgainHasTheTrueBytes) {
     EXPECT_EQ(early->wait().output, textOf(before)) << early->wait().errors;
     EXPECT_EQ(late->wait().output, textOf(after)) << late->wait().errors;
   }
+}
+
+TEST_F(AwaitedCellar, WhoReadsWhenItIsRemovedWhileAnotherIsSetUpHasTheTrueBytesOrAnErrorAndDoesNotWait) {
+  set("hang");
+  update(changedCopy(kTrickster, "two"));
+  awaitUnregistration();
+  EXPECT_EQ(house_.ctl({"uninstall", kCellar}).status, 0);
+  for (const char* reader : kReaders) {
+    const std::string name = nameOf(reader, 0);
+    const auto process = startReading(paths_[name]);
+    const Ending& read = process->wait();
+    EXPECT_EQ(read.output, read.status == 0 ? textOf(name) : "") << read.errors;
+  }
+  clear("hang");
+}
+
+TEST_F(AwaitedCellar, WhoReadsWhatItHasLeftBehindHasTheTrueBytesOrAnError) {
+  const std::string whole = paths_[nameOf("early", 0)];
+  const std::string empty = paths_[nameOf("late", 0)];
+  ASSERT_EQ(startReading(whole)->wait().output, textOf(nameOf("early", 0)));
+  house_.killDaemon();
+  fs::remove_all(fs::path(house_.bundles()) / kCellar);
+  house_.startDaemon();
+  EXPECT_EQ(startReading(whole)->wait().output, textOf(nameOf("early", 0))) << "contents that are there can be read";
+  const auto reader = startReading(empty);
+  const Ending& read = reader->wait();
+  EXPECT_NE(read.status, 0);
+  EXPECT_EQ(read.output, "") << "no zeros";
+  EXPECT_THAT(read.errors, HasSubstr("the file's provider is not installed, and the contents are not here"));
+  const std::string file = url(empty).absoluteString();
+  EXPECT_THAT(answers({"reading", file, "writing", file, "end"}), ElementsAre("QXFileCoordinationErrorDomain 3", "ok", "ok"))
+      << "it may be written all the same";
 }
 
 TEST_F(AwaitedCellar, OnALockedDeviceReadersAndTheCloudHaveTheirBytesAfterTheFirstUnlock) {

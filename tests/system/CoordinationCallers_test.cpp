@@ -58,7 +58,7 @@ TEST_F(CoordinationCallers, AConfinedApplicationWithATokenTakesTurns) {
   letGo(confinedPlace("reader"));
   EXPECT_THAT(linesOf(*app), ElementsAre(file_, "ok", "ok", "ok", "ok", "ok"));
   EXPECT_THAT(linesOf(*writer), ElementsAre("ok", "ok"));
-  EXPECT_EQ(timesTold(letter_), 2);
+  eventually("the provider has been told of both", [this] { return timesTold(letter_) == 2; });
 }
 
 TEST_F(CoordinationCallers, AConfinedWriterThatIsKilledInTheMiddleIsAChange) {

@@ -5,7 +5,7 @@
 // the collected is carried out. Providers are looked up without the lock as well, since that asks them and the file system: an access may
 // therefore have ended by the time its provider is known, and is looked for again.
 //
-// An access is in the table exactly while it has an entry. A write that ends keeps both until the provider has been told.
+// An access is in the table exactly while it has an entry. A write that ends keeps both until the provider is being told, or sure to be.
 
 #include "platform/linux/coordination/FileAccesses.h"
 
@@ -80,8 +80,7 @@ void FileAccesses::end(AccessNumber number, std::function<void()> ended) {
 void FileAccesses::tellThenRelease(AccessNumber number, const FileAccess& access, std::function<void()> ended) {
   const KeyedFile file{access.file, access.url};
   // This outlives the telling.
-  coordinator_.tellFinishedWriting(coordinator_.ownerOf(file, LinuxFileCoordinator::DirectoryItself::counts),
-                                   access.holder.processIdentifier, file,
+  coordinator_.tellFinishedWriting(coordinator_.ownerOf(file, LinuxFileCoordinator::DirectoryItself::counts), access.holder, file,
                                    [this, number, ended = std::move(ended)] { release(number, ended); });
 }
 

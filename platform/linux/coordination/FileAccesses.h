@@ -4,8 +4,8 @@
 // All readers that wait for one file's contents wait for one request to the provider, also those that come while it runs; a failure is the
 // error of all that wait then, and whoever comes later asks anew. A request goes on when nobody waits for it any more. A provider that is
 // installed and not registered is waited for. A read within an access of its own process asks the provider only when no access of this
-// process has had it asked since it has the turn. Writing: its turn, then it has begun. When it has begun and ends, the provider is told
-// once, or will be when it is registered, and only then the turn passes on.
+// process has had it asked since it has the turn. Writing: its turn, then it has begun. When it has begun and ends, the provider is being
+// told, or will be when it has answered what it was told before or is registered, and only then the turn passes on.
 //
 // May be used from any thread. Providers are asked and told with no lock held; answers run with no lock held, on any thread, also inside
 // the call. Outlives every request that a provider may still answer.
@@ -19,22 +19,16 @@
 #include <mutex>
 #include <optional>
 #include <set>
-#include <string>
 #include <vector>
 
 #include "platform/QXError.h"
 #include "platform/QXURL.h"
+#include "platform/linux/coordination/AccessHolder.h"
 #include "platform/linux/coordination/AccessTable.h"
 #include "platform/linux/coordination/LinuxFileCoordinator.h"
 #include "platform/linux/coordination/Provisions.h"
 
 namespace docuvend::linux_platform {
-
-// Who asks, as others may be told.
-struct AccessHolder {
-  int processIdentifier = 0;
-  std::optional<std::string> bundleIdentifier;
-};
 
 struct FileAccess {
   FileKey file;
@@ -64,8 +58,8 @@ class FileAccesses {
   [[nodiscard]] AccessNumber newNumber();
   // `answer` runs once: without an error when the access has begun. After an error the access is over; its end need not be asked for.
   void begin(AccessNumber number, FileAccess access, Answer answer);
-  // `ended` runs once: of a write that had begun, when the provider has been told. An access that has not begun is answered with `ended` of
-  // FileCoordinationErrorCode. The end of an access that is over already, or is ending, has nothing to wait for.
+  // `ended` runs once: of a write that had begun, when the provider is being told or sure to be. An access that has not begun is answered
+  // with `ended` of FileCoordinationErrorCode. The end of an access that is over already, or is ending, has nothing to wait for.
   void end(AccessNumber number, std::function<void()> ended);
 
   // Those that have the file, then those that wait for it, in their order; no more than that many.

@@ -132,7 +132,7 @@ void FileCoordinationServicer::writerDidFinishWritingForURL(std::optional<QXURL>
     return completionHandler(makeCoordinationError(FileCoordinationErrorCode::noProvider, "the file belongs to no provider", url));
   }
   if (isExempt(caller, owner)) return completionHandler(/*error=*/{});
-  surroundings_.coordinator.tellFinishedWriting(owner, caller.pid, file,
+  surroundings_.coordinator.tellFinishedWriting(owner, {caller.pid, caller.bundleIdentifier}, file,
                                                 [completionHandler = std::move(completionHandler)] { completionHandler(/*error=*/{}); });
 }
 

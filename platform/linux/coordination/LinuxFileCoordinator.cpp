@@ -5,6 +5,8 @@
 #include <utility>
 #include <variant>
 
+#include "platform/linux/coordination/CoordinationErrors.h"
+
 namespace docuvend::linux_platform {
 namespace {
 
@@ -17,6 +19,21 @@ void onItsQueue(const QXDocuvend& provider, QXTask task) {
 }
 
 }  // namespace
+
+// Whoever drops the last reference ends it, and never while the coordinator has its lock.
+class LinuxFileCoordinator::NoticeUnderWay {
+ public:
+  NoticeUnderWay(LinuxFileCoordinator& coordinator, std::shared_ptr<QXDocuvend> provider, FileKey file)
+      : coordinator_(coordinator), provider_(std::move(provider)), file_(std::move(file)) {}
+  NoticeUnderWay(const NoticeUnderWay&) = delete;
+  NoticeUnderWay& operator=(const NoticeUnderWay&) = delete;
+  ~NoticeUnderWay() { coordinator_.noticeHasEnded(provider_, file_); }
+
+ private:
+  LinuxFileCoordinator& coordinator_;
+  const std::shared_ptr<QXDocuvend> provider_;
+  const FileKey file_;
+};
 
 void LinuxFileCoordinator::_addDocuvend(std::shared_ptr<QXDocuvend> provider) {
   if (!provider) return;
@@ -54,9 +71,18 @@ void LinuxFileCoordinator::setRegistrationHandler(std::function<void()> handler)
   registrationHandler_ = std::move(handler);
 }
 
+void LinuxFileCoordinator::installedStoragesChanged() {
+  ++changes_;
+  callHandler();
+}
+
 void LinuxFileCoordinator::registrationsChanged() {
-  ++registrationChanges_;
+  ++changes_;
   tellUntold();
+  callHandler();
+}
+
+void LinuxFileCoordinator::callHandler() {
   std::function<void()> handler;
   {
     const std::lock_guard lock(mutex_);
@@ -66,13 +92,15 @@ void LinuxFileCoordinator::registrationsChanged() {
 }
 
 void LinuxFileCoordinator::tellUntold() {
-  std::map<FileKey, Untold> untold;
+  const auto registered = providers();
+  std::map<FileKey, FileChange> untold;
   {
     const std::lock_guard lock(mutex_);
+    for (FileChange& change : notices_.takeFromAllBut(registered)) untold_.insert_or_assign(change.file.key, std::move(change));
     untold.swap(untold_);
   }
-  for (const auto& [key, written] : untold) {
-    tellFinishedWriting(ownerOf(written.file, DirectoryItself::counts), written.writerProcess, written.file, /*told=*/{});
+  for (const auto& [key, change] : untold) {
+    tellFinishedWriting(ownerOf(change.file, DirectoryItself::counts), change.writer, change.file, /*told=*/{});
   }
 }
 
@@ -98,7 +126,7 @@ bool LinuxFileCoordinator::contains(const QXURL& directory, const QXURL& file, D
 
 FileOwner LinuxFileCoordinator::ownerOf(const KeyedFile& file, DirectoryItself itself) const {
   FileOwner owner;
-  owner.registrationChanges = registrationChanges_;
+  owner.changes = changes_;
   std::optional<QXError> failure;
   for (const auto& provider : providers()) {
     const auto directory = provider->_providedItemsURL();
@@ -115,6 +143,10 @@ FileOwner LinuxFileCoordinator::ownerOf(const KeyedFile& file, DirectoryItself i
     }
   }
   if (!owner.provider && !owner.awaited) {
+    if (!failure && outside_.isRemnant && outside_.isRemnant(file)) {
+      failure = makeCoordinationError(FileCoordinationErrorCode::noProvider,
+                                      "the file's provider is not installed, and the contents are not here", file.url);
+    }
     owner.failure = std::move(failure);
     return owner;
   }
@@ -123,45 +155,56 @@ FileOwner LinuxFileCoordinator::ownerOf(const KeyedFile& file, DirectoryItself i
   return owner;
 }
 
-QXCoordinationID LinuxFileCoordinator::nameFor(const char* role, int process) {
+std::string LinuxFileCoordinator::nameFor(const char* role, int process) {
   std::string name(role);
   name.append(" ").append(std::to_string(process)).append("-").append(std::to_string(++names_));
-  return {std::move(name)};
+  return name;
 }
 
 void LinuxFileCoordinator::askToProvide(const std::shared_ptr<QXDocuvend>& provider, int readerProcess, const QXURL& file,
                                         QXDocuvend::ProvideCompletion completion) {
-  onItsQueue(*provider, [provider, reader = nameFor("reader", readerProcess), file, completion = std::move(completion)] {
+  onItsQueue(*provider, [provider, reader = QXCoordinationID{nameFor("reader", readerProcess)}, file, completion = std::move(completion)] {
     provider->_provideItemAtURL(file, reader, completion);
   });
 }
 
-void LinuxFileCoordinator::tellFinishedWriting(const FileOwner& owner, int writerProcess, const KeyedFile& file,
+void LinuxFileCoordinator::tellFinishedWriting(const FileOwner& owner, const AccessHolder& writer, const KeyedFile& file,
                                                std::function<void()> told) {
-  if (owner.provider) {
-    tell(owner.provider, writerProcess, file.url, std::move(told));
+  const FileChange change{writer, file};
+  bool beginsNow = false;
+  {
+    const std::lock_guard lock(mutex_);
+    if (owner.provider) {
+      beginsNow = notices_.add(owner.provider, change);
+    } else if (owner.awaited) {
+      untold_.insert_or_assign(file.key, change);
+    }
+  }
+  if (beginsNow) {
+    begin({owner.provider, change}, std::move(told));
     return;
   }
-  if (owner.awaited) {
-    remember({writerProcess, file});
-    if (hasChangedSince(owner)) tellUntold();
-  }
+  if ((owner.provider || owner.awaited) && hasChangedSince(owner)) tellUntold();
   if (told) told();
 }
 
-void LinuxFileCoordinator::tell(const std::shared_ptr<QXDocuvend>& provider, int writerProcess, const QXURL& file,
-                                std::function<void()> told) {
-  onItsQueue(*provider, [provider, writer = nameFor("writer", writerProcess), file, told = std::move(told)] {
-    provider->_writerWithID(writer, file);
+void LinuxFileCoordinator::begin(const ChangeNotices::Notice& notice, std::function<void()> told) {
+  const auto& [provider, change] = notice;
+  auto untilTold = std::make_shared<const NoticeUnderWay>(*this, provider, change.file.key);
+  onItsQueue(*provider, [provider = provider, name = nameFor("writer", change.writer.processIdentifier), untilTold = std::move(untilTold),
+                         file = change.file.url, told = std::move(told)]() mutable {
+    provider->_writerWithID({std::move(name), std::move(untilTold)}, file);
     if (told) told();
   });
 }
 
-void LinuxFileCoordinator::remember(Untold untold) {
-  const std::lock_guard lock(mutex_);
-  if (untold_.size() >= kMaximumUntold && !untold_.contains(untold.file.key)) return;
-  const FileKey key = untold.file.key;
-  untold_.insert_or_assign(key, std::move(untold));
+void LinuxFileCoordinator::noticeHasEnded(const std::shared_ptr<QXDocuvend>& provider, const FileKey& file) {
+  std::vector<ChangeNotices::Notice> next;
+  {
+    const std::lock_guard lock(mutex_);
+    next = notices_.end(provider, file);
+  }
+  for (const ChangeNotices::Notice& notice : next) begin(notice, /*told=*/{});
 }
 
 }  // namespace docuvend::linux_platform

@@ -4,8 +4,12 @@
 // being updated, nor after a setup that failed. Its files are its own all the same, and whoever reads one waits for it; what was written
 // meanwhile it is told when it is registered.
 //
+// An object that is being told of a file's change is not told of that file again until it lets go of the writer's identifier, and is then
+// if the file was written meanwhile; nor of any number of files at a time (ChangeNotices.h). What it was still to be told when it is
+// removed is told to the next one that is registered for the file.
+//
 // May be used from any thread. Provider objects are called with no lock held, on their own operation queues; one that has none is called
-// on the caller's thread.
+// on the caller's thread. Outlives every writer's identifier that an object may hold.
 #pragma once
 
 #include <atomic>
@@ -22,6 +26,8 @@
 
 #include "platform/file_coordination.h"
 #include "platform/file_system.h"
+#include "platform/linux/coordination/AccessHolder.h"
+#include "platform/linux/coordination/ChangeNotices.h"
 #include "platform/linux/coordination/FileKey.h"
 
 namespace docuvend::linux_platform {
@@ -29,9 +35,9 @@ namespace docuvend::linux_platform {
 // Of at most one of these there is something; of none for a file of nobody's.
 struct FileOwner {
   std::shared_ptr<QXDocuvend> provider;
-  std::optional<std::string> awaited;     // the bundle of a provider that is installed and not registered
-  std::optional<QXError> failure;         // it cannot be known
-  std::uint64_t registrationChanges = 0;  // how many there had been when the look began
+  std::optional<std::string> awaited;  // the bundle of a provider that is installed and not registered
+  std::optional<QXError> failure;      // it cannot be known; or it is nobody's, and its contents are not there
+  std::uint64_t changes = 0;           // of registrations and installed providers, up to when the look began
 };
 
 // Where the provider of an installed bundle keeps its items, whether or not it is registered or the directory is there.
@@ -48,10 +54,9 @@ class LinuxFileCoordinator final : public QXFileCoordinator {
     std::function<std::vector<InstalledStorage>()> installedStorages = {};
     // Whether a file is still where it was when it was given its key: else it is nobody's. Always when empty.
     std::function<bool(const KeyedFile&)> isInPlace = {};
+    // Whether a file of nobody's is a placeholder that a provider has left behind. Never when empty.
+    std::function<bool(const KeyedFile&)> isRemnant = {};
   };
-
-  // Writes to different files that wait for providers to be told of; more are not told of.
-  static constexpr std::size_t kMaximumUntold = 4096;
 
   // The file system outlives it.
   explicit LinuxFileCoordinator(QXFileSystem& fileSystem) : LinuxFileCoordinator(fileSystem, Outside{}) {}
@@ -65,47 +70,51 @@ class LinuxFileCoordinator final : public QXFileCoordinator {
   // first installed provider of whom this is true.
   [[nodiscard]] FileOwner ownerOf(const KeyedFile& file, DirectoryItself itself) const;
 
-  // Who has noted that it waits for an owner asks this afterwards: true when a registration has come or gone since that owner was looked
-  // for.
-  [[nodiscard]] bool hasChangedSince(const FileOwner& owner) const { return registrationChanges_ != owner.registrationChanges; }
-  // Called after each addition and removal, also of an object that was never added, with no lock held; one that is running when another
-  // handler is set may still run.
+  // The answer of `installedStorages` may be another one than before: who waits for a provider that is gone need not wait for the next
+  // registration to find out.
+  void installedStoragesChanged();
+
+  // Who has noted that it waits for an owner asks this afterwards: true when a registration or an installed provider has come or gone since
+  // that owner was looked for.
+  [[nodiscard]] bool hasChangedSince(const FileOwner& owner) const { return changes_ != owner.changes; }
+  // Called after each addition and removal, also of an object that was never added, and when the installed storages have changed; with no
+  // lock held. One that is running when another handler is set may still run.
   void setRegistrationHandler(std::function<void()> handler);
 
   // Asks the object for the contents of the file on behalf of a reader of that process, under an identifier that no other reader has.
   // `completion` comes as the object has it: on any thread, also inside the call, and perhaps twice.
   void askToProvide(const std::shared_ptr<QXDocuvend>& provider, int readerProcess, const QXURL& file,
                     QXDocuvend::ProvideCompletion completion);
-  // Tells the file's owner that a writer of that process has finished with it, under an identifier that no other writer has; `told` runs
-  // after that, and at once when the owner is awaited or there is none. One that is awaited hears of several writes to one file once.
-  void tellFinishedWriting(const FileOwner& owner, int writerProcess, const KeyedFile& file, std::function<void()> told);
+  // Tells the file's owner that a writer has finished with it, under an identifier that no other writer has; `told` runs after that, and
+  // at once when there is no owner, or when it will be told later: one that is awaited or is being told already. It hears of several writes
+  // to one file once then.
+  void tellFinishedWriting(const FileOwner& owner, const AccessHolder& writer, const KeyedFile& file, std::function<void()> told);
 
  private:
   struct Registration {
     std::shared_ptr<QXDocuvend> provider;
     std::size_t count;
   };
-  struct Untold {
-    int writerProcess;
-    KeyedFile file;
-  };
+  class NoticeUnderWay;
   [[nodiscard]] std::vector<std::shared_ptr<QXDocuvend>> providers() const;
   [[nodiscard]] bool contains(const QXURL& directory, const QXURL& file, DirectoryItself itself, std::optional<QXError>& failure) const;
-  void tell(const std::shared_ptr<QXDocuvend>& provider, int writerProcess, const QXURL& file, std::function<void()> told);
-  void remember(Untold untold);
+  void begin(const ChangeNotices::Notice& notice, std::function<void()> told);
+  void noticeHasEnded(const std::shared_ptr<QXDocuvend>& provider, const FileKey& file);
   void tellUntold();
   void registrationsChanged();
+  void callHandler();
   // Never used before.
-  [[nodiscard]] QXCoordinationID nameFor(const char* role, int process);
+  [[nodiscard]] std::string nameFor(const char* role, int process);
 
   QXFileSystem& fileSystem_;
   const Outside outside_;
   std::atomic<std::uint64_t> names_{0};
-  std::atomic<std::uint64_t> registrationChanges_{0};
+  std::atomic<std::uint64_t> changes_{0};
   mutable std::mutex mutex_;
   // Guarded by mutex_.
   std::vector<Registration> registrations_;  // in the order of the first additions
-  std::map<FileKey, Untold> untold_;
+  ChangeNotices notices_;
+  std::map<FileKey, FileChange> untold_;  // of providers that are not registered
   std::function<void()> registrationHandler_;
 };
 

@@ -5,6 +5,9 @@
 //   half SERVICE COUNT      opens connections and sends each the beginning of a frame
 //   deaf SERVICE            sends requests and reads no answer, until the connection ends
 //   turns URL COUNT         takes turns at a file and does not end them; how many it got, and the error of the first that it did not get
+//   scribble PATH PROVIDER CONSUMER FILES WRITES
+//                           grants itself so many files, PATH with a number behind it, and writes each so often in a turn of its own; how
+//                           many turns that were, or the first error
 //   start URL PROVIDER CONSUMER COUNT
 //                           asks for an item again and again, and what the first answer is
 //   start-silently URL PROVIDER CONSUMER COUNT
@@ -165,6 +168,31 @@ std::string takeTurns(Words& words) {
   return std::to_string(count);
 }
 
+std::string scribble(Words& words) {
+  const std::string path = words.next();
+  const ProviderID provider{words.next()};
+  const ConsumerID consumer{words.next()};
+  const int files = std::stoi(words.next());
+  const int writes = std::stoi(words.next());
+  tests::Client daemon(publicSocket(kDVServiceName), std::nullopt);
+  tests::Client coordination(publicSocket(kFileCoordinationServiceName), std::nullopt);
+  int written = 0;
+  for (int file = 0; file < files; ++file) {
+    const std::optional url = QXURL::fileURL(path + std::to_string(file), QXURLKind::file);
+    const auto granted = daemon.ask<&DVDaemon::extendSandboxForFileURL>(url, provider, consumer);
+    if (const auto error = tests::errorOf(granted)) return told(error);
+    const std::optional<QXData> token = std::get<1>(std::get<0>(granted));
+    for (int i = 0; i < writes; ++i, ++written) {
+      const std::optional id = accessID(written);
+      const std::optional<std::int64_t> party = 0;
+      auto error = tests::errorOf(coordination.ask<&QXFileCoordination::coordinateWritingItemAtURL>(url, token, id, party));
+      if (!error) error = tests::errorOf(coordination.ask<&QXFileCoordination::endAccess>(id));
+      if (error) return std::to_string(written) + ", then " + told(error);
+    }
+  }
+  return std::to_string(written);
+}
+
 enum class Answers { wanted, unwanted };
 
 std::string startAgainAndAgain(Words& words, Answers answers) {
@@ -207,6 +235,7 @@ Acts pressureActs() {
           {"half", sendHalves},
           {"deaf", stayDeaf},
           {"turns", takeTurns},
+          {"scribble", scribble},
           {"start", [](Words& words) { return startAgainAndAgain(words, Answers::wanted); }},
           {"start-silently", [](Words& words) { return startAgainAndAgain(words, Answers::unwanted); }},
           {"hold", hold}};

@@ -18,6 +18,8 @@
 //                      memory    allocates memory until there is none, which ends it
 //                      chatter   writes 20,000 lines
 //                      anything  succeeds
+//   itemChanged        laggard*  waits until the file "free" lies in its container
+//                      anything  succeeds
 //   providePlaceholder, startProviding, stopProviding
 //                      sour      an error
 //                      bomb      abort()
@@ -99,11 +101,14 @@ class Trickster : public Provider {
     if (name == "chatter") tests::chatter(kManyLines);
     if (name == "stuck") std::fputs("is stuck\n", stderr);
     if (name == "forks") std::fprintf(stderr, "has started %d processes\n", tests::forkWithoutEnd());
-    while ((name == "stuck" || name == "forks") && access("free", F_OK) != 0) std::this_thread::sleep_for(std::chrono::milliseconds(1));
+    if (name == "stuck" || name == "forks") awaitFreedom();
     return performAsNamed(url);
   }
 
-  [[nodiscard]] Failure itemChanged(const QXURL&) override { return std::nullopt; }
+  [[nodiscard]] Failure itemChanged(const QXURL& url) override {
+    if (nameOf(url).starts_with("laggard")) awaitFreedom();
+    return std::nullopt;
+  }
   [[nodiscard]] Failure stopProviding(const QXURL& url) override { return performAsNamed(url); }
 
   [[nodiscard]] Result<ItemID> identifierForItem(const QXURL& url) override {
@@ -130,6 +135,9 @@ class Trickster : public Provider {
   }
 
  private:
+  static void awaitFreedom() {
+    while (access("free", F_OK) != 0) std::this_thread::sleep_for(std::chrono::milliseconds(1));
+  }
   static Failure performAsNamed(const QXURL& url) {
     if (nameOf(url) == "sour") return refusal();
     if (nameOf(url) == "bomb") std::abort();
