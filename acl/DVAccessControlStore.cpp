@@ -17,7 +17,7 @@ constexpr const char* kDirectoryBelowHome = "Library/Docuvend";
 constexpr const char* kFileName = "AccessControl.plist";
 
 std::string joined(std::string directory, std::string_view below) {
-  if (directory.empty() || directory.back() != '/') directory += '/';
+  if (!directory.ends_with('/')) directory += '/';
   return directory.append(below);
 }
 
@@ -33,13 +33,8 @@ std::string madeDirectory() {
 }
 
 // Made once in the life of the process, together with the directory.
-const std::string& accessControlDirectoryPath() {
-  static const auto* const path = new std::string(madeDirectory());
-  return *path;
-}
-
 const std::string& accessControlFilePath() {
-  static const auto* const path = new std::string(joined(accessControlDirectoryPath(), kFileName));
+  static const auto* const path = new std::string(joined(madeDirectory(), kFileName));
   return *path;
 }
 

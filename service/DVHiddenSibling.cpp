@@ -10,9 +10,9 @@ std::string withSingleSlashes(const std::string& text) {
   std::string single;
   single.reserve(text.size());
   for (const char c : text) {
-    if (c != '/' || single.empty() || single.back() != '/') single += c;
+    if (c != '/' || !single.ends_with('/')) single += c;
   }
-  if (single.back() == '/') single.pop_back();
+  if (single.ends_with('/')) single.pop_back();
   return single;
 }
 

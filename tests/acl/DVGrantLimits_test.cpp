@@ -94,5 +94,29 @@ TEST(DVGrantLimits, EightProvidersThatTakeAllTheyCanStillLeaveAListThatCanBeWrit
   expectWritable(std::string(100, '&'), std::string(100, '&'), 1);
 }
 
+// Whether a list that holds a filler of that many bytes has room for an item of ten times that character.
+bool hasRoomBesideFiller(std::size_t bytes, char character) {
+  constexpr std::size_t kShare = 4000;
+  DVGrantTree tree;
+  for (std::size_t number = 0; bytes > 0; ++number) {
+    const std::size_t share = bytes < 2 * kShare ? bytes : kShare;
+    std::string name = std::to_string(number);
+    name.resize(share - kBytesAroundItem, 'i');
+    EXPECT_TRUE(tree.allow(kCellar, ItemID{name}, ConsumerID{""}));
+    bytes -= share;
+  }
+  return dvHasRoomFor(tree, {kCellar, ConsumerID{""}, ItemID{std::string(10, character)}});
+}
+
+TEST(DVGrantLimits, ACharacterThatIsEscapedCountsAsLongAsItsEscape) {
+  constexpr std::size_t kLeft = kDVMaximumBytesOfProvider - kBytesAroundConsumer - kBytesAroundItem;
+  EXPECT_TRUE(hasRoomBesideFiller(kLeft - 10, 'a'));
+  EXPECT_FALSE(hasRoomBesideFiller(kLeft - 9, 'a'));
+  for (const char escaped : {'&', '<', '>', '\r'}) {
+    EXPECT_TRUE(hasRoomBesideFiller(kLeft - 50, escaped)) << static_cast<int>(escaped);
+    EXPECT_FALSE(hasRoomBesideFiller(kLeft - 49, escaped)) << static_cast<int>(escaped);
+  }
+}
+
 }  // namespace
 }  // namespace docuvend

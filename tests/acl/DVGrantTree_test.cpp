@@ -164,6 +164,23 @@ TEST(DVGrantTree, GrantsIntoEmptyContainersThatWereRead) {
   EXPECT_EQ(tree.dictionary(), (QXDictionary{{kCellar.value, QXDictionary{{kEditor.value, consumerWith({"1"})}}}}));
 }
 
+TEST(DVGrantTree, TreesAreEqualWhenTheyHoldTheSame) {
+  DVGrantTree one;
+  DVGrantTree other;
+  ASSERT_TRUE(one.allow(ProviderID{"p"}, ItemID{"i"}, ConsumerID{"c"}));
+  EXPECT_FALSE(one == other);
+  ASSERT_TRUE(other.allow(ProviderID{"p"}, ItemID{"i"}, ConsumerID{"c"}));
+  EXPECT_TRUE(one == other);
+}
+
+TEST(DVGrantTree, GrantsAreEqualWhenAllThreeIdentifiersAre) {
+  const DVGrant grant{ProviderID{"p"}, ConsumerID{"c"}, ItemID{"i"}};
+  EXPECT_TRUE(grant == (DVGrant{ProviderID{"p"}, ConsumerID{"c"}, ItemID{"i"}}));
+  EXPECT_FALSE(grant == (DVGrant{ProviderID{"q"}, ConsumerID{"c"}, ItemID{"i"}}));
+  EXPECT_FALSE(grant == (DVGrant{ProviderID{"p"}, ConsumerID{"d"}, ItemID{"i"}}));
+  EXPECT_FALSE(grant == (DVGrant{ProviderID{"p"}, ConsumerID{"c"}, ItemID{"j"}}));
+}
+
 TEST(DVGrantTree, RefusesAPropertyListOfAnotherShapeAndSaysWhere) {
   const std::vector<std::pair<QXValue, std::string>> table = {
       {QXArray{}, "the top level is not a dictionary"},

@@ -64,6 +64,13 @@ TEST_P(DVRefreshPlanTest, FollowsFromWhatIsRegisteredAndWhatIsInstalled) {
   EXPECT_EQ(plan.toUnregister, GetParam().toUnregister);
 }
 
+TEST(DVRefreshPlanSteps, AreEqualWhenActionAndIdentifierAre) {
+  const DVRefreshPlan::Step step{Action::keep, kA};
+  EXPECT_TRUE(step == (DVRefreshPlan::Step{Action::keep, kA}));
+  EXPECT_FALSE(step == (DVRefreshPlan::Step{Action::make, kA}));
+  EXPECT_FALSE(step == (DVRefreshPlan::Step{Action::keep, kB}));
+}
+
 INSTANTIATE_TEST_SUITE_P(Plan, DVRefreshPlanTest, testing::ValuesIn(kRows),
                          [](const testing::TestParamInfo<Row>& info) { return info.param.name; });
 

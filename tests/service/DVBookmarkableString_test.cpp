@@ -14,6 +14,12 @@ TEST(DVBookmarkableString, IsThePrefixTheProviderASlashAndTheItem) {
   EXPECT_EQ(bookmark("p", "A/B").text(), "docuvend:p/A/B");
 }
 
+TEST(DVBookmarkableString, IsEqualToOneOfTheSameProviderAndItem) {
+  EXPECT_TRUE(bookmark("p", "i") == bookmark("p", "i"));
+  EXPECT_FALSE(bookmark("p", "i") == bookmark("q", "i"));
+  EXPECT_FALSE(bookmark("p", "i") == bookmark("p", "j"));
+}
+
 TEST(DVBookmarkableString, EscapesNothing) { EXPECT_EQ(bookmark("p ", "a%2F ü:/").text(), "docuvend:p /a%2F ü:/"); }
 
 TEST(DVBookmarkableString, ReadsWhatHasPrefixProviderAndItem) {

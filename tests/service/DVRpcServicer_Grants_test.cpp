@@ -1,4 +1,3 @@
-#include "service/DVSandboxTokens.h"
 #include "tests/service/ServicerFixture.h"
 
 namespace docuvend {
@@ -332,29 +331,20 @@ TEST_F(DVRpcServicerGrantsTest, WithoutDebugAndInfoLoggingNothingIsWrittenOnSucc
   EXPECT_EQ(platform_.log.writes(), 0U);
 }
 
-// --- Issuing tokens
+// --- What the list cannot hold
 
-TEST_F(DVRpcServicerGrantsTest, NoTokensForAnAbsentURL) {
-  const auto issued = dvIssueTokens(*DVExtensionDocuvend::providerWithIdentifier(kCellar), std::nullopt);
-  ASSERT_TRUE(std::holds_alternative<QXError>(issued));
-  EXPECT_EQ(std::get<QXError>(issued), DVNotPermittedError());
-}
-
-TEST_F(DVRpcServicerGrantsTest, NoTokensForAURLOfAnotherProviderOrOfNobody) {
-  const auto attic = DVExtensionDocuvend::providerWithIdentifier(kAttic);
-  for (const QXURL& url : {kReport, kElsewhere}) {
-    const auto issued = dvIssueTokens(*attic, url);
-    ASSERT_TRUE(std::holds_alternative<QXError>(issued)) << url.absoluteString();
-    EXPECT_EQ(std::get<QXError>(issued), DVNotPermittedError());
-  }
+TEST_F(DVRpcServicerGrantsTest, AConsumerThatTheListCannotHoldIsNotPermittedAndGetsNoTokens) {
+  extend(kReport, kCellar, ConsumerID{"\x01"});
+  const Answer& answer = lateAnswer();
+  EXPECT_EQ(answer.error, DVNotPermittedError());
+  EXPECT_TRUE(answer.hasNoValue());
+  EXPECT_EQ(
+      logged(),
+      (Entries{{QXLogType::debug, kServing},
+               {QXLogType::fault,
+                "[ERROR] The access control list cannot hold provider ID com.orvane.cellar, item ID “item 7” and consumer ID \x01."}}));
+  EXPECT_TRUE(platform_.propertyLists.writes().empty());
   EXPECT_TRUE(platform_.sandbox.issueCalls().empty());
-}
-
-TEST_F(DVRpcServicerGrantsTest, ProvidersAreComparedByIdentifierNotByObject) {
-  // As when the extension is updated while a request is under way: the same identifier, another object.
-  const auto twin = DVExtensionDocuvend::initWithExtension(cellar_);
-  ASSERT_NE(DVExtensionDocuvend::providerWithIdentifier(kCellar), twin);
-  EXPECT_TRUE(std::holds_alternative<DVSandboxTokens>(dvIssueTokens(*twin, kReport)));
 }
 
 }  // namespace
