@@ -33,5 +33,6 @@ using Acts = std::map<std::string, Act>;
 [[nodiscard]] Acts surroundingsActs();
 [[nodiscard]] Acts pressureActs();
 [[nodiscard]] Acts pretenceActs();
+[[nodiscard]] Acts mountActs();
 
 }  // namespace docuvend::attacker

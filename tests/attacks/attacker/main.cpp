@@ -48,6 +48,7 @@ int main(int count, char** arguments) {
   add(acts, surroundingsActs());
   add(acts, pressureActs());
   add(acts, pretenceActs());
+  add(acts, mountActs());
   const bool isExtension = count == 1;
   Words words(isExtension ? linesOf("acts") : std::vector<std::string>(arguments + 1, arguments + count));
   while (!words.isAtEnd()) {
