@@ -303,6 +303,21 @@ TEST_F(ConfinedApplication, EndsWithWhoStartedIt) {
   EXPECT_EQ(process.status(), 128 + SIGKILL);
 }
 
+// What the user may have is shared with the daemon.
+TEST_F(ConfinedApplication, IsLimited) {
+  rlimit processes{};
+  rlimit files{};
+  ASSERT_EQ(::getrlimit(RLIMIT_NPROC, &processes), 0);
+  ASSERT_EQ(::getrlimit(RLIMIT_NOFILE, &files), 0);
+  files = {300, std::min<rlim_t>(files.rlim_max, 4 * kApplicationOpenFiles)};
+  ASSERT_EQ(::setrlimit(RLIMIT_NOFILE, &files), 0);
+  const auto bundle = house_.installProbe("org.a");
+  const std::string openFiles = std::to_string(std::min<rlim_t>(files.rlim_max / 2, kApplicationOpenFiles));
+  EXPECT_EQ(attempt(bundle, "limit", "open files"), "300 of " + openFiles) << "what is asked for by default stays";
+  EXPECT_EQ(attempt(bundle, "limit", "processes"), std::to_string(std::min<rlim_t>(processes.rlim_cur / 2, kApplicationProcesses)));
+  EXPECT_EQ(attempt(bundle, "limit", "memory"), std::to_string(RLIM_INFINITY));
+}
+
 class ConfinedExtension : public ConfinedTest {
  protected:
   [[nodiscard]] Outcomes run(const std::vector<std::string>& attempts) {
@@ -351,6 +366,16 @@ TEST_F(ConfinedExtension, StartsNoMoreProcessesThanItsLimit) {
 }
 
 class LaunchPlanning : public ConfinedTest {};
+
+TEST_F(LaunchPlanning, RefusesAHomeThatEveryApplicationWouldSee) {
+  const auto bundle = house_.installProbe("org.a");
+  house_.paths.home = "/usr/local/home";
+  for (const LaunchKind kind : {LaunchKind::application, LaunchKind::extension}) {
+    auto socket = kind == LaunchKind::extension ? std::optional(makeSocketPair().theirs) : std::nullopt;
+    EXPECT_THAT(errorOf(planLaunch(bundle, {}, kind, std::move(socket), house_.paths)),
+                HasSubstr("/usr/local/home lies below /usr, which every application sees"));
+  }
+}
 
 TEST_F(LaunchPlanning, GivesASocketToExtensionsAlone) {
   const auto bundle = house_.installProbe("org.a");

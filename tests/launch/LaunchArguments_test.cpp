@@ -126,12 +126,12 @@ TEST_F(LaunchArguments, ShowAnExtensionNoSockets) {
   EXPECT_THAT(all(), Not(Contains("/run/docuvend/public")));
 }
 
-TEST_F(LaunchArguments, LimitAnExtensionAndNoApplication) {
+TEST_F(LaunchArguments, LimitAnExtensionAndAnApplication) {
   const auto application = confinePolicy(subject_, host_);
   EXPECT_EQ(application.descriptors, 3);
-  EXPECT_FALSE(application.processes);
+  EXPECT_EQ(application.processes, kApplicationProcesses);
   EXPECT_FALSE(application.memory);
-  EXPECT_FALSE(application.openFiles);
+  EXPECT_EQ(application.openFiles, kApplicationOpenFiles);
 
   subject_.kind = LaunchKind::extension;
   const auto extension = confinePolicy(subject_, host_);
@@ -141,7 +141,26 @@ TEST_F(LaunchArguments, LimitAnExtensionAndNoApplication) {
   EXPECT_EQ(extension.openFiles, kExtensionOpenFiles);
 
   host_.landlockLevel = kProcessLimitLevel - 1;
-  EXPECT_FALSE(confinePolicy(subject_, host_).processes);
+  for (const LaunchKind kind : {LaunchKind::application, LaunchKind::extension}) {
+    subject_.kind = kind;
+    EXPECT_FALSE(confinePolicy(subject_, host_).processes);
+    EXPECT_TRUE(confinePolicy(subject_, host_).openFiles);
+  }
+}
+
+TEST_F(LaunchArguments, GiveAnApplicationNoMoreThanHalfOfWhatItsUserMayHave) {
+  host_.processes = kApplicationProcesses * 2 + 2;
+  host_.openFiles = kApplicationOpenFiles * 2 + 2;
+  EXPECT_EQ(confinePolicy(subject_, host_).processes, kApplicationProcesses);
+  EXPECT_EQ(confinePolicy(subject_, host_).openFiles, kApplicationOpenFiles);
+  host_.processes = 301;
+  host_.openFiles = 1024;
+  EXPECT_EQ(confinePolicy(subject_, host_).processes, 150);
+  EXPECT_EQ(confinePolicy(subject_, host_).openFiles, 512);
+  host_.processes = 1;  // a limit of nothing is none that can be asked for
+  host_.openFiles = 1;
+  EXPECT_EQ(confinePolicy(subject_, host_).processes, 1);
+  EXPECT_EQ(confinePolicy(subject_, host_).openFiles, 1);
 }
 
 }  // namespace

@@ -32,7 +32,7 @@ std::optional<QXError> limit(__rlimit_resource resource, std::optional<std::uint
   rlimit limit{};
   if (::getrlimit(resource, &limit) != 0) return QXError::system(errno, "cannot read a limit");
   limit.rlim_max = std::min<rlim_t>(limit.rlim_max, *most);
-  limit.rlim_cur = limit.rlim_max;
+  limit.rlim_cur = std::min<rlim_t>(limit.rlim_cur, limit.rlim_max);
   if (::setrlimit(resource, &limit) != 0) return QXError::system(errno, "cannot set a limit");
   return std::nullopt;
 }

@@ -16,6 +16,7 @@
 #include "platform/linux/launch/HostLayout.h"
 #include "platform/linux/launch/LaunchArguments.h"
 #include "platform/linux/launch/LaunchDescription.h"
+#include "platform/linux/launch/PrivatePlaces.h"
 
 namespace docuvend::linux_platform {
 namespace {
@@ -129,6 +130,7 @@ std::variant<LaunchPlan, QXError> planLaunch(const Bundle& bundle, const std::ve
                                              std::optional<UniqueDescriptor> extensionSocket, const Paths& paths) {
   const HostLayout host = HostLayout::read();
   if (auto error = checkHost(host)) return *error;
+  if (auto problem = exposedPlace(host, paths)) return QXError::system(EPERM, *std::move(problem));
   if (extensionSocket.has_value() != (kind == LaunchKind::extension)) {
     return QXError::system(EINVAL, "an extension, and only an extension, is given a socket");
   }

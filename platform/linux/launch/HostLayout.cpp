@@ -1,8 +1,10 @@
 #include "platform/linux/launch/HostLayout.h"
 
+#include <sys/resource.h>
 #include <sys/stat.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <array>
 #include <filesystem>
 #include <system_error>
@@ -43,6 +45,22 @@ std::vector<std::string> existing(const std::array<const char*, N>& paths) {
   return result;
 }
 
+std::optional<std::uint64_t> limitOn(__rlimit_resource resource, rlim_t rlimit::*which) {
+  rlimit limit{};
+  if (::getrlimit(resource, &limit) != 0 || limit.*which == RLIM_INFINITY) return std::nullopt;
+  return limit.*which;
+}
+
+std::filesystem::path withoutLinks(const std::string& path) {
+  std::error_code error;
+  const auto real = std::filesystem::weakly_canonical(path, error);
+  return error ? std::filesystem::path(path).lexically_normal() : real;
+}
+
+bool isAtOrBelow(const std::filesystem::path& directory, const std::filesystem::path& path) {
+  return std::mismatch(directory.begin(), directory.end(), path.begin(), path.end()).first == directory.end();
+}
+
 }  // namespace
 
 HostLayout HostLayout::read() {
@@ -59,10 +77,22 @@ HostLayout HostLayout::read() {
   }
   layout.systemFiles = existing(kSystemFiles);
   layout.networkFiles = existing(kNetworkFiles);
+  layout.processes = limitOn(RLIMIT_NPROC, &rlimit::rlim_cur);
+  layout.openFiles = limitOn(RLIMIT_NOFILE, &rlimit::rlim_max);  // the daemon raises its own to this
   layout.landlockLevel = docuvend::linux_platform::landlockLevel();
   if (::access(kBubblewrap, X_OK) == 0) layout.bubblewrap = kBubblewrap;
   layout.helper = findHelper();
   return layout;
+}
+
+std::optional<std::string> HostLayout::shownAround(const std::string& path) const {
+  const auto real = withoutLinks(path);
+  for (const auto* shown : {&systemDirectories, &systemFiles, &networkFiles}) {
+    for (const std::string& place : *shown) {
+      if (isAtOrBelow(withoutLinks(place), real)) return place;
+    }
+  }
+  return std::nullopt;
 }
 
 }  // namespace docuvend::linux_platform

@@ -26,6 +26,21 @@ bool hasNetwork(const LaunchSubject& subject, const HostLayout& host) {
   return subject.kind == LaunchKind::extension || host.landlockLevel >= kLandlockScopesLevel;
 }
 
+// Of what everybody of this user shares.
+std::uint64_t halfOf(const std::optional<std::uint64_t>& all, std::uint64_t most) {
+  if (!all) return most;
+  return std::clamp<std::uint64_t>(*all / 2, 1, most);
+}
+
+void setLimits(ConfinePolicy& policy, LaunchKind kind, const HostLayout& host) {
+  const bool isExtension = kind == LaunchKind::extension;
+  if (host.landlockLevel >= kProcessLimitLevel) {
+    policy.processes = isExtension ? kExtensionProcesses : halfOf(host.processes, kApplicationProcesses);
+  }
+  policy.openFiles = isExtension ? kExtensionOpenFiles : halfOf(host.openFiles, kApplicationOpenFiles);
+  if (isExtension) policy.memory = kExtensionMemory;
+}
+
 class Arguments {
  public:
   template <class... Words>
@@ -85,12 +100,8 @@ ConfinePolicy confinePolicy(const LaunchSubject& subject, const HostLayout& host
   allow(PathAccess::readWrite, subject.container);
   for (const auto& path : subject.groups) allow(PathAccess::readWrite, path);
   if (subject.kind == LaunchKind::application) allow(PathAccess::read, subject.publicSockets);
-  if (subject.kind == LaunchKind::extension) {
-    policy.descriptors = kExtensionSocketNumber + 1;
-    if (host.landlockLevel >= kProcessLimitLevel) policy.processes = kExtensionProcesses;
-    policy.memory = kExtensionMemory;
-    policy.openFiles = kExtensionOpenFiles;
-  }
+  if (subject.kind == LaunchKind::extension) policy.descriptors = kExtensionSocketNumber + 1;
+  setLimits(policy, subject.kind, host);
   return policy;
 }
 

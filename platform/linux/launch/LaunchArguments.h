@@ -14,6 +14,9 @@ namespace docuvend::linux_platform {
 
 // Threads count as processes. The kernel counts them per user and user namespace (from 5.14 on), so this is one extension's own number.
 inline constexpr std::uint64_t kExtensionProcesses = 256;
+// The same of one launch of an application. They count as the user's all the same, so it is never more than half of what the user who
+// launches may have: one application leaves room for the daemon and its extensions.
+inline constexpr std::uint64_t kApplicationProcesses = 1024;
 // The first Landlock level of a kernel that counts so; below it no limit is set, for it would count all of the user's processes.
 inline constexpr int kProcessLimitLevel = 2;
 // Private writable memory of each process of an extension (RLIMIT_DATA: an address-space limit would count files that it maps). A build
@@ -35,6 +38,9 @@ inline constexpr std::optional<std::uint64_t> kExtensionMemory = std::uint64_t{4
 // and refuses to pass more on to whoever's own limit is below that number. This one is below what every login gives the daemon, so an
 // extension that hoards descriptors cannot keep the daemon from handing out files.
 inline constexpr std::uint64_t kExtensionOpenFiles = 512;
+// The same of an application, and never more than half of what the user may give a process, which the daemon takes. All applications
+// together leave no more than this unread (and what they send at the same moment), since whoever is at his limit may send no more.
+inline constexpr std::uint64_t kApplicationOpenFiles = 4096;
 
 // Where docuvend-confine is found inside.
 inline constexpr const char* kHelperPath = "/.docuvend-confine";

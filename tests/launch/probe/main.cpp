@@ -152,7 +152,8 @@ std::string echoOnce() {
 std::string limitOf(__rlimit_resource resource) {
   rlimit limit{};
   ::getrlimit(resource, &limit);
-  return limit.rlim_cur == limit.rlim_max ? std::to_string(limit.rlim_max) : "differs";
+  const std::string most = std::to_string(limit.rlim_max);
+  return limit.rlim_cur == limit.rlim_max ? most : std::to_string(limit.rlim_cur) + " of " + most;
 }
 
 // Starts children until it may not; how many there are then.
