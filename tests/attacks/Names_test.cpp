@@ -5,6 +5,7 @@
 #include <algorithm>
 #include <filesystem>
 
+#include "platform/xml_text.h"
 #include "tests/attacks/FileAttackTest.h"
 #include "tests/tools/PseudoTerminal.h"
 
@@ -64,8 +65,7 @@ TEST_F(Names, AMisleadingNameIsShownInTheLogAndForgesNoLine) {
     const QXURL item = url(put(name));
     // In URLs it is escaped, in identifiers it stands as it is.
     whisper("identifier", "named " + name);
-    const bool isXML = std::none_of(name.begin(), name.end(),
-                                    [](char c) { return static_cast<unsigned char>(c) < 0x20 && c != '\n' && c != '\r' && c != '\t'; });
+    const bool isXML = qxIsXMLText(name);
     const Tokens tokens = grant(item);
     EXPECT_EQ(tokens.outcome, isXML ? "ok" : "DVErrorDomain 7") << what;
     EXPECT_EQ(redeem(tokens.item).contents(), isXML ? kLetterText : kBadToken) << what;
@@ -85,6 +85,23 @@ TEST_F(Names, ANameThatIsNoTextIsNotServedAndTheNextOneIs) {
   EXPECT_NE(refused.status, 0);
   EXPECT_FALSE(misleads(refused.errors)) << ::testing::PrintToString(refused.errors);
   EXPECT_EQ(house_.ctl({"--as", kPicker, "grant", put("x"), kColluder, kAttacker}).status, 0);
+}
+
+TEST_F(Names, ATerminalShowsAMisleadingBookmarkAsOneLineOfText) {
+  const std::string path = put("x");
+  for (const auto& [what, name] : kNames) {
+    whisper("identifier", "named " + name);
+    PseudoTerminal terminal(kColumns);
+    Command command{{std::string(DOCUVEND_BIN) + "/docuvendctl", "bookmark", path}, house_.environment(), {}};
+    command.environment.push_back("TERM=xterm");
+    command.output = terminal.descriptor();
+    command.errors = terminal.descriptor();
+    static_cast<void>(Process(command).wait());
+    const std::string& shown = terminal.finished();
+    EXPECT_THAT(shown, HasSubstr(qxIsXMLText(name) ? "docuvend:" + kColluder + "/named " : "docuvendctl: DVErrorDomain 7")) << what;
+    EXPECT_FALSE(misleads(shown)) << what << ": " << ::testing::PrintToString(shown);
+    EXPECT_EQ(std::count(shown.begin(), shown.end(), '\n'), 1) << what << ": " << ::testing::PrintToString(shown);
+  }
 }
 
 TEST_F(Names, ATerminalShowsMisleadingNamesAndDoesNothingThatTheySay) {

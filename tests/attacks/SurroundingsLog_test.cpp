@@ -4,7 +4,10 @@
 #include <gtest/gtest.h>
 
 #include <algorithm>
+#include <chrono>
 
+#include "platform/linux/extension_host/LineAllowance.h"
+#include "platform/linux/extension_host/OutputLines.h"
 #include "platform/linux/wire/ConnectToSocket.h"
 #include "tests/attacks/AttackTest.h"
 #include "tests/wire/RawPeer.h"
@@ -12,6 +15,8 @@
 namespace docuvend::tests {
 namespace {
 
+using linux_platform::LineAllowance;
+using linux_platform::OutputLines;
 using ::testing::ElementsAre;
 using ::testing::HasSubstr;
 
@@ -97,6 +102,27 @@ TEST_F(ForgedLines, WhatAnExtensionPrintsComesUnderItsNameLineByLine) {
   EXPECT_EQ(house_.logged("[INFO] com.orvane.trickster: PRIORITY=0"), 1);
   EXPECT_EQ(house_.logged("[INFO] com.orvane.trickster: _UID=0"), 1);
   expectToldAsText();
+}
+
+TEST_F(ForgedLines, AnExtensionThatPrintsWithoutEndFillsNoLog) {
+  constexpr int kPrinted = 20'000;
+  std::string prints = std::string(3 * OutputLines::kLongestLine, 'w') + "\n";
+  for (int i = 0; i < kPrinted; ++i) prints += "flood\n";
+  writeFile(house_.container(kTrickster) + "/prints", prints);
+  const auto began = std::chrono::steady_clock::now();
+  ASSERT_EQ(errorOf(house_.client(kAttacker)->ask<&DVDaemon::extendSandboxForFileURL>(item("prints"), ProviderID{kTrickster},
+                                                                                      ConsumerID{kEditor})),
+            std::nullopt);
+  // Whoever reads the log learns what is missing, at the latest when the extension has ended.
+  (void)house_.client(kAttacker)->ask<&DVDaemon::extendSandboxForFileURL>(item("leave"), ProviderID{kTrickster}, ConsumerID{kEditor});
+  ASSERT_TRUE(house_.awaitLog(" lines more than are logged."));
+  // As many as may have begun and ended meanwhile, with the one that was under way.
+  const auto periods = (std::chrono::steady_clock::now() - began) / LineAllowance::kPeriod + 2;
+  const int told = house_.loggedContaining("[INFO] com.orvane.trickster: flood");
+  EXPECT_GT(told, 0);
+  EXPECT_LE(told, static_cast<int>(LineAllowance::kLinesOfAPeriod) * periods);
+  EXPECT_EQ(house_.logged("[INFO] com.orvane.trickster: " + std::string(OutputLines::kLongestLine, 'w')), 1);
+  EXPECT_EQ(house_.loggedContaining(std::string(OutputLines::kLongestLine + 1, 'w')), 0);
 }
 
 TEST_F(ForgedLines, ABundlesFileThatCannotBeReadIsToldOfInText) {

@@ -5,6 +5,7 @@
 #include <sstream>
 
 #include <cstdlib>
+#include <filesystem>
 
 #include "sdk/Administrator.h"
 #include "tests/attacks/FileAttackTest.h"
@@ -38,6 +39,13 @@ class Tokens : public FileAttackTest {
     std::string text;
     for (const std::string& part : parts) text.append(text.empty() ? "" : ":").append(part);
     return withText(text);
+  }
+  // Takes back the attacker's grant of that item.
+  void revoke(const std::string& item) const {
+    ::setenv("XDG_RUNTIME_DIR", house_.runtime().c_str(), 1);
+    const auto administrator = Administrator::connect({});
+    ASSERT_EQ(administrator.index(), 0U);
+    ASSERT_EQ(std::get<0>(administrator)->revoke(ProviderID{kColluder}, ItemID{item}, ConsumerID{kAttacker}), std::nullopt);
   }
   enum Part : std::size_t { kVersion = 1, kKind, kNumber, kPath, kNonce, kTag, kParts };
 
@@ -101,10 +109,7 @@ TEST_F(Tokens, ATokenOpensNothingWhenTheKeyWasRenewed) {
 
 TEST_F(Tokens, ATokenOpensNothingWhenAGrantOfItsProviderWasRevoked) {
   ASSERT_EQ(redeem(tokens_.item).contents(), kLetterText);
-  ::setenv("XDG_RUNTIME_DIR", house_.runtime().c_str(), 1);
-  auto administrator = Administrator::connect({});
-  ASSERT_EQ(administrator.index(), 0U);
-  ASSERT_EQ(std::get<0>(administrator)->revoke(ProviderID{kColluder}, ItemID{"letter.txt"}, ConsumerID{kAttacker}), std::nullopt);
+  revoke("letter.txt");
   for (const auto& token : {tokens_.item, tokens_.sibling}) {
     EXPECT_THAT(attack({"redeem", token->text(), "read", "redeem", token->text(), "write"}), ElementsAre(kBadToken, kBadToken));
   }
@@ -113,6 +118,23 @@ TEST_F(Tokens, ATokenOpensNothingWhenAGrantOfItsProviderWasRevoked) {
   // Of the other document there is a grant still.
   EXPECT_THAT(attack({"resolve", stringFor("other.txt"), "open", "read", "contents"}),
               ElementsAre(url(other_).absoluteString(), "ok", "Another one"));
+}
+
+TEST_F(Tokens, WhatWasOpenedForWritingIsOfNoUseWhenAGrantOfItsProviderWasRevoked) {
+  const std::string address = url(letter_).absoluteString();
+  const std::vector<std::string> uses = {"turn", "writing", address, "extend", address, kPicker};
+  std::vector<std::string> words = {
+      std::string(DOCUVEND_BIN) + "/docuvend-run", kAttacker, "resolve", stringFor("letter.txt"), "open", "write"};
+  words.insert(words.end(), uses.begin(), uses.end());
+  words.insert(words.end(), {"hold", "revoked"});
+  words.insert(words.end(), uses.begin(), uses.end());
+  Process attacker({words, house_.environment(), {}});
+  const std::string hold = house_.container(kAttacker) + "/revoked";
+  eventually("the attacker has used the letter",
+             [&hold, &attacker] { return std::filesystem::exists(hold + ".holding") || !attacker.isRunning(); });
+  revoke("letter.txt");
+  writeFile(hold + ".go", "");
+  EXPECT_THAT(linesOf(attacker.wait().output), ElementsAre(address, "ok", "ok", stringFor("letter.txt"), "ok", kNoTurn, kNotPermitted));
 }
 
 TEST_F(Tokens, ATokenOfOneFileGivesNoTurnAtAnother) {
