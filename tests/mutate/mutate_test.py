@@ -113,8 +113,11 @@ class TheMutants(unittest.TestCase):
 
     def test_the_other_value_is_given(self):
         self.assertEqual(changes("auto a = b ? c : d;", "value"), ["auto a = b ? d : c;"])
-        self.assertEqual(changes(body("return a(b);"), "value"), [body("return !(a(b));"), body("return {};")])
-        self.assertEqual(changes(body("return true;"), "value"), [])
+        for head in ("bool f() ", "[[nodiscard]] bool C::f(int a) const ", "auto f = [] ", "auto f = [](int a) "):
+            self.assertEqual(changes(head + "{ if (a) { return b; } }", "value"),
+                             [head + "{ if (a) { return !(b); } }", head + "{ if (a) { return {}; } }"])
+        self.assertEqual(changes("T f(bool a) { return a(b); }", "value"), ["T f(bool a) { return {}; }"])
+        self.assertEqual(changes("bool f() { return true; }", "value"), [])
         self.assertEqual(changes(body("return true;"), "constant"), [body("return false;")])
 
     def test_a_mutant_differs_from_its_file_and_says_where(self):

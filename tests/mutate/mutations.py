@@ -222,6 +222,28 @@ def swapped_arguments(source, _):
                 yield source.tokens[first].start, source.tokens[second_end].end, texts[i + 1] + between + texts[i]
 
 
+def _may_return_truth(source, index):
+    """Whether the function around a token returns a bool, or a lambda whatever it returns; the opposite of anything else does not compile."""
+    body = source.parent[index]
+    while body is not None:
+        before = body - 1
+        while before > 0 and source.tokens[before].text in ("const", "noexcept", "override", "mutable"):
+            before -= 1
+        if body in source.bodies and source.tokens[before].text == ")":
+            name = source.match[before] - 1
+            if source.tokens[name].text == "]":
+                return True
+            if source.tokens[name].text not in ("if", "for", "while", "switch"):
+                first = name
+                while first > 0 and source.tokens[first - 1].text not in (";", "{", "}", ":"):
+                    first -= 1
+                return any(token.text in ("bool", "auto") for token in source.tokens[first:name])
+        elif source.tokens[body].text == "{" and source.tokens[before].text == "]":
+            return True
+        body = source.parent[body]
+    return True
+
+
 def other_values(source, _):
     """A choice gives the other value, and a return gives the opposite or nothing."""
     for index, token in enumerate(source.tokens):
@@ -240,7 +262,7 @@ def other_values(source, _):
                 continue
             text = source.slice(index + 1, end - 1)
             start, stop = source.tokens[index + 1].start, source.tokens[end].start
-            if text not in ("true", "false"):
+            if text not in ("true", "false") and _may_return_truth(source, index):
                 yield start, stop, f"!({text})"
             if text not in ("true", "false", "{}", "std::nullopt", "nullptr"):
                 yield start, stop, "{}"
