@@ -97,24 +97,29 @@ void DVAccessControlStore::writeUnwrittenChanges() {
   });
 }
 
-bool DVAccessControlStore::hasRoomFor(const ProviderID& provider, const ItemID& item, const ConsumerID& consumer) const {
+bool DVAccessControlStore::allowWhereThereIsRoom(const DVGrant& grant, DVGranter granter) {
   return qxSync(*syncQueue_, [&] {
     const DVGrantTree& tree = *syncQueueAccessControlDict_;
-    return tree.allows(provider, item, consumer) || dvHasRoomFor(tree, {provider, consumer, item});
+    if (!tree.allows(grant.provider, grant.item, grant.consumer) && !dvHasRoomFor(tree, grant, granter)) return false;
+    syncQueueAllow(grant);
+    return true;
   });
 }
 
 void DVAccessControlStore::allowProviderWithIdentifier(const ProviderID& provider, const ItemID& toProvideItemID,
                                                        const ConsumerID& toConsumerWithIdentifier) {
-  syncQueue_->sync([&] {
-    if (!syncQueueAccessControlDict_->allow(provider, toProvideItemID, toConsumerWithIdentifier)) {
-      dvLog("[INFO] Provider ID %@ is already allowed to provide item ID “%@” to consumer ID %@.", provider, toProvideItemID,
-            toConsumerWithIdentifier);
-      return;
-    }
-    dvLog("[INFO] Allowing provider ID %@ to provide item ID “%@” to consumer ID %@", provider, toProvideItemID, toConsumerWithIdentifier);
-    syncQueueCommitAccessControl();
-  });
+  syncQueue_->sync([&] { syncQueueAllow({provider, toConsumerWithIdentifier, toProvideItemID}); });
+}
+
+void DVAccessControlStore::syncQueueAllow(const DVGrant& grant) {
+  assert(syncQueue_->isCurrent());
+  if (!syncQueueAccessControlDict_->allow(grant.provider, grant.item, grant.consumer)) {
+    dvLog("[INFO] Provider ID %@ is already allowed to provide item ID “%@” to consumer ID %@.", grant.provider, grant.item,
+          grant.consumer);
+    return;
+  }
+  dvLog("[INFO] Allowing provider ID %@ to provide item ID “%@” to consumer ID %@", grant.provider, grant.item, grant.consumer);
+  syncQueueCommitAccessControl();
 }
 
 void DVAccessControlStore::disallowProviderWithIdentifier(const ProviderID& provider, const ItemID& fromProvidingItemWithID,

@@ -12,6 +12,7 @@
 #include <vector>
 
 #include "acl/DVAccessControl.h"
+#include "acl/DVGrantLimits.h"
 #include "acl/DVGrantTree.h"
 #include "platform/identifiers.h"
 #include "platform/queue.h"
@@ -45,10 +46,11 @@ class DVAccessControlStore final : public DVAccessControl, public std::enable_sh
   // Writes the list once more if that is so.
   void writeUnwrittenChanges();
 
-  // Whether the list has that grant or may be given it (DVGrantLimits.h). Asked before a grant that somebody else names; `allow` and
-  // `disallow` check nothing.
-  [[nodiscard]] bool hasRoomFor(const ProviderID& provider, const ItemID& item, const ConsumerID& consumer) const;
+  // The same as `allow` for a grant that somebody else names, unless the list has no room for it (DVGrantLimits.h): then false, and
+  // nothing is done. A grant that is there already needs no room.
+  [[nodiscard]] bool allowWhereThereIsRoom(const DVGrant& grant, DVGranter granter);
 
+  // These check nothing.
   void allowProviderWithIdentifier(const ProviderID& provider, const ItemID& toProvideItemID, const ConsumerID& toConsumerWithIdentifier);
   void disallowProviderWithIdentifier(const ProviderID& provider, const ItemID& fromProvidingItemWithID,
                                       const ConsumerID& toConsumerWithIdentifier);
@@ -57,6 +59,7 @@ class DVAccessControlStore final : public DVAccessControl, public std::enable_sh
   void rereadAccessControl();
 
  private:
+  void syncQueueAllow(const DVGrant& grant);
   void syncQueueReadAccessControl();
   void syncQueueCommitAccessControl();
 

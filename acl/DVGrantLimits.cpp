@@ -39,7 +39,7 @@ class Share {
 
 }  // namespace
 
-bool dvHasRoomFor(const DVGrantTree& tree, const DVGrant& grant) {
+bool dvHasRoomFor(const DVGrantTree& tree, const DVGrant& grant, DVGranter granter) {
   if (grant.consumer.value.size() > kDVLongestGrantedConsumerID || grant.item.value.size() > kDVLongestGrantedItemID) return false;
   if (!qxIsXMLText(grant.provider.value) || !qxIsXMLText(grant.consumer.value) || !qxIsXMLText(grant.item.value)) return false;
 
@@ -51,7 +51,9 @@ bool dvHasRoomFor(const DVGrantTree& tree, const DVGrant& grant) {
     share.add(other);
     if (other.item == grant.item) ++consumersOfItem;
   }
-  return share.bytes() <= kDVMaximumBytesOfProvider && consumersOfItem <= kDVMaximumConsumersOfItem;
+  const bool isEntitled = granter == DVGranter::entitled;
+  return share.bytes() <= kDVMaximumBytesOfProvider - (isEntitled ? 0 : kDVBytesKeptForEntitled) &&
+         consumersOfItem <= kDVMaximumConsumersOfItem - (isEntitled ? 0 : kDVConsumersKeptForEntitled);
 }
 
 }  // namespace docuvend

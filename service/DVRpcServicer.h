@@ -14,6 +14,7 @@
 #include <string>
 #include <string_view>
 
+#include "acl/DVGrantLimits.h"
 #include "platform/rpc.h"
 #include "service/DVAccessControlSource.h"
 #include "service/DVDaemon.h"
@@ -73,7 +74,7 @@ class DVRpcServicer final : public DVDaemon, public std::enable_shared_from_this
   // --- Grants
 
   // False, with a line, when the list cannot hold it.
-  [[nodiscard]] bool recordGrant(const ProviderID& provider, const ItemID& item, const ConsumerID& consumer) const;
+  [[nodiscard]] bool recordGrant(const DVGrant& grant, DVGranter granter) const;
   void recordGrantAndIssueTokens(const SandboxRequest& request, const std::optional<QXError>& error,
                                  const std::optional<ItemID>& itemID) const;
   void replyWithTokens(const SandboxRequest& request) const;

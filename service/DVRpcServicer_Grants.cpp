@@ -60,15 +60,12 @@ void DVRpcServicer::extendSandboxForFileURL(std::optional<QXURL> url, std::optio
 }
 
 // A grant that no file can hold would keep all later ones off the disk as well.
-bool DVRpcServicer::recordGrant(const ProviderID& provider, const ItemID& item, const ConsumerID& consumer) const {
+bool DVRpcServicer::recordGrant(const DVGrant& grant, DVGranter granter) const {
   const auto store = accessControlStore();
-  if (!store) return true;
-  if (!store->hasRoomFor(provider, item, consumer)) {
-    dvLog("[ERROR] The access control list cannot hold provider ID %@, item ID “%@” and consumer ID %@.", provider, item, consumer);
-    return false;
-  }
-  store->allowProviderWithIdentifier(provider, item, consumer);
-  return true;
+  if (!store || store->allowWhereThereIsRoom(grant, granter)) return true;
+  dvLog("[ERROR] The access control list cannot hold provider ID %@, item ID “%@” and consumer ID %@.", grant.provider, grant.item,
+        grant.consumer);
+  return false;
 }
 
 void DVRpcServicer::recordGrantAndIssueTokens(const SandboxRequest& request, const std::optional<QXError>& error,
@@ -78,7 +75,7 @@ void DVRpcServicer::recordGrantAndIssueTokens(const SandboxRequest& request, con
     dvReplyWithError(request.reply, DVPluginOperationFailedError(error));
     return;
   }
-  if (!recordGrant(request.providerID, *itemID, request.consumerID)) {
+  if (!recordGrant({request.providerID, request.consumerID, *itemID}, DVGranter::entitled)) {
     dvReplyWithError(request.reply, DVNotPermittedError());
     return;
   }
@@ -136,7 +133,7 @@ void DVRpcServicer::recordGrantAndReplyWithString(const BookmarkRequest& request
     return;
   }
   const ProviderID providerID = request.provider->identifier().value_or(ProviderID{});
-  if (!recordGrant(providerID, *itemID, request.consumerID)) {
+  if (!recordGrant({providerID, request.consumerID, *itemID}, DVGranter::writer)) {
     dvReplyWithError(request.reply, DVNotPermittedError());
     return;
   }

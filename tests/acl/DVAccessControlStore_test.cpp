@@ -2,10 +2,7 @@
 
 #include <gtest/gtest.h>
 
-#include <random>
-#include <set>
 #include <string>
-#include <tuple>
 #include <vector>
 
 #include "acl/DVGrantLimits.h"
@@ -82,6 +79,12 @@ TEST_F(DVAccessControlStoreTest, CreationReadsOnTheCallingThreadAndLeavesNoTask)
   (void)store();
   EXPECT_EQ(platform_.log.texts(), std::vector<std::string>{"[INFO] Successfully read access control from disk."});
   EXPECT_EQ(platform_.queues.pending(), 0U);
+}
+
+TEST_F(DVAccessControlStoreTest, AHomeDirectoryMayEndInASlash) {
+  platform_.fileSystem.setHomeDirectory("/home/fake/");
+  grant(kReport);
+  EXPECT_EQ(platform_.propertyLists.writes().at(0).path, kFile);
 }
 
 TEST_F(DVAccessControlStoreTest, AnExistingDirectoryIsNotMadeAgain) {
@@ -223,6 +226,19 @@ TEST_F(DVAccessControlStoreTest, AFileOfAnotherShapeThatIsGoneByThenIsNoObstacle
   platform_.fileSystem.remove(kFile);
   grant(kReport);
   EXPECT_EQ(platform_.propertyLists.value(kFile), QXValue(listOf(kCellar, kEditor, {"report"})));
+}
+
+TEST_F(DVAccessControlStoreTest, WhatCannotBeKeptBesideIsNotReplaced) {
+  platform_.propertyLists.setValue(kFile, QXArray{"a"});
+  (void)store();
+  platform_.fileSystem.remove(kFile);
+  platform_.fileSystem.addDirectory(kFile);
+  grant(kReport);
+  EXPECT_TRUE(isGranted(kReport));
+  EXPECT_TRUE(store().hasUnwrittenChanges());
+  EXPECT_TRUE(platform_.propertyLists.writes().empty());
+  EXPECT_TRUE(platform_.fileSystem.isDirectory(kFile));
+  EXPECT_EQ(platform_.log.entries().back(), (FakeLogEntry{QXLogType::fault, "[ERROR] Could not write to " + std::string(kFile)}));
 }
 
 TEST_F(DVAccessControlStoreTest, AFileThatIsNoDictionaryIsRejectedAtStart) {
@@ -522,13 +538,27 @@ TEST_F(DVAccessControlStoreTest, AGrantRecordedBeforeTheFileCouldBeReadIsCommitt
 
 // --- Log levels
 
-TEST_F(DVAccessControlStoreTest, HasRoomForWhatItHasAlreadyAndForWhatItsLimitsLeave) {
+TEST_F(DVAccessControlStoreTest, AllowsWhatItHasAlreadyAndWhatItsLimitsLeave) {
   const ItemID tooLong{std::string(kDVLongestGrantedItemID + 1, 'i')};
-  EXPECT_FALSE(store().hasRoomFor(kCellar, tooLong, kEditor));
-  EXPECT_TRUE(store().hasRoomFor(kCellar, kReport, kEditor));
-  EXPECT_FALSE(isGranted(kReport)) << "to ask is not to grant";
+  for (const DVGranter granter : {DVGranter::entitled, DVGranter::writer}) {
+    EXPECT_FALSE(store().allowWhereThereIsRoom({kCellar, kEditor, tooLong}, granter));
+  }
+  EXPECT_FALSE(isGranted(tooLong));
+  EXPECT_TRUE(platform_.log.entries().empty());
+  EXPECT_TRUE(platform_.propertyLists.writes().empty());
+  EXPECT_TRUE(store().allowWhereThereIsRoom({kCellar, kEditor, kReport}, DVGranter::writer));
+  EXPECT_TRUE(isGranted(kReport));
+  EXPECT_EQ(platform_.propertyLists.writes().size(), 1U);
   grant(tooLong);
-  EXPECT_TRUE(store().hasRoomFor(kCellar, tooLong, kEditor));
+  EXPECT_TRUE(store().allowWhereThereIsRoom({kCellar, kEditor, tooLong}, DVGranter::writer));
+}
+
+TEST_F(DVAccessControlStoreTest, AWriterLeavesRoomForTheEntitled) {
+  for (std::size_t i = 0; i < kDVMaximumConsumersOfItem - kDVConsumersKeptForEntitled; ++i) {
+    ASSERT_TRUE(store().allowWhereThereIsRoom({kCellar, ConsumerID{std::to_string(i)}, kReport}, DVGranter::writer)) << i;
+  }
+  EXPECT_FALSE(store().allowWhereThereIsRoom({kCellar, kEditor, kReport}, DVGranter::writer));
+  EXPECT_TRUE(store().allowWhereThereIsRoom({kCellar, kEditor, kReport}, DVGranter::entitled));
 }
 
 TEST_F(DVAccessControlStoreTest, WithoutInfoLoggingOnlyFaultsAreWritten) {
@@ -580,57 +610,6 @@ TEST(DVAccessControlStore, HasItsQueueAndObservesTheFirstUnlockBeforeItReads) {
   (void)DVAccessControlStore::sharedStore();
   EXPECT_EQ(fileSystem.observersAtFirstLook, 1U);
   EXPECT_EQ(fileSystem.queuesAtFirstLook, 1U);
-}
-
-// --- Against a set
-
-TEST_F(DVAccessControlStoreTest, AgreesWithASetOfTriplesAndSoDoesItsFile) {
-  using Triple = std::tuple<std::string, std::string, std::string>;
-  constexpr int kSteps = 150;
-  constexpr int kRereadEvery = 37;
-  std::mt19937 random(20240229);
-  const auto pick = [&random](std::initializer_list<const char*> names) {
-    return std::string(*(names.begin() + std::uniform_int_distribution<std::size_t>(0, names.size() - 1)(random)));
-  };
-  std::set<Triple> model;
-  for (int step = 0; step < kSteps; ++step) {
-    const Triple triple{pick({"p", "q", ""}), pick({"1", "2", "a/b", ""}), pick({"c", "d"})};
-    const auto& [provider, item, consumer] = triple;
-    const std::size_t writesBefore = platform_.propertyLists.writes().size();
-    bool changed = false;
-    if (random() % 2 == 0) {
-      changed = model.insert(triple).second;
-      store().allowProviderWithIdentifier(ProviderID{provider}, ItemID{item}, ConsumerID{consumer});
-    } else {
-      changed = model.erase(triple) == 1;
-      store().disallowProviderWithIdentifier(ProviderID{provider}, ItemID{item}, ConsumerID{consumer});
-    }
-    ASSERT_EQ(platform_.propertyLists.writes().size() - writesBefore, changed ? 1U : 0U) << "step " << step;
-    if (step % kRereadEvery == 0) {
-      store().rereadAccessControl();
-      platform_.queues.runAll();
-    }
-    for (const char* p : {"p", "q", ""}) {
-      for (const char* i : {"1", "2", "a/b", ""}) {
-        for (const char* c : {"c", "d"}) {
-          ASSERT_EQ(store().isProviderWithIdentifier(ProviderID{p}, ItemID{i}, ConsumerID{c}), model.contains({p, i, c}))
-              << "step " << step << ": " << p << " " << i << " " << c;
-        }
-      }
-    }
-    std::set<Triple> onDisk;
-    if (const auto value = platform_.propertyLists.value(kFile)) {
-      for (const auto& [p, consumers] : *value->as<QXDictionary>()) {
-        ASSERT_FALSE(consumers.as<QXDictionary>()->empty());
-        for (const auto& [c, grants] : *consumers.as<QXDictionary>()) {
-          const auto* items = qxFind<QXArray>(*grants.as<QXDictionary>(), "AllowedItemIDs");
-          ASSERT_FALSE(items == nullptr || items->empty());
-          for (const QXValue& i : *items) ASSERT_TRUE(onDisk.emplace(p, *i.as<std::string>(), c).second);
-        }
-      }
-    }
-    ASSERT_EQ(onDisk, model) << "step " << step;
-  }
 }
 
 }  // namespace

@@ -16,29 +16,32 @@ const ProviderID kCellar{"com.orvane.cellar"};
 const ConsumerID kEditor{"com.example.editor"};
 const ItemID kItem{"1"};
 
+// For one who is entitled to grant.
+bool hasRoomFor(const DVGrantTree& tree, const DVGrant& grant) { return dvHasRoomFor(tree, grant, DVGranter::entitled); }
+
 bool isTaken(DVGrantTree& tree, const DVGrant& grant) {
-  return dvHasRoomFor(tree, grant) && tree.allow(grant.provider, grant.item, grant.consumer);
+  return hasRoomFor(tree, grant) && tree.allow(grant.provider, grant.item, grant.consumer);
 }
 
 TEST(DVGrantLimits, AConsumersIdentifierIsNoLongerThanItsLimit) {
   const std::string longest(kDVLongestGrantedConsumerID, 'c');
-  EXPECT_TRUE(dvHasRoomFor({}, {kCellar, ConsumerID{longest}, kItem}));
-  EXPECT_FALSE(dvHasRoomFor({}, {kCellar, ConsumerID{longest + "c"}, kItem}));
+  EXPECT_TRUE(hasRoomFor({}, {kCellar, ConsumerID{longest}, kItem}));
+  EXPECT_FALSE(hasRoomFor({}, {kCellar, ConsumerID{longest + "c"}, kItem}));
 }
 
 TEST(DVGrantLimits, AnItemsIdentifierIsNoLongerThanItsLimit) {
   const std::string longest(kDVLongestGrantedItemID, 'i');
-  EXPECT_TRUE(dvHasRoomFor({}, {kCellar, kEditor, ItemID{longest}}));
-  EXPECT_FALSE(dvHasRoomFor({}, {kCellar, kEditor, ItemID{longest + "i"}}));
+  EXPECT_TRUE(hasRoomFor({}, {kCellar, kEditor, ItemID{longest}}));
+  EXPECT_FALSE(hasRoomFor({}, {kCellar, kEditor, ItemID{longest + "i"}}));
 }
 
 TEST(DVGrantLimits, WhatTheFileCannotCarryIsNotTaken) {
   for (const std::string& text : {std::string("\x01"), std::string("a\0b", 3), std::string("\xEF\xBF\xBE"), std::string("\xFF")}) {
-    EXPECT_FALSE(dvHasRoomFor({}, {ProviderID{text}, kEditor, kItem}));
-    EXPECT_FALSE(dvHasRoomFor({}, {kCellar, ConsumerID{text}, kItem}));
-    EXPECT_FALSE(dvHasRoomFor({}, {kCellar, kEditor, ItemID{text}}));
+    EXPECT_FALSE(hasRoomFor({}, {ProviderID{text}, kEditor, kItem}));
+    EXPECT_FALSE(hasRoomFor({}, {kCellar, ConsumerID{text}, kItem}));
+    EXPECT_FALSE(hasRoomFor({}, {kCellar, kEditor, ItemID{text}}));
   }
-  EXPECT_TRUE(dvHasRoomFor({}, {kCellar, ConsumerID{""}, ItemID{"drafts/Q&A\n<\xE2\x80\xAE>"}}));
+  EXPECT_TRUE(hasRoomFor({}, {kCellar, ConsumerID{""}, ItemID{"drafts/Q&A\n<\xE2\x80\xAE>"}}));
 }
 
 TEST(DVGrantLimits, AnItemHasNoMoreConsumersThanItsLimit) {
@@ -46,9 +49,21 @@ TEST(DVGrantLimits, AnItemHasNoMoreConsumersThanItsLimit) {
   for (std::size_t i = 0; i < kDVMaximumConsumersOfItem; ++i) {
     EXPECT_TRUE(isTaken(tree, {kCellar, ConsumerID{"com.example." + std::to_string(i)}, kItem})) << i;
   }
-  EXPECT_FALSE(dvHasRoomFor(tree, {kCellar, kEditor, kItem}));
-  EXPECT_TRUE(dvHasRoomFor(tree, {kCellar, kEditor, ItemID{"2"}}));
-  EXPECT_TRUE(dvHasRoomFor(tree, {ProviderID{"com.orvane.attic"}, kEditor, kItem}));
+  EXPECT_FALSE(hasRoomFor(tree, {kCellar, kEditor, kItem}));
+  EXPECT_TRUE(hasRoomFor(tree, {kCellar, kEditor, ItemID{"2"}}));
+  EXPECT_TRUE(hasRoomFor(tree, {ProviderID{"com.orvane.attic"}, kEditor, kItem}));
+}
+
+TEST(DVGrantLimits, WhoeverMayWriteAnItemLeavesRoomForConsumersThatTheEntitledName) {
+  DVGrantTree tree;
+  for (std::size_t i = 0; i < kDVMaximumConsumersOfItem - kDVConsumersKeptForEntitled; ++i) {
+    const DVGrant grant{kCellar, ConsumerID{"com.example." + std::to_string(i)}, kItem};
+    EXPECT_TRUE(dvHasRoomFor(tree, grant, DVGranter::writer)) << i;
+    ASSERT_TRUE(tree.allow(grant.provider, grant.item, grant.consumer));
+  }
+  EXPECT_FALSE(dvHasRoomFor(tree, {kCellar, kEditor, kItem}, DVGranter::writer));
+  EXPECT_TRUE(hasRoomFor(tree, {kCellar, kEditor, kItem}));
+  EXPECT_TRUE(dvHasRoomFor(tree, {kCellar, kEditor, ItemID{"2"}}, DVGranter::writer));
 }
 
 // As DVGrantLimits.cpp counts them.
@@ -67,10 +82,27 @@ TEST(DVGrantLimits, AProvidersGrantsTakeNoMoreThanItsShareAndOthersHaveTheirOwn)
   std::size_t taken = 0;
   for (; taken + 2 <= room / kBytesOfItem; ++taken) ASSERT_TRUE(tree.allow(kCellar, numbered(taken, kItemLength), kEditor));
   const std::size_t rest = room - taken * kBytesOfItem - kBytesAroundItem;
-  EXPECT_FALSE(dvHasRoomFor(tree, {kCellar, kEditor, numbered(taken, rest + 1)}));
+  EXPECT_FALSE(hasRoomFor(tree, {kCellar, kEditor, numbered(taken, rest + 1)}));
   EXPECT_TRUE(isTaken(tree, {kCellar, kEditor, numbered(taken, rest)}));
-  EXPECT_FALSE(dvHasRoomFor(tree, {kCellar, kEditor, ItemID{""}}));
-  EXPECT_TRUE(dvHasRoomFor(tree, {ProviderID{"com.orvane.attic"}, kEditor, kItem}));
+  EXPECT_FALSE(hasRoomFor(tree, {kCellar, kEditor, ItemID{""}}));
+  EXPECT_TRUE(hasRoomFor(tree, {ProviderID{"com.orvane.attic"}, kEditor, kItem}));
+}
+
+TEST(DVGrantLimits, WhoeverMayWriteItemsLeavesHalfOfAProvidersShareToTheEntitled) {
+  DVGrantTree tree;
+  const ConsumerID anyone{""};
+  const std::size_t room = kDVMaximumBytesOfProvider - kDVBytesKeptForEntitled - kBytesAroundConsumer;
+  std::size_t taken = 0;
+  for (; (taken + 2) * kBytesOfItem <= room; ++taken) {
+    std::string name = std::to_string(taken);
+    name.resize(kItemLength, 'i');
+    ASSERT_TRUE(tree.allow(kCellar, ItemID{name}, anyone));
+  }
+  const std::size_t rest = room - taken * kBytesOfItem - kBytesAroundItem;
+  EXPECT_TRUE(dvHasRoomFor(tree, {kCellar, anyone, ItemID{std::string(rest, 'r')}}, DVGranter::writer));
+  const DVGrant oneMore{kCellar, anyone, ItemID{std::string(rest + 1, 'r')}};
+  EXPECT_FALSE(dvHasRoomFor(tree, oneMore, DVGranter::writer));
+  EXPECT_TRUE(hasRoomFor(tree, oneMore));
 }
 
 // The worst that eight providers can do: many small elements, or escapes alone.
@@ -78,7 +110,7 @@ void expectWritable(const std::string& consumerBeginning, const std::string& ite
   DVGrantTree one;
   std::size_t number = 0;
   // Asked seldom, for it counts all there is: a few more come in than may.
-  while (number % 1024 != 0 || dvHasRoomFor(one, {kCellar, ConsumerID{consumerBeginning}, ItemID{itemBeginning + "x"}})) {
+  while (number % 1024 != 0 || hasRoomFor(one, {kCellar, ConsumerID{consumerBeginning}, ItemID{itemBeginning + "x"}})) {
     const ConsumerID consumer{consumerBeginning + std::to_string(number / itemsOfConsumer)};
     ASSERT_TRUE(one.allow(kCellar, ItemID{itemBeginning + std::to_string(number)}, consumer));
     ++number;
@@ -105,7 +137,7 @@ bool hasRoomBesideFiller(std::size_t bytes, char character) {
     EXPECT_TRUE(tree.allow(kCellar, ItemID{name}, ConsumerID{""}));
     bytes -= share;
   }
-  return dvHasRoomFor(tree, {kCellar, ConsumerID{""}, ItemID{std::string(10, character)}});
+  return hasRoomFor(tree, {kCellar, ConsumerID{""}, ItemID{std::string(10, character)}});
 }
 
 TEST(DVGrantLimits, ACharacterThatIsEscapedCountsAsLongAsItsEscape) {

@@ -160,6 +160,14 @@ TEST_F(DVRpcServicerBookmarkGrantsTest, AConsumerThatTheListCannotHoldIsNotPermi
   EXPECT_TRUE(isGranted(kStranger));
 }
 
+TEST_F(DVRpcServicerBookmarkGrantsTest, WhoMayWriteADocumentCannotUseUpTheRoomOfThoseWhoAreEntitledToGrant) {
+  constexpr std::size_t kRoom = kDVMaximumConsumersOfItem - kDVConsumersKeptForEntitled;
+  for (std::size_t i = 0; i < kRoom; ++i) grant(kCellar, kItem, ConsumerID{std::to_string(i)});
+  extend(kReport, kStranger);
+  EXPECT_EQ(lateAnswer().error, DVNotPermittedError());
+  EXPECT_FALSE(isGranted(kStranger));
+}
+
 TEST_F(DVRpcServicerBookmarkGrantsTest, AnItemThatTheListCannotHoldIsNotPermitted) {
   answerItemID(*cellar_, /*error=*/std::nullopt, "\x01");
   extend(kReport, kStranger);

@@ -333,6 +333,13 @@ TEST_F(DVRpcServicerGrantsTest, WithoutDebugAndInfoLoggingNothingIsWrittenOnSucc
 
 // --- What the list cannot hold
 
+TEST_F(DVRpcServicerGrantsTest, TheRoomThatIsKeptForTheEntitledIsTheirs) {
+  for (std::size_t i = 0; i + 1 < kDVMaximumConsumersOfItem; ++i) grant(kCellar, kItem, ConsumerID{std::to_string(i)});
+  extend(kReport, kCellar, kEditor);
+  EXPECT_EQ(lateAnswer().error, std::nullopt);
+  EXPECT_TRUE(isGranted(kCellar));
+}
+
 TEST_F(DVRpcServicerGrantsTest, AConsumerThatTheListCannotHoldIsNotPermittedAndGetsNoTokens) {
   extend(kReport, kCellar, ConsumerID{"\x01"});
   const Answer& answer = lateAnswer();
