@@ -1,11 +1,24 @@
 #include "platform/fake/FakeLog.h"
 
+#include "platform/fake/AssertedMessages.h"
+
 namespace docuvend::fake_platform {
 namespace {
 
 std::size_t indexOf(QXLogType type) { return static_cast<std::size_t>(type); }
 
 }  // namespace
+
+bool operator==(const FakeLogEntry& one, const FakeLogEntry& other) {
+  if (one.type != other.type || one.text != other.text) return false;
+  if (one.isWritten != other.isWritten) noteAsserted({one.type, one.text});
+  return true;
+}
+
+std::ostream& operator<<(std::ostream& stream, const FakeLogEntry& entry) {
+  static constexpr std::array kTypes{"default", "info", "debug", "fault"};
+  return stream << kTypes[indexOf(entry.type)] << ": " << entry.text;
+}
 
 FakeLog::FakeLog() : handle_(*this) {}
 
@@ -52,7 +65,7 @@ bool FakeLog::Handle::isEnabled(QXLogType type) const {
 void FakeLog::Handle::write(QXLogType type, const std::string& message) {
   const std::lock_guard lock(log_.mutex_);
   ++log_.writes_;
-  if (log_.enabled_[indexOf(type)]) log_.entries_.push_back({type, message});
+  if (log_.enabled_[indexOf(type)]) log_.entries_.push_back({type, message, /*isWritten=*/true});
 }
 
 }  // namespace docuvend::fake_platform

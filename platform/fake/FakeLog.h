@@ -8,6 +8,7 @@
 #include <array>
 #include <cstddef>
 #include <mutex>
+#include <ostream>
 #include <string>
 #include <vector>
 
@@ -15,11 +16,15 @@
 
 namespace docuvend::fake_platform {
 
+// A message in the log, or a test's expectation of one. When one of each is found equal, the message has been asserted, and that is noted
+// (AssertedMessages.h).
 struct FakeLogEntry {
   QXLogType type;
   std::string text;
+  bool isWritten = false;  // the log sets it in what it gives out
 
-  friend bool operator==(const FakeLogEntry&, const FakeLogEntry&) = default;
+  friend bool operator==(const FakeLogEntry& one, const FakeLogEntry& other);
+  friend std::ostream& operator<<(std::ostream& stream, const FakeLogEntry& entry);
 };
 
 enum class FakeLogSwitch { off, on };

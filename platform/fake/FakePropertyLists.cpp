@@ -124,6 +124,11 @@ std::vector<FakePropertyLists::Write> FakePropertyLists::writes() const {
   return writes_;
 }
 
+std::size_t FakePropertyLists::writeCount() const {
+  const std::lock_guard lock(mutex_);
+  return writes_.size();
+}
+
 void FakePropertyLists::setContent(const std::string& path, Content content) {
   fileSystem_.addFile(path);
   contents_.insert_or_assign(path, std::move(content));

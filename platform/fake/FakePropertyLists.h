@@ -54,6 +54,7 @@ class FakePropertyLists : public QXPropertyLists {
   [[nodiscard]] std::optional<QXValue> value(const std::string& path) const;
   // Every write that was tried, in order.
   [[nodiscard]] std::vector<Write> writes() const;
+  [[nodiscard]] std::size_t writeCount() const;
 
  private:
   struct Content {

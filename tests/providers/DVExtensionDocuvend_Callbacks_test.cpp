@@ -23,8 +23,8 @@ class CallbacksTest : public ProvidersTest {
   std::string toldOf(const std::string& changed) {
     return "info: [INFO] QXFileCoordinator is telling us the item at URL " + changed + " was changed by writer ID writer-3.";
   }
-  [[nodiscard]] Lines changesTold(FakeExtension& extension) const {
-    Lines urls;
+  [[nodiscard]] Texts changesTold(FakeExtension& extension) const {
+    Texts urls;
     for (const auto& message : extension.vendor().messages()) {
       if (message.operation.name == "_itemChangedAtURL:completion:") urls.push_back(message.arguments.at(0).as<QXURL>()->absoluteString());
     }
@@ -41,7 +41,7 @@ class CallbacksTest : public ProvidersTest {
 TEST_F(CallbacksTest, AChangeIsToldToTheExtensionAndItsReplyEndsTheRequestWithoutAMessage) {
   provider->itemChangedAtURL(*url);
   EXPECT_EQ(written(), (Lines{kMethod, "~ begin", kBeginning}));
-  EXPECT_EQ(changesTold(*cellar), Lines{text});
+  EXPECT_EQ(changesTold(*cellar), Texts{text});
   cellar->vendor().answerLast({QXValue()});
   EXPECT_EQ(written(), Lines{"~ cancel 2"});
 }
@@ -86,14 +86,14 @@ TEST_F(CallbacksTest, AFinishedWriteIsToldToTheProviderThatOwnsTheURL) {
   EXPECT_EQ(written(), (Lines{toldOf(text), "info: [INFO] Resolved URL to provider com.orvane.cellar.",
                               "debug: [DEBUG] The item at URL " + text + " is provided by the etxension com.orvane.cellar", kMethod,
                               "~ begin", kBeginning}));
-  EXPECT_EQ(changesTold(*cellar), Lines{text});
+  EXPECT_EQ(changesTold(*cellar), Texts{text});
 }
 
 TEST_F(CallbacksTest, TheOwnerIsLookedUpAfreshWhateverObjectHeardOfTheWrite) {
   const QXURL other = FakePlatform::itemURL(kAttic, "list.txt");
   provider->_writerWithID(kWriter, other);
-  EXPECT_EQ(changesTold(*cellar), Lines{});
-  EXPECT_EQ(changesTold(*attic), Lines{other.absoluteString()});
+  EXPECT_EQ(changesTold(*cellar), Texts{});
+  EXPECT_EQ(changesTold(*attic), Texts{other.absoluteString()});
 }
 
 TEST_F(CallbacksTest, AFinishedWriteToAURLOfNobodyIsLoggedAndForwardedToNobody) {
@@ -119,7 +119,7 @@ TEST_F(CallbacksTest, FileCoordinationReachesTheCallbackThroughItsOwnProtocol) {
   EXPECT_EQ(registered[0]->_fileReactorID(), kCellar);
   EXPECT_EQ(registered[0]->_providedItemsURL(), FakePlatform::storageURL(kCellar));
   registered[0]->_writerWithID(kWriter, *url);
-  EXPECT_EQ(changesTold(*cellar), Lines{text});
+  EXPECT_EQ(changesTold(*cellar), Texts{text});
 }
 
 }  // namespace

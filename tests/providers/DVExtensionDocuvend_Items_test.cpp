@@ -168,7 +168,7 @@ class ItemsTest : public ProvidersTest, public testing::WithParamInterface<Row> 
 
 TEST_P(ItemsTest, OneMessageWithTheArgumentIsSent) {
   GetParam().call(*provider, recorder());
-  ASSERT_EQ(extension->vendor().operationNames(), Lines{GetParam().vendorOperation});
+  ASSERT_EQ(extension->vendor().operationNames(), Texts{GetParam().vendorOperation});
   EXPECT_EQ(extension->vendor().messages()[0].arguments, QXArray{GetParam().argument});
   EXPECT_EQ(written(), opening());
   EXPECT_TRUE(completed.empty()) << "a reply that never comes leaves the completion uncalled";

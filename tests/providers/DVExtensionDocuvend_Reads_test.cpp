@@ -30,8 +30,8 @@ class ReadsTest : public ProvidersTest {
       trace("read");
     });
   }
-  [[nodiscard]] Lines asked() const {
-    Lines operations;
+  [[nodiscard]] Texts asked() const {
+    Texts operations;
     for (const auto& message : cellar->vendor().messages()) {
       if (message.operation.name == kIdentifierOperation || message.operation.name == kStartOperation) {
         EXPECT_EQ(message.arguments.at(0).as<QXURL>()->absoluteString(), text);
@@ -58,17 +58,17 @@ class ReadsTest : public ProvidersTest {
 TEST_F(ReadsTest, AReadAsksForTheIdentifierThenOnTheGlobalQueueForTheItemAndIsThenAnswered) {
   read(kReader);
   EXPECT_EQ(written(), (Lines{requestedFor("reader-5"), kAskingForID, "~ begin", kBeginning}));
-  EXPECT_EQ(asked(), Lines{kIdentifierOperation});
+  EXPECT_EQ(asked(), Texts{kIdentifierOperation});
 
   cellar->vendor().answerLast({QXValue(), QXValue("item-7")});
   EXPECT_EQ(written(), (Lines{"debug: [DEBUG] Successfully got item ID “item-7” for URL " + text + " from extension com.orvane.cellar",
                               "~ cancel 2"}));
-  EXPECT_EQ(asked(), Lines{kIdentifierOperation}) << "not inside the answer";
+  EXPECT_EQ(asked(), Texts{kIdentifierOperation}) << "not inside the answer";
   EXPECT_EQ(platform.queues.pendingOnGlobalQueue(), 1U);
 
   platform.queues.runAll();
   EXPECT_EQ(written(), (Lines{kStarting, "~ begin", kBeginning}));
-  EXPECT_EQ(asked(), (Lines{kIdentifierOperation, kStartOperation}));
+  EXPECT_EQ(asked(), (Texts{kIdentifierOperation, kStartOperation}));
   EXPECT_TRUE(outcomes.empty());
 
   cellar->vendor().answerLast({QXValue()});
@@ -106,7 +106,7 @@ TEST_F(ReadsTest, AnItemThatTheExtensionCannotNameIsNotProvided) {
                               notProvided("reader-5", failure), "~ read", "~ cancel 2"}));
   EXPECT_EQ(outcomes, std::vector<std::optional<QXError>>{failure});
   platform.queues.runAll();
-  EXPECT_EQ(asked(), Lines{kIdentifierOperation}) << "the item itself is not asked for";
+  EXPECT_EQ(asked(), Texts{kIdentifierOperation}) << "the item itself is not asked for";
 }
 
 TEST_F(ReadsTest, AnExtensionThatCannotBeReachedFailsTheReadAndItsRequestIsNotEnded) {
@@ -125,7 +125,7 @@ TEST_F(ReadsTest, AnExtensionThatNamesTheItemWithNothingIsAskedForItAllTheSame) 
   read(kReader);
   cellar->vendor().answerLast({QXValue(), QXValue()});
   platform.queues.runAll();
-  EXPECT_EQ(asked(), (Lines{kIdentifierOperation, kStartOperation}));
+  EXPECT_EQ(asked(), (Texts{kIdentifierOperation, kStartOperation}));
 }
 
 TEST_F(ReadsTest, AnItemThatCannotBeStartedFailsTheReadWithTheMessagesOfStartingAlone) {
@@ -153,13 +153,13 @@ TEST_F(ReadsTest, AReadThatNobodyWaitsForIsTolerated) {
   provider->_provideItemAtURL(*url, kReader, /*completionHandler=*/{});
   cellar->vendor().answerLast({QXValue(), QXValue("item-7")});
   platform.queues.runAll();
-  EXPECT_EQ(asked(), (Lines{kIdentifierOperation, kStartOperation}));
+  EXPECT_EQ(asked(), (Texts{kIdentifierOperation, kStartOperation}));
   cellar->vendor().answerLast({QXValue()});
 
   provider->_provideItemAtURL(*url, kReader, /*completionHandler=*/{});
   cellar->vendor().answerLast({QXValue(broken), QXValue()});
   platform.queues.runAll();
-  EXPECT_EQ(asked(), (Lines{kIdentifierOperation, kStartOperation, kIdentifierOperation}));
+  EXPECT_EQ(asked(), (Texts{kIdentifierOperation, kStartOperation, kIdentifierOperation}));
 }
 
 }  // namespace

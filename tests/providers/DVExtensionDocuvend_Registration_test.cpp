@@ -54,13 +54,13 @@ class RegistrationTest : public ProvidersTest {
   std::shared_ptr<TracingExtension> extension;
   std::shared_ptr<DVExtensionDocuvend> provider;
   std::vector<std::optional<QXError>> completions;
-  Lines completionLabels;
+  Texts completionLabels;
 };
 
 TEST_F(RegistrationTest, ASuccessfulSetupIsFollowedByTheRegistrationOnTheOperationQueue) {
   provider->registerWithFileCoordinatorRetryCount(3, recorder());
   EXPECT_EQ(written(), (Lines{kMethod, "~ begin", kBeginning}));
-  EXPECT_EQ(extension->vendor().operationNames(), Lines{"_performInitialSetupWithCompletion:"});
+  EXPECT_EQ(extension->vendor().operationNames(), Texts{"_performInitialSetupWithCompletion:"});
   answerSetup(std::nullopt);
   EXPECT_EQ(written(), Lines{"~ cancel 1"}) << "the request ends when the operation has been queued, before it runs";
   EXPECT_EQ(platform.queues.pending(kOperationQueue), 1U);
@@ -69,7 +69,7 @@ TEST_F(RegistrationTest, ASuccessfulSetupIsFollowedByTheRegistrationOnTheOperati
   EXPECT_EQ(platform.fileCoordinator.calls(), (std::vector<FakeFileCoordinator::Call>{{FakeFileCoordinator::Action::add, provider}}));
   EXPECT_EQ(written(), (Lines{kRegistered, "~ completion"}));
   EXPECT_EQ(completions, std::vector<std::optional<QXError>>{std::nullopt});
-  EXPECT_EQ(completionLabels, Lines{kOperationQueue});
+  EXPECT_EQ(completionLabels, Texts{kOperationQueue});
 }
 
 TEST_F(RegistrationTest, TheRegistrationPrecedesItsMessageAndTheCompletion) {
@@ -174,7 +174,7 @@ TEST_F(RegistrationTest, TheLastSetupErrorReachesTheCompletionBeforeTheRequestEn
   answerSetup(broken);
   EXPECT_EQ(written(), (Lines{kFailedToInitialize, "~ completion", "~ cancel 1"}));
   EXPECT_EQ(completions, std::vector<std::optional<QXError>>{broken});
-  EXPECT_EQ(completionLabels, Lines{""}) << "where the extension's answer arrived";
+  EXPECT_EQ(completionLabels, Texts{""}) << "where the extension's answer arrived";
   EXPECT_EQ(platform.queues.pendingTimers(), 0U);
 }
 
@@ -205,7 +205,7 @@ TEST_F(RegistrationTest, ACountOfZeroReportsFailureOnTheGlobalQueueAndLogsNothin
   EXPECT_EQ(written(), Lines{});
   platform.queues.runAll();
   EXPECT_EQ(completions, std::vector<std::optional<QXError>>{DVPluginOperationFailedError(std::nullopt)});
-  EXPECT_EQ(completionLabels, Lines{kFakeGlobalQueueLabel});
+  EXPECT_EQ(completionLabels, Texts{kFakeGlobalQueueLabel});
   EXPECT_EQ(written(), Lines{"~ completion"});
   EXPECT_EQ(extension->beginCount(), 0);
 }

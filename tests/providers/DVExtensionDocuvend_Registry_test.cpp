@@ -28,8 +28,8 @@ class RegistryTest : public ProvidersTest {
     platform.queues.runAll();
   }
 
-  Lines completions;
-  Lines labels;
+  Texts completions;
+  Texts labels;
 };
 
 TEST_F(RegistryTest, BeforeDiscoveryAllLookupsAnswerNone) {
@@ -43,9 +43,9 @@ TEST_F(RegistryTest, BeforeDiscoveryAllLookupsAnswerNone) {
 TEST_F(RegistryTest, TheQueuesAreLabelledAndMadeOnce) {
   discover({});
   EXPECT_TRUE(DVExtensionDocuvend::providersInfo().empty());
-  Lines created = platform.queues.createdLabels();
+  Texts created = platform.queues.createdLabels();
   std::sort(created.begin(), created.end());
-  EXPECT_EQ(created, (Lines{kConcurrentQueue, kRefreshQueue}));
+  EXPECT_EQ(created, (Texts{kConcurrentQueue, kRefreshQueue}));
 }
 
 TEST_F(RegistryTest, TheFirstCallBeginsOneMatchOfTheExtensionPoint) {
@@ -72,10 +72,10 @@ TEST_F(RegistryTest, TheFirstCompletionRunsOnceAfterEveryProviderOfTheFirstPassW
   });
   platform.extensionHost.setExtensions({installReady(kCellar), installReady(kAttic)});
   platform.queues.runAll();
-  EXPECT_EQ(completions, Lines{"first"});
+  EXPECT_EQ(completions, Texts{"first"});
   platform.extensionHost.setExtensions({});
   platform.queues.runAll();
-  EXPECT_EQ(completions, Lines{"first"});
+  EXPECT_EQ(completions, Texts{"first"});
 }
 
 TEST_F(RegistryTest, TheFirstCompletionRunsAfterTheRefreshQueueWasResumed) {
@@ -85,7 +85,7 @@ TEST_F(RegistryTest, TheFirstCompletionRunsAfterTheRefreshQueueWasResumed) {
   });
   platform.extensionHost.deliver();
   platform.queues.runAll();
-  EXPECT_EQ(completions, Lines{"first"});
+  EXPECT_EQ(completions, Texts{"first"});
 }
 
 TEST_F(RegistryTest, ALaterCallIsAnsweredOnTheGlobalQueueWhileTheFirstPassIsUnderWay) {
@@ -97,12 +97,12 @@ TEST_F(RegistryTest, ALaterCallIsAnsweredOnTheGlobalQueueWhileTheFirstPassIsUnde
   EXPECT_TRUE(completions.empty()) << "never inside the call";
   EXPECT_EQ(platform.queues.pendingOnGlobalQueue(), 1U);
   platform.queues.runAll();
-  EXPECT_EQ(completions, Lines{"second"});
-  EXPECT_EQ(labels, Lines{kFakeGlobalQueueLabel});
+  EXPECT_EQ(completions, Texts{"second"});
+  EXPECT_EQ(labels, Texts{kFakeGlobalQueueLabel});
   EXPECT_EQ(platform.extensionHost.begun().size(), 1U) << "discovery is not begun again";
   cellar->vendor().answerLast({QXValue(), QXValue(), QXValue()});
   platform.queues.runAll();
-  EXPECT_EQ(completions, (Lines{"second", "first"}));
+  EXPECT_EQ(completions, (Texts{"second", "first"}));
 }
 
 TEST_F(RegistryTest, ALaterCallBeforeTheFirstPassLeavesTheFirstCompletionInPlace) {
@@ -111,7 +111,7 @@ TEST_F(RegistryTest, ALaterCallBeforeTheFirstPassLeavesTheFirstCompletionInPlace
   platform.extensionHost.deliver();
   platform.queues.runAll();
   std::sort(completions.begin(), completions.end());
-  EXPECT_EQ(completions, (Lines{"first", "second"}));
+  EXPECT_EQ(completions, (Texts{"first", "second"}));
 }
 
 TEST_F(RegistryTest, CompletionsMayBeAbsent) {
@@ -128,8 +128,8 @@ TEST_F(RegistryTest, RegisteringNobodySubmitsTheCompletionToTheGlobalQueue) {
   DVExtensionDocuvend::refreshOperationsQueueRegisterProviders({}, recorder("done"));
   EXPECT_TRUE(completions.empty());
   platform.queues.runAll();
-  EXPECT_EQ(completions, Lines{"done"});
-  EXPECT_EQ(labels, Lines{kFakeGlobalQueueLabel});
+  EXPECT_EQ(completions, Texts{"done"});
+  EXPECT_EQ(labels, Texts{kFakeGlobalQueueLabel});
   DVExtensionDocuvend::refreshOperationsQueueRegisterProviders({}, /*completion=*/{});
   EXPECT_EQ(platform.queues.pending(), 0U);
 }
@@ -148,8 +148,8 @@ TEST_F(RegistryTest, ProvidersAreRegisteredStrictlyOneAfterAnother) {
   EXPECT_TRUE(completions.empty());
   attic->vendor().answerLast({QXValue(), QXValue(), QXValue()});
   platform.queues.runAll();
-  EXPECT_EQ(completions, Lines{"done"});
-  EXPECT_EQ(labels, Lines{kFakeGlobalQueueLabel});
+  EXPECT_EQ(completions, Texts{"done"});
+  EXPECT_EQ(labels, Texts{kFakeGlobalQueueLabel});
 }
 
 TEST_F(RegistryTest, EachProviderHasThreeTries) {
@@ -159,7 +159,7 @@ TEST_F(RegistryTest, EachProviderHasThreeTries) {
   passRetryPause();
   EXPECT_TRUE(completions.empty());
   passRetryPause();
-  EXPECT_EQ(completions, Lines{"done"});
+  EXPECT_EQ(completions, Texts{"done"});
   EXPECT_EQ(cellar->beginCount(), 3);
 }
 
@@ -175,9 +175,9 @@ TEST_F(RegistryTest, OfThreeProvidersWhoseFirstFailsTheOthersAreStillRegisteredI
   EXPECT_EQ(attic->beginCount(), 0);
   passRetryPause();
   EXPECT_EQ(platform.fileCoordinator.providers(), (std::vector<std::shared_ptr<QXDocuvend>>{second, third}));
-  EXPECT_EQ(completions, Lines{"done"});
+  EXPECT_EQ(completions, Texts{"done"});
   const Lines lines = written();
-  const auto isFailure = [](const std::string& line) { return line.find("Could not register") != std::string::npos; };
+  const auto isFailure = [](const Line& line) { return line.text().find("Could not register") != std::string::npos; };
   EXPECT_EQ(std::count_if(lines.begin(), lines.end(), isFailure), 1);
   EXPECT_EQ(*std::find_if(lines.begin(), lines.end(), isFailure),
             "fault: [ERROR] Could not register docuvend com.orvane.cellar. Error: TestDomain 7: broken");
@@ -190,13 +190,13 @@ TEST_F(RegistryTest, AProviderThatReportsTwiceDoesNotRegisterTheRestTwice) {
   cellar->vendor().failDelivery(0, lost);
   cellar->vendor().answer(0, {QXValue(), QXValue(), QXValue()});
   platform.queues.runAll();
-  EXPECT_EQ(completions, Lines{"done"});
+  EXPECT_EQ(completions, Texts{"done"});
   cellar->failBegins(broken);
   passRetryPause();
   passRetryPause();
   EXPECT_EQ(cellar->beginCount(), 3);
   EXPECT_EQ(attic->beginCount(), 1);
-  EXPECT_EQ(completions, Lines{"done"});
+  EXPECT_EQ(completions, Texts{"done"});
   const Lines lines = written();
   EXPECT_EQ(lines.back(), "fault: [ERROR] Could not register docuvend com.orvane.cellar. Error: TestDomain 7: broken")
       << "the second report is not lost";

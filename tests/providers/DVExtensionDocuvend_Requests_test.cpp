@@ -48,7 +48,7 @@ TEST_F(RequestsTest, TheProxySpeaksToTheExtension) {
   provider->performExtensionRequest(recorder());
   ASSERT_TRUE(lastProxy);
   lastProxy->call<&_QXDocuvendVendor::_itemChangedAtURL>(file("/a"), [](std::optional<QXError>) {});
-  EXPECT_EQ(extension->vendor().operationNames(), Lines{"_itemChangedAtURL:completion:"});
+  EXPECT_EQ(extension->vendor().operationNames(), Texts{"_itemChangedAtURL:completion:"});
 }
 
 TEST_F(RequestsTest, TheHandlerRunsWhenTheHostAnswersAndOnNoQueue) {

@@ -112,7 +112,7 @@ TEST_F(ResolutionTest, AProviderForWhichNoDirectoryCouldBeDerivedIsSkippedWithTh
   have({std::make_shared<TracingExtension>(platform, kCellar, 1)});
   EXPECT_EQ(resolveOnce(FakePlatform::itemURL(kCellar, "a")), "none");
   EXPECT_EQ(written(), Lines{kCellarHasNone});
-  EXPECT_EQ(platform.fileSystem.calls(), Lines{}) << "there is nothing to ask about";
+  EXPECT_EQ(platform.fileSystem.calls(), Texts{}) << "there is nothing to ask about";
 }
 
 TEST_F(ResolutionTest, AnyOtherFailureOfTheQueryIsLoggedAndTheProviderSkipped) {

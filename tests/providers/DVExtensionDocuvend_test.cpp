@@ -20,13 +20,13 @@ class DVExtensionDocuvendTest : public ProvidersTest {
 TEST_F(DVExtensionDocuvendTest, QueuesAreNamedAfterTheExtension) {
   platform.installProviderBundle(kCellar);
   const auto provider = make();
-  EXPECT_EQ(platform.queues.createdLabels(), Lines{memberQueueLabel});
+  EXPECT_EQ(platform.queues.createdLabels(), Texts{memberQueueLabel});
   EXPECT_EQ(provider->_providedItemsOperationQueue()->name(), "Operation queue for com.orvane.cellar");
 }
 
 TEST_F(DVExtensionDocuvendTest, QueuesOfAnExtensionWithoutIdentifierSayThatItIsAbsent) {
   const auto provider = make(std::nullopt);
-  EXPECT_EQ(platform.queues.createdLabels(), Lines{"DVExtensionDocuvend concurrent member queue for (null)"});
+  EXPECT_EQ(platform.queues.createdLabels(), Texts{"DVExtensionDocuvend concurrent member queue for (null)"});
   EXPECT_EQ(provider->_providedItemsOperationQueue()->name(), "Operation queue for (null)");
 }
 
@@ -104,7 +104,7 @@ TEST_F(DVExtensionDocuvendTest, TheDirectoryIsNeitherLookedAtNorCreated) {
   platform.fileSystem.forgetCalls();
   const auto provider = make();
   EXPECT_TRUE(provider->providedItemsURL());
-  EXPECT_EQ(platform.fileSystem.calls(), Lines{});
+  EXPECT_EQ(platform.fileSystem.calls(), Texts{});
 }
 
 TEST_F(DVExtensionDocuvendTest, AnIdentifierThatWasSetTakesTheExtensionsPlace) {
@@ -144,7 +144,7 @@ TEST_F(DVExtensionDocuvendTest, QueuesAreNotRenamedByANewIdentifier) {
   const auto provider = make();
   provider->setIdentifier(ProviderID{kAttic});
   EXPECT_EQ(provider->identifier(), ProviderID{kAttic});
-  EXPECT_EQ(platform.queues.createdLabels(), Lines{memberQueueLabel});
+  EXPECT_EQ(platform.queues.createdLabels(), Texts{memberQueueLabel});
   EXPECT_EQ(provider->_providedItemsOperationQueue()->name(), "Operation queue for com.orvane.cellar");
 }
 
@@ -172,10 +172,10 @@ TEST_F(DVExtensionDocuvendTest, EachSetterSubmitsToTheMemberQueue) {
 TEST_F(DVExtensionDocuvendTest, TheFallBackIdentifierIsReadOnTheMemberQueue) {
   const auto provider = make();
   provider->setIdentifier(std::nullopt);
-  Lines labels;
+  Texts labels;
   extension->onIdentifier = [this, &labels] { labels.push_back(platform.queues.currentLabel()); };
   EXPECT_EQ(provider->identifier(), ProviderID{kCellar});
-  EXPECT_EQ(labels, Lines{memberQueueLabel});
+  EXPECT_EQ(labels, Texts{memberQueueLabel});
 }
 
 TEST_F(DVExtensionDocuvendTest, WritesWaitForTheReadThatIsRunning) {

@@ -7,6 +7,7 @@
 #include <functional>
 #include <memory>
 #include <optional>
+#include <ostream>
 #include <string>
 #include <string_view>
 #include <vector>
@@ -24,7 +25,37 @@ inline const std::string kCellar = "com.orvane.cellar";
 inline const std::string kAttic = "com.orvane.attic";
 inline const std::string kShed = "com.orvane.shed";
 
-using Lines = std::vector<std::string>;
+// "TYPE: text" for a message of the log or a test's expectation of one, "~ text" for a trace.
+class Line {
+ public:
+  Line(const std::string& line) : entry_{QXLogType::defaultType, line} {
+    for (int type = 0; type < 4; ++type) {
+      const std::string start = std::string(kTypes[type]).append(": ");
+      if (line.starts_with(start)) entry_ = {static_cast<QXLogType>(type), line.substr(start.size())};
+    }
+  }
+  Line(const char* line) : Line(std::string(line)) {}
+  explicit Line(fake_platform::FakeLogEntry written) : entry_(std::move(written)) {
+    if (isTrace()) entry_ = {QXLogType::defaultType, entry_.text};
+  }
+
+  [[nodiscard]] const std::string& text() const { return entry_.text; }
+
+  friend bool operator==(const Line& one, const Line& other) = default;
+  friend std::ostream& operator<<(std::ostream& stream, const Line& line) {
+    return line.isTrace() ? stream << line.entry_.text : stream << line.entry_;
+  }
+
+ private:
+  static constexpr const char* kTypes[] = {"default", "info", "debug", "fault"};
+
+  [[nodiscard]] bool isTrace() const { return entry_.text.starts_with("~"); }
+
+  fake_platform::FakeLogEntry entry_;
+};
+
+using Lines = std::vector<Line>;
+using Texts = std::vector<std::string>;
 using Extensions = std::vector<std::shared_ptr<QXExtension>>;
 
 // Writes "~ begin" and "~ cancel N" into the log, and tells `onIdentifier` when it is asked for its identifier.
@@ -58,14 +89,10 @@ class TracingExtension : public FakeExtension {
 
 class ProvidersTest : public testing::Test {
  protected:
-  // The log so far: "TYPE: text" for each message, traces as they are. Forgets it.
+  // The log so far. Forgets it.
   Lines written() {
-    static constexpr const char* kTypes[] = {"default", "info", "debug", "fault"};
     Lines lines;
-    for (const auto& entry : platform.log.entries()) {
-      const bool isTrace = entry.text.starts_with("~");
-      lines.push_back(isTrace ? entry.text : kTypes[static_cast<int>(entry.type)] + (": " + entry.text));
-    }
+    for (const auto& entry : platform.log.entries()) lines.emplace_back(entry);
     platform.log.clear();
     return lines;
   }
