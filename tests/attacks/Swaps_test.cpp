@@ -1,12 +1,18 @@
 // A provider that exchanges names while the daemon looks at them: a directory with a link to another provider's documents, and a file with
 // a link to one. The daemon must never open, make, rename or write anything where the links lead.
+#include <fcntl.h>
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
+#include <stdio.h>
 #include <unistd.h>
 
+#include <chrono>
+#include <cstdlib>
 #include <filesystem>
 #include <future>
+#include <iostream>
 #include <map>
+#include <optional>
 
 #include "tests/attacks/FileAttackTest.h"
 #include "tests/support/Sanitizers.h"
@@ -19,9 +25,33 @@ using ::testing::AnyOf;
 
 // Each round is a request to another process, and the provider exchanges the names several times during each. The check and the use by
 // themselves go through the same races in one process in TokenRedeemer_test.cpp.
-constexpr int kRedemptions = kSanitized ? 500 : 5'000;
-constexpr int kGrants = kSanitized ? 50 : 500;  // each asks the provider as well
-constexpr int kSaves = kSanitized ? 50 : 500;   // each waits for the disk
+//
+// There are as many rounds as fit in this time, or as many as the variable says.
+constexpr std::chrono::seconds kTime{kSanitized ? 5 : 10};
+constexpr int kFewestRounds = 50;
+constexpr const char* kRoundsVariable = "DOCUVEND_SWAP_ROUNDS";
+// What is asked of a provider is not to take longer than tests wait.
+constexpr std::chrono::seconds kLongestExchange{20};
+
+class Rounds {
+ public:
+  Rounds() {
+    if (const char* number = std::getenv(kRoundsVariable)) wanted_ = std::atoi(number);
+  }
+  [[nodiscard]] int done() const { return done_; }
+  // False when there have been enough.
+  bool next() {
+    if (done_ == 0) end_ = std::chrono::steady_clock::now() + kTime;
+    const bool isEnough = wanted_ ? done_ >= *wanted_ : done_ >= kFewestRounds && std::chrono::steady_clock::now() >= end_;
+    if (!isEnough) ++done_;
+    return !isEnough;
+  }
+
+ private:
+  std::optional<int> wanted_;
+  std::chrono::steady_clock::time_point end_;
+  int done_ = 0;
+};
 
 class Swaps : public FileAttackTest {
  protected:
@@ -37,6 +67,8 @@ class Swaps : public FileAttackTest {
   }
   void TearDown() override {
     stopExchanging();
+    RecordProperty("rounds", rounds_.done());
+    std::cout << rounds_.done() << " rounds\n";
     EXPECT_EQ(contentsOf(diary()), kDiaryText);
     EXPECT_FALSE(fs::exists(house_.document(".diary.txt")));
   }
@@ -44,6 +76,8 @@ class Swaps : public FileAttackTest {
   // Has the provider exchange an item and its decoy from now on.
   void startExchanging(const std::string& name) {
     ASSERT_EQ(grant(url(place(name))).outcome, "ok");
+    exchanged_ = name;
+    since_ = std::chrono::steady_clock::now();
     exchanging_ = std::async(std::launch::async, [this, item = url(place(name))] {
       const auto accomplice = house_.client(kPicker);
       return errorOf(accomplice->ask<&DVDaemon::startProvidingItemAtURL>(item, ProviderID{kColluder}, ConsumerID{kAttacker}));
@@ -56,12 +90,24 @@ class Swaps : public FileAttackTest {
     EXPECT_TRUE(house_.awaitLog("has exchanged "));
     fs::remove(house_.container(kColluder) + "/enough");
   }
+  // Another round, while the names are exchanged.
+  bool goesOn() {
+    if (std::chrono::steady_clock::now() - since_ > kLongestExchange) {
+      stopExchanging();
+      const std::string name = place(exchanged_);
+      if (fs::is_symlink(name)) {
+        EXPECT_EQ(::renameat2(AT_FDCWD, name.c_str(), AT_FDCWD, (name + ".decoy").c_str(), RENAME_EXCHANGE), 0);
+      }
+      startExchanging(exchanged_);
+    }
+    return rounds_.next();
+  }
 
   // Redeems the token many times; how often each outcome came.
   std::map<std::string, int> redeemAgainAndAgain(const std::optional<QXData>& token) {
     std::map<std::string, int> outcomes;
-    for (int round = 0; round < kRedemptions; ++round) {
-      const Opened opened = redeem(token, round % 2 == 0 ? Access::read : Access::readWrite);
+    while (goesOn()) {
+      const Opened opened = redeem(token, rounds_.done() % 2 == 0 ? Access::read : Access::readWrite);
       ++outcomes[opened.file ? opened.contents() : opened.outcome];
     }
     return outcomes;
@@ -77,7 +123,10 @@ class Swaps : public FileAttackTest {
 
   std::string letter_;
   std::string note_;
+  Rounds rounds_;
   std::future<std::optional<QXError>> exchanging_;
+  std::string exchanged_;
+  std::chrono::steady_clock::time_point since_;
 };
 
 TEST_F(Swaps, ADirectoryExchangedWithALinkIsNeverLeftOnRedemption) {
@@ -99,7 +148,7 @@ TEST_F(Swaps, NoTokenIsIssuedForWhatLiesBehindALinkThatIsExchanged) {
   startExchanging("way");
   std::map<std::string, int> outcomes;
   std::vector<QXData> issued;
-  for (int round = 0; round < kGrants; ++round) {
+  while (goesOn()) {
     const Tokens tokens = grant(url(letter_));
     ++outcomes[tokens.item ? "issued" : tokens.outcome];
     // A token that was issued while a link was there could only be for where it leads.
@@ -124,7 +173,7 @@ TEST_F(Swaps, NoHiddenSiblingIsMadeNorRenamedBehindALinkThatIsExchanged) {
   startExchanging("way");
   std::map<std::string, int> made;
   std::map<std::string, int> replaced;
-  for (int round = 0; round < kSaves; ++round) {
+  while (goesOn()) {
     const Opened sibling = redeem(tokens.sibling, Access::readWrite);
     ++made[sibling.outcome];
     if (sibling.file) {
