@@ -104,15 +104,18 @@ std::string nameOf(Standing standing) {
 
 // Run by the first process of its namespace. Who connects is nobody: it is in namespaces without a description. Who gets its number
 // afterwards is not confined. The answers are for the first one alive, for its connection when it is gone, for the same as seen by process
-// number, and for the second one, by a connection of its own.
+// number, for the same where only what is read about a process goes by its number, and for the second one, by a connection of its own.
 std::string connectAndLeaveTheNumber() {
   if (::mount("proc", "/proc", "proc", 0, nullptr) != 0) return "no view of the processes";
   NoBundles bundles;
   fake_platform::FakeLog log;
   KernelFacilities byNumberAlone = KernelFacilities::probe();
   byNumberAlone.peerPidfd = false;
+  KernelFacilities readByNumber = KernelFacilities::probe();
+  readByNumber.pidfdNamespaces = false;
   LinuxPeerDirectory directory(bundles, log.defaultLog());
   LinuxPeerDirectory careless(bundles, log.defaultLog(), byNumberAlone);
+  LinuxPeerDirectory lookingTwice(bundles, log.defaultLog(), readByNumber);
   const Listener listener;
   const auto standing = [](LinuxPeerDirectory& seenBy, const UniqueDescriptor& connection) {
     return nameOf(seenBy.identify(connection.get())->standing);
@@ -127,7 +130,8 @@ std::string connectAndLeaveTheNumber() {
   end(first);
   const pid_t second = startAs(kNumber, [&listener] { listener.connect(); });
   const UniqueDescriptor another = listener.accept();
-  result += " " + standing(directory, connection) + " " + standing(careless, connection) + " " + standing(directory, another);
+  result += " " + standing(directory, connection) + " " + standing(careless, connection) + " " + standing(lookingTwice, connection) + " " +
+            standing(directory, another);
   end(second);
   return result;
 }
@@ -167,7 +171,7 @@ TEST(IdentityReuse, AProcessThatGotTheNumberOfOneThatConnectedIsNotTakenForIt) {
   // A kernel that tells a peer by its number alone cannot do better than who looks at nothing else.
   const bool hasPeerPidfd = KernelFacilities::probe().peerPidfd;
   EXPECT_EQ(inNamespaces(connectAndLeaveTheNumber),
-            hasPeerPidfd ? "nobody nobody unconfined unconfined" : "nobody unconfined unconfined unconfined");
+            hasPeerPidfd ? "nobody nobody unconfined nobody unconfined" : "nobody unconfined unconfined unconfined unconfined");
 }
 
 }  // namespace
