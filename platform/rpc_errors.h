@@ -19,6 +19,7 @@ enum class QXRpcErrorCode : std::int64_t {
   unsupportedVersion = 7,  // the connection ended: no common version of the protocol
   peerDoesNotRead = 8,     // the connection ended: what was sent to the peer piled up
   refused = 9,             // the connection ended: the service does not want it
+  notPermitted = 10,       // nobody knows who asks, and the operation is not for everybody
 };
 
 }  // namespace docuvend

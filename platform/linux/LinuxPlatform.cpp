@@ -47,6 +47,8 @@ namespace {
 constexpr const char* kProgramName = "docuvendd";
 constexpr const char* kClientServiceName = "com.orvane.Docuvend";
 constexpr const char* kAdministrationServiceName = "com.orvane.Administration";
+// What anybody may ask the client service for.
+constexpr const char* kWakeUp = "wakeUpCompletion:";
 // A thread that serves a request may wait for a disk; one more at least is left for the others.
 constexpr unsigned kFewestReactorThreads = 4;
 // What this process and the extensions make is the user's alone, whatever a login leaves to others.
@@ -58,6 +60,7 @@ NamedServices namedServices(const Paths& paths) {
   for (const char* name : {kClientServiceName, kSandboxServiceName, kFileCoordinationServiceName}) {
     services.emplace(name, NamedService{paths.publicSockets + "/" + name, Audience::everyone});
   }
+  services[kClientServiceName].operationsForNobody = {kWakeUp};
   services.emplace(kAdministrationServiceName, NamedService{paths.runtime + "/" + kAdministrationServiceName, Audience::unconfinedPeers});
   return services;
 }

@@ -36,7 +36,7 @@ TEST_F(PeerAttacks, AConnectionWhoseMakerHasDiedBeforeItWasLookedAtIsNobodys) {
   auto orphaned = dead.connection();
   house_.daemon().signal(SIGCONT);
   Client connection(std::move(orphaned));
-  EXPECT_EQ(whoIsAt(connection), kIsNeither);
+  EXPECT_EQ(whoIsAt(connection), kIsNobody);
   EXPECT_EQ(house_.loggedContaining(" is nobody: "), 1);
   EXPECT_EQ(dead.end().output, "ok\nok\n");
 

@@ -98,20 +98,20 @@ TEST_F(IdentityAttacks, AConfinedProcessCanMakeNoNamespacesAndDescribeItselfInNo
 // As in a confinement that let its processes make namespaces.
 TEST_F(IdentityAttacks, NestedNamespacesWithAForgedDescriptionAreNobodys) {
   const Lines command = confinement(forgedDescription(root()));
-  EXPECT_EQ(unconfined(whoAmI(), joined(kAround, command)), kIsNeither);
+  EXPECT_EQ(unconfined(whoAmI(), joined(kAround, command)), kIsNobody);
   EXPECT_EQ(house_.loggedContaining("is nobody: its mount namespace was made inside a confinement."), 2);
   EXPECT_EQ(unconfined(whoAmI(), command), kIsVictim);
 }
 
 TEST_F(IdentityAttacks, NamespacesWithoutADescriptionAreNobodys) {
-  EXPECT_EQ(unconfined(thenWhoAmI({"enter"})), joined({"ok"}, kIsNeither));
+  EXPECT_EQ(unconfined(thenWhoAmI({"enter"})), joined({"ok"}, kIsNobody));
   EXPECT_EQ(house_.loggedContaining("is nobody: cannot open its description"), 2);
   EXPECT_EQ(unconfined(whoAmI(), confinement(forgedDescription(root()))), kIsVictim);
 }
 
 TEST_F(IdentityAttacks, ARootThatWasChangedToADirectoryWithAForgedDescriptionIsNotBelieved) {
   const Lines command = confinement(forgedDescription(root()));
-  EXPECT_EQ(unconfined(thenWhoAmI({"enter", "chroot", root()}), {}, {"XDG_RUNTIME_DIR=/r"}), joined({"ok", "ok"}, kIsNeither));
+  EXPECT_EQ(unconfined(thenWhoAmI({"enter", "chroot", root()}), {}, {"XDG_RUNTIME_DIR=/r"}), joined({"ok", "ok"}, kIsNobody));
   EXPECT_EQ(house_.loggedContaining("is nobody: its root is not that of a mount."), 2);
   EXPECT_EQ(unconfined(whoAmI(), command), kIsVictim);
 }

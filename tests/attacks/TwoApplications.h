@@ -23,7 +23,7 @@ class TwoApplications : public AttackTest {
   [[nodiscard]] Lines whoAmI() const { return {"ask", others_, "ask", own_}; }
   static inline const Lines kIsAttacker = {"DVErrorDomain 2", "ok"};
   static inline const Lines kIsVictim = {"ok", "DVErrorDomain 2"};
-  static inline const Lines kIsNeither = {"DVErrorDomain 2", "DVErrorDomain 2"};
+  static inline const Lines kIsNobody = {"QXRpcErrorDomain 10", "QXRpcErrorDomain 10"};
 
   // Those words, and then what shows who says them; those lines, and then those others.
   [[nodiscard]] Lines thenWhoAmI(Lines words) const { return joined(std::move(words), whoAmI()); }

@@ -73,7 +73,7 @@ TEST_F(ServiceAudienceTest, OnlyTheUnconfinedProcessComesToTheDelegate) {
   EXPECT_THAT(house_.log.texts(QXLogType::defaultType),
               UnorderedElementsAre(
                   AllOf(StartsWith(refusing), EndsWith(": com.example.Inside is not for org.a.")),
-                  refusing + std::to_string(three.nobody.pid()) + ": com.example.Inside is not for a process without an identity."));
+                  refusing + std::to_string(three.nobody.pid()) + ": com.example.Inside is not for processes without an identity."));
 }
 
 // What makes the test above mean something.

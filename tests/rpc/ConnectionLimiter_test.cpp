@@ -14,8 +14,11 @@ class ConnectionLimiterTest : public testing::Test {
   static constexpr std::size_t kLimit = 3;
 
   static constexpr std::size_t kCalls = 2;
+  static constexpr std::size_t kBytes = 100;
 
-  ConnectionLimiter::Admission admit(const std::string& peer, std::size_t limit = kLimit) { return limiter->admit(peer, {limit, kCalls}); }
+  ConnectionLimiter::Admission admit(const std::string& peer, std::size_t limit = kLimit) {
+    return limiter->admit(peer, {limit, {kCalls, kBytes}});
+  }
   void fill(const std::string& peer) {
     for (std::size_t i = 0; i < kLimit; ++i) {
       auto admission = admit(peer);
@@ -73,26 +76,26 @@ TEST_F(ConnectionLimiterTest, OpenConnectionsAreThoseOfAllPeersTogether) {
 TEST_F(ConnectionLimiterTest, OnePeersConnectionsShareItsBudgetOfRequestsAndAnotherHasItsOwn) {
   const auto first = admit("one");
   const auto second = admit("one");
-  const auto share = first.budget->take();
-  const auto another = second.budget->take();
+  const auto share = first.budget->take(1);
+  const auto another = second.budget->take(1);
   ASSERT_TRUE(share && another);
-  EXPECT_FALSE(first.budget->take());
-  EXPECT_FALSE(second.budget->take());
-  EXPECT_TRUE(admit("two").budget->take());
+  EXPECT_FALSE(first.budget->take(1));
+  EXPECT_FALSE(second.budget->take(1));
+  EXPECT_TRUE(admit("two").budget->take(1));
 }
 
 TEST_F(ConnectionLimiterTest, APeerThatComesBackFindsTheRequestsThatItLeftBehind) {
   std::vector<std::unique_ptr<CallBudget::Share>> left;
   {
     const auto admission = admit("one");
-    for (std::size_t i = 0; i < kCalls; ++i) left.push_back(admission.budget->take());
+    for (std::size_t i = 0; i < kCalls; ++i) left.push_back(admission.budget->take(1));
   }
   EXPECT_EQ(limiter->openConnections(), 0U);
   EXPECT_EQ(admit("two").verdict, Verdict::admitted) << "whose leaving forgets those who left nothing";
   const auto back = admit("one");
-  EXPECT_FALSE(back.budget->take());
+  EXPECT_FALSE(back.budget->take(1));
   left.pop_back();
-  EXPECT_TRUE(back.budget->take());
+  EXPECT_TRUE(back.budget->take(1));
 }
 
 TEST_F(ConnectionLimiterTest, APeerThatLeftNothingBehindIsForgotten) {

@@ -246,6 +246,35 @@ TEST_F(LinuxRpcServiceTest, NobodyHasNeitherTokenNorEntitlementsAndMayConnect) {
   EXPECT_EQ((*connection)->valueForEntitlement("right"), std::nullopt);
 }
 
+TEST_F(LinuxRpcServiceTest, NobodyMayAskForWhatTheServiceLetsEverybodyAskForAndForNothingElse) {
+  driver.peers.setNextPeer(Standing::nobody, std::nullopt, {});
+  serve();
+  const auto nobody = driver.connect();
+  Mailbox<QXError> errors;
+  QXRemote<TestProtocol>(nobody.proxy([&errors](const QXError& error) {
+    errors.put(error);
+  })).call<&TestProtocol::echo>("who am I?", [](const auto&...) { ADD_FAILURE() << "answered"; });
+  EXPECT_THAT(errors.take(), IsRpcError(QXRpcErrorCode::notPermitted));
+  EXPECT_TRUE(roundTrip(nobody));
+}
+
+TEST_F(LinuxRpcServiceTest, AllWithoutAnIdentityHaveFewConnectionsTogetherAndTakeNobodysPlace) {
+  driver.peers.setNextPeer(Standing::nobody, std::nullopt, {});
+  serve();
+  std::vector<LinuxDriver::Client> clients;
+  for (std::size_t i = 0; i < kMaximumConnectionsOfNobody; ++i) {
+    clients.push_back(driver.connect());
+    ASSERT_TRUE(roundTrip(clients.back()));
+  }
+  const auto refused = driver.connect({}, [this](const QXError& reason) { closed.put(reason); });
+  EXPECT_THAT(closed.take(), IsRpcError(QXRpcErrorCode::refused));
+  EXPECT_THAT(driver.log.texts(), testing::ElementsAre("[NOTICE] Refusing a connection of PID " + std::to_string(::getpid()) +
+                                                       ": processes without an identity may not open more than " +
+                                                       std::to_string(kMaximumConnectionsOfNobody) + "."));
+  driver.peers.setNextPeer(Standing::confined, "com.example.App", {});
+  EXPECT_TRUE(roundTrip(driver.connect()));
+}
+
 TEST_F(LinuxRpcServiceTest, AnUnconfinedPeerActsForTheBundleThatItDeclares) {
   driver.peers.setNextPeer(Standing::unconfined, std::nullopt, {});
   driver.peers.install("com.example.App", {{"right", QXValue(true)}});
@@ -320,7 +349,7 @@ TEST_P(LinuxRpcServiceBudgetTest, OnePeersUnansweredRequestsAreLimitedOverAllIts
   for (const auto& client : clients) {
     Mailbox<QXError> unknown;
     client.proxy([&unknown](const QXError& error) { unknown.put(error); })->send({"unheard:of:", {}, {}}, {}, {});
-    ASSERT_THAT(unknown.take(), IsRpcError(QXRpcErrorCode::unknownOperation));
+    ASSERT_THAT(unknown.take(), IsRpcError(standing == Standing::nobody ? QXRpcErrorCode::notPermitted : QXRpcErrorCode::unknownOperation));
   }
   EXPECT_EQ(refusals->count(), 0U);
   EXPECT_FALSE(roundTrip(clients.front()));
@@ -331,12 +360,47 @@ TEST_P(LinuxRpcServiceBudgetTest, OnePeersUnansweredRequestsAreLimitedOverAllIts
 
 INSTANTIATE_TEST_SUITE_P(Of, LinuxRpcServiceBudgetTest,
                          testing::Values(std::pair(Standing::confined, kMaximumCallsPerPeer),
-                                         std::pair(Standing::nobody, kMaximumCallsPerPeer),
+                                         std::pair(Standing::nobody, kMaximumCallsOfNobody),
                                          std::pair(Standing::unconfined, kMaximumUnconfinedCalls)),
                          [](const auto& info) {
                            if (info.param.first == Standing::confined) return "ABundle";
                            return info.param.first == Standing::nobody ? "ProcessesWithoutAnIdentity" : "UnconfinedProcesses";
                          });
+
+class LinuxRpcServiceBytesTest : public LinuxRpcServiceBudgetTest {};
+
+TEST_P(LinuxRpcServiceBytesTest, OnePeersUnansweredRequestsHaveALimitedNumberOfBytesOverAllItsConnections) {
+  serve();
+  const auto [standing, limit] = GetParam();
+  driver.peers.setNextPeer(standing, standing == Standing::confined ? std::optional<std::string>("com.example.App") : std::nullopt, {});
+  const auto refusals = std::make_shared<Mailbox<QXError>>();  // the clients fill it once more when they go
+  const std::vector<LinuxDriver::Client> clients = {driver.connect(), driver.connect()};
+  const auto ask = [refusals](const LinuxDriver::Client& client) {
+    QXRemote<TestProtocol>(client.proxy([refusals](const QXError& error) {
+      refusals->put(error);
+    })).call<&TestProtocol::echo>(std::string(kMaximumTextBytes, 'a'), [](const auto&...) { ADD_FAILURE() << "answered"; });
+  };
+  for (const auto& client : clients) ASSERT_TRUE(roundTrip(client));
+  // Each is a little longer than its text.
+  for (std::size_t i = 0; i + 1 < limit / kMaximumTextBytes; ++i) {
+    ask(clients.front());
+    ASSERT_TRUE(roundTrip(clients.front())) << "it is not refused, nor are short ones";
+  }
+  EXPECT_EQ(refusals->count(), 0U);
+  ask(clients.back());
+  EXPECT_THAT(refusals->take(), IsRpcError(QXRpcErrorCode::tooManyCalls));
+  EXPECT_TRUE(roundTrip(clients.back())) << "a short one has room";
+  driver.peers.setNextPeer(Standing::confined, "com.example.Other", {});
+  const auto other = driver.connect();
+  ask(other);
+  EXPECT_TRUE(roundTrip(other));
+  EXPECT_EQ(refusals->count(), 0U);
+}
+
+INSTANTIATE_TEST_SUITE_P(Of, LinuxRpcServiceBytesTest,
+                         testing::Values(std::pair(Standing::confined, kMaximumCallBytesPerPeer),
+                                         std::pair(Standing::unconfined, kMaximumUnconfinedCallBytes)),
+                         [](const auto& info) { return info.param.first == Standing::confined ? "ABundle" : "UnconfinedProcesses"; });
 
 TEST_F(LinuxRpcServiceTest, WithoutFreeDescriptorsAClientIsDroppedAndTheServiceGoesOn) {
   serve();
@@ -485,7 +549,7 @@ TEST_F(UnconfinedServiceTest, NobodyIsRefused) {
   driver.peers.setNextPeer(Standing::nobody, std::nullopt, {});
   serveUnconfined();
   EXPECT_THAT(refusal(), IsRpcError(QXRpcErrorCode::refused));
-  EXPECT_THAT(driver.log.texts(), testing::ElementsAre(line("a process without an identity")));
+  EXPECT_THAT(driver.log.texts(), testing::ElementsAre(line("processes without an identity")));
 }
 
 TEST_F(UnconfinedServiceTest, ADeclarationIsNoWayInForAConfinedPeer) {

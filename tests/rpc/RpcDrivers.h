@@ -104,7 +104,11 @@ class LinuxDriver {
   fake_platform::FakeLog log;
   TestPeerDirectory peers;
   linux_platform::Reactor reactor{3};
-  linux_platform::LinuxRpcService service{reactor, peers, log.defaultLog(), {{kServiceName, {socketPath}}}};
+  linux_platform::LinuxRpcService service{
+      reactor,
+      peers,
+      log.defaultLog(),
+      {{kServiceName, {socketPath, linux_platform::Audience::everyone, linux_platform::URLNames::asSent, {"ping:", "list:"}}}}};
 };
 
 }  // namespace docuvend::tests

@@ -88,7 +88,7 @@ class EndpointTest : public testing::Test {
     std::shared_ptr<Mailbox<Hello>> hellos = std::make_shared<Mailbox<Hello>>();
   };
 
-  Side makeSide(UniqueDescriptor socket, Hello hello = {}, std::shared_ptr<CallBudget> budget = {}) {
+  Side makeSide(UniqueDescriptor socket, Hello hello = {}, CallRules rules = {}) {
     Side side;
     Endpoint::Handlers handlers;
     handlers.onHello = [hellos = side.hellos](const Hello& said) -> std::optional<QXError> {
@@ -97,7 +97,7 @@ class EndpointTest : public testing::Test {
     };
     handlers.onClose = [closed = side.closed](const QXError& reason) { closed->put(reason); };
     handlers.onMisbehaviour = [blamed = side.blamed](const QXError& reason) { blamed->put(reason); };
-    side.endpoint = Endpoint::create(*reactor, std::move(socket), std::move(hello), std::move(handlers), std::move(budget));
+    side.endpoint = Endpoint::create(*reactor, std::move(socket), std::move(hello), std::move(handlers), std::move(rules));
     return side;
   }
 
@@ -113,9 +113,9 @@ class EndpointTest : public testing::Test {
   }
 
   // An endpoint that exports `object`, and a peer written by hand.
-  RawPeer connectRaw(std::shared_ptr<QXRpcExportedObject> object, std::shared_ptr<CallBudget> budget = {}) {
+  RawPeer connectRaw(std::shared_ptr<QXRpcExportedObject> object, CallRules rules = {}) {
     auto [one, two] = socketPair();
-    server = makeSide(std::move(one), {}, std::move(budget));
+    server = makeSide(std::move(one), {}, std::move(rules));
     server.endpoint->setExportedInterface(testInterface());
     server.endpoint->setExportedObject(std::move(object));
     server.endpoint->resume();
@@ -700,18 +700,118 @@ TEST_F(EndpointTest, NothingIsReadBeforeResume) {
   EXPECT_TRUE(recorder->requests.take());
 }
 
+// Its own requests are what is answered.
 TEST_F(EndpointTest, APeerThatDoesNotReadIsDroppedAndHoldsNobodyUp) {
+  const std::string block(kMaximumTextBytes, 'a');
+  auto raw = connectRaw(std::make_shared<Answerer>([&block](const QXArray&) { return QXArray{QXValue(block)}; }));
+  raw.sayHello();
+  constexpr std::size_t kAnswers = 2 * kMaximumOutputBytes / kMaximumTextBytes;
+  for (std::size_t i = 1; i <= kAnswers; ++i) {
+    if (!raw.write(Frame(RequestFrame{i, true, kEcho.name, {QXValue("a")}}))) break;
+  }
+  EXPECT_THAT(server.closed->take(), IsRpcError(QXRpcErrorCode::peerDoesNotRead));
+  EXPECT_THAT(server.blamed->take(), IsRpcError(QXRpcErrorCode::peerDoesNotRead));
+}
+
+TEST_F(EndpointTest, WhatAPeerIsAskedForNeverPilesUpSoFarThatItIsBlamed) {
+  reactor = std::make_unique<Reactor>(1U);
   auto raw = connectRaw(nullptr);
   raw.sayHello();
+  ASSERT_TRUE(server.hellos->take());
   const auto remote = server.endpoint->remoteObjectProxy([this](const QXError& error) { errors.put(error); });
   const QXRpcOperation operation{"data:", {QXValueKind::data}, {}};
   const QXValue block(QXData{std::vector<std::uint8_t>(kMaximumFrameBytes / 2)});
-  constexpr int kBlocks = 2 * static_cast<int>(kMaximumOutputBytes / (kMaximumFrameBytes / 2));
-  for (int i = 0; i < kBlocks; ++i) remote->send(operation, {block}, intoReplies());
-  EXPECT_THAT(server.closed->take(), IsRpcError(QXRpcErrorCode::peerDoesNotRead));
-  EXPECT_THAT(server.blamed->take(), IsRpcError(QXRpcErrorCode::peerDoesNotRead));
-  for (int i = 0; i < kBlocks; ++i) EXPECT_THAT(errors.take(), IsRpcError(QXRpcErrorCode::peerDoesNotRead));
-  EXPECT_EQ(errors.count(), 0U);
+  constexpr std::size_t kBlocks = 3 * kMaximumOutputBytes / (kMaximumFrameBytes / 2);
+  for (std::size_t i = 0; i + 1 < kBlocks; ++i) remote->send(operation, {block}, intoReplies());
+  remote->send(operation, {block}, {});  // whether an answer is wanted or not
+  // With one thread, what is posted afterwards runs when all refusals have been told.
+  Mailbox<int> idle;
+  reactor->post([&idle] { idle.put(1); });
+  ASSERT_TRUE(idle.take());
+  const std::size_t refused = errors.count();
+  ASSERT_GT(refused, kBlocks / 2);
+  for (std::size_t i = 0; i < refused; ++i) EXPECT_THAT(errors.take(), IsRpcError(QXRpcErrorCode::tooManyCalls));
+  ASSERT_TRUE(raw.read<Hello>());
+  for (std::size_t i = 1; i <= kBlocks - refused; ++i) {
+    const auto request = raw.read<RequestFrame>();
+    ASSERT_TRUE(request);
+    EXPECT_EQ(request->callID, i) << "what was not sent took no number";
+  }
+  remote->send(operation, {block}, intoReplies());
+  EXPECT_TRUE(raw.read<RequestFrame>()) << "there is room again";
+  EXPECT_EQ(server.closed->count(), 0U);
+  EXPECT_EQ(server.blamed->count(), 0U);
+}
+
+TEST_F(EndpointTest, UnansweredRequestsMayNotHoldTooManyBytes) {
+  auto raw = connectRaw(recorder);
+  raw.sayHello();
+  ASSERT_TRUE(raw.read<Hello>());
+  const QXValue text(std::string(kMaximumTextBytes, 'a'));
+  constexpr std::size_t kFitting = kMaximumCallBytes / (kMaximumTextBytes + 1) - 1;  // each is a little longer than its text
+  std::vector<Recorder::Request> held;
+  for (std::size_t i = 1; i <= kFitting; ++i) {
+    raw.write(Frame(RequestFrame{i, true, kEcho.name, {text}}));
+    auto request = recorder->requests.take();
+    ASSERT_TRUE(request);
+    held.push_back(*std::move(request));
+  }
+  for (const std::uint64_t number : {kFitting + 1, kFitting + 2}) raw.write(Frame(RequestFrame{number, true, kEcho.name, {text}}));
+  const auto refused = raw.read<FailureFrame>();
+  ASSERT_TRUE(refused);
+  EXPECT_EQ(refused->error.code, code(QXRpcErrorCode::tooManyCalls));
+}
+
+TEST_F(EndpointTest, APeerMayAskForNoMoreThanItsRulesSay) {
+  auto raw = connectRaw(recorder, {{}, std::vector<std::string>{kEcho.name}, {}});
+  raw.sayHello();
+  ASSERT_TRUE(raw.read<Hello>());
+  for (const auto& [number, operation] : {std::pair(1U, kList.name), std::pair(2U, std::string("unheard:of:"))}) {
+    raw.write(Frame(RequestFrame{number, true, operation, {}}));
+    const auto refused = raw.read<FailureFrame>();
+    ASSERT_TRUE(refused);
+    EXPECT_EQ(refused->callID, number);
+    EXPECT_EQ(refused->error.code, code(QXRpcErrorCode::notPermitted));
+  }
+  raw.write(Frame(RequestFrame{3, true, kEcho.name, {QXValue("a")}}));
+  EXPECT_TRUE(recorder->requests.take());
+  EXPECT_EQ(recorder->requests.count(), 0U);
+}
+
+TEST_F(EndpointTest, ARequestAndWhatFollowsFromItElsewhereAreForThePeer) {
+  const auto peersName = std::make_shared<const std::string>("peer");
+  Mailbox<LogSubject::Name> subjects;
+  auto raw = connectRaw(std::make_shared<Answerer>([&subjects](QXArray values) {
+                          subjects.put(LogSubject::current());
+                          return values;
+                        }),
+                        {{}, {}, peersName});
+  raw.sayHello();
+  ASSERT_TRUE(raw.read<Hello>());
+  raw.write(Frame(RequestFrame{1, true, kEcho.name, {QXValue("a")}}));
+  EXPECT_EQ(subjects.take(), peersName);
+  ASSERT_TRUE(raw.read<ReplyFrame>());
+
+  const auto tell = [&subjects](const auto&...) { subjects.put(LogSubject::current()); };
+  const auto ask = [this, &tell, &raw](std::uint64_t number) {
+    server.endpoint->remoteObjectProxy(QXErrorHandler(tell))->send(kEcho, {QXValue("b")}, tell);
+    ASSERT_TRUE(raw.read<RequestFrame>());
+    if (number % 2 == 0) {
+      raw.write(Frame(ReplyFrame{number, {QXValue("b")}}));
+    } else {
+      raw.write(Frame(FailureFrame{number, QXError::make("Some domain", 1, "no")}));
+    }
+  };
+  const auto somebody = std::make_shared<const std::string>("somebody");
+  for (const std::uint64_t number : {1U, 2U}) {
+    const LogSubject subject(somebody);
+    ask(number);
+    EXPECT_EQ(subjects.take(), somebody);
+  }
+  for (const std::uint64_t number : {3U, 4U}) {
+    ask(number);
+    EXPECT_EQ(subjects.take(), LogSubject::Name());
+  }
 }
 
 TEST_F(EndpointTest, WhatTheSocketDoesNotTakeAtOnceIsWrittenWhenThePeerReads) {
@@ -725,7 +825,7 @@ TEST_F(EndpointTest, WhatTheSocketDoesNotTakeAtOnceIsWrittenWhenThePeerReads) {
   ASSERT_TRUE(idle.take());
   const auto remote = server.endpoint->remoteObjectProxy(QXErrorHandler());
   const QXRpcOperation operation{"data:", {QXValueKind::data}, {}};
-  constexpr std::size_t kBlocks = 6;
+  constexpr std::size_t kBlocks = 4;
   const QXValue block(QXData{std::vector<std::uint8_t>(kMaximumFrameBytes / 2, 7)});
   for (std::size_t i = 0; i < kBlocks; ++i) remote->send(operation, {block}, {});
   ASSERT_TRUE(raw.read<Hello>());
@@ -791,10 +891,10 @@ TEST_F(EndpointTest, APeerMayNotKeepTooManyRequestsUnanswered) {
 }
 
 TEST_F(EndpointTest, ConnectionsOfOneBudgetHaveTogetherNoMoreRequestsUnansweredThanItGives) {
-  const auto budget = std::make_shared<CallBudget>(1U);
-  auto first = connectRaw(recorder, budget);
+  const auto budget = std::make_shared<CallBudget>(CallLimits{1, kMaximumCallBytes});
+  auto first = connectRaw(recorder, {budget, {}, {}});
   const Side other = std::exchange(server, {});
-  auto second = connectRaw(recorder, budget);
+  auto second = connectRaw(recorder, {budget, {}, {}});
   for (const auto* peer : {&first, &second}) {
     peer->sayHello();
     ASSERT_TRUE(peer->read<Hello>());
@@ -809,7 +909,7 @@ TEST_F(EndpointTest, ConnectionsOfOneBudgetHaveTogetherNoMoreRequestsUnansweredT
 
   first.leave();
   ASSERT_TRUE(other.closed->take());
-  EXPECT_FALSE(budget->take()) << "the request outlives its connection";
+  EXPECT_FALSE(budget->take(1)) << "the request outlives its connection";
   held->reply({QXValue("a")});
   second.write(Frame(RequestFrame{2, true, kEcho.name, {QXValue("c")}}));
   EXPECT_TRUE(recorder->requests.take());

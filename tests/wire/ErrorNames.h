@@ -30,6 +30,8 @@ inline const char* nameOf(QXRpcErrorCode code) {
       return "peerDoesNotRead";
     case refused:
       return "refused";
+    case notPermitted:
+      return "notPermitted";
   }
   return nullptr;
 }

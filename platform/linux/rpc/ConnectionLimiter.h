@@ -1,5 +1,6 @@
-// How many connections one peer may hold open, and how many requests it may have without an answer over all of them together. Limits of the
-// second kind keep a peer from using up what the daemon may ask of a provider: they are well below that. May be used from any thread.
+// How many connections one peer may hold open, and how many requests, of how many bytes, it may have without an answer over all of them
+// together. Limits of the second kind keep a peer from using up what the daemon may ask of a provider: they are well below that. May be
+// used from any thread.
 #pragma once
 
 #include <cstddef>
@@ -14,9 +15,14 @@ namespace docuvend::linux_platform {
 
 inline constexpr std::size_t kMaximumConnectionsPerPeer = 64;
 inline constexpr std::size_t kMaximumCallsPerPeer = 256;
+inline constexpr std::size_t kMaximumCallBytesPerPeer = std::size_t{256} << 10U;
 // All unconfined processes are counted as one peer. They are trusted, and there may be hundreds of them at work.
 inline constexpr std::size_t kMaximumUnconfinedConnections = 1024;
 inline constexpr std::size_t kMaximumUnconfinedCalls = 4096;
+inline constexpr std::size_t kMaximumUnconfinedCallBytes = std::size_t{4} << 20U;
+// So are all that have no identity. Anybody may become one of these, and all that they may do is wake the daemon.
+inline constexpr std::size_t kMaximumConnectionsOfNobody = 16;
+inline constexpr std::size_t kMaximumCallsOfNobody = 16;
 
 class ConnectionLimiter : public std::enable_shared_from_this<ConnectionLimiter> {
  public:
@@ -47,7 +53,7 @@ class ConnectionLimiter : public std::enable_shared_from_this<ConnectionLimiter>
   };
   struct Limits {
     std::size_t connections;
-    std::size_t calls;  // requests without an answer
+    CallLimits calls;  // requests without an answer
   };
   // `peer` is what connections and requests are counted by; its limits are always the same.
   [[nodiscard]] Admission admit(const std::string& peer, Limits limits);

@@ -2,12 +2,15 @@
 
 #include <utility>
 
+#include "platform/linux/rpc/StraightURLs.h"
+
 namespace docuvend::linux_platform {
 namespace {
 
-Endpoint::Handlers handlersFor(QXLogHandle& log, int loggedProcess, LinuxRpcConnection::EndHandler onEnd) {
+Endpoint::Handlers handlersFor(QXLogHandle& log, int loggedProcess, LogSubject::Name subject, LinuxRpcConnection::EndHandler onEnd) {
   Endpoint::Handlers handlers;
-  handlers.onMisbehaviour = [&log, loggedProcess](const QXError& reason) {
+  handlers.onMisbehaviour = [&log, loggedProcess, name = std::move(subject)](const QXError& reason) {
+    const LogSubject subject(name);
     const auto text = reason.texts.find("description");
     log.write(QXLogType::defaultType, "[NOTICE] Closing the connection of PID " + std::to_string(loggedProcess) + ": " +
                                           (text == reason.texts.end() ? reason.description() : text->second));
@@ -20,14 +23,14 @@ Endpoint::Handlers handlersFor(QXLogHandle& log, int loggedProcess, LinuxRpcConn
 
 std::shared_ptr<LinuxRpcConnection> LinuxRpcConnection::create(Reactor& reactor, PeerDirectory& peers, QXLogHandle& log,
                                                                std::shared_ptr<const PeerIdentity> peer, UniqueDescriptor socket,
-                                                               std::shared_ptr<CallBudget> budget, EndHandler onEnd) {
-  auto handlers = handlersFor(log, peer->pid, std::move(onEnd));
-  std::shared_ptr<LinuxRpcConnection> connection(new LinuxRpcConnection(std::move(peer)));
+                                                               CallRules rules, URLNames urls, EndHandler onEnd) {
+  auto handlers = handlersFor(log, peer->pid, rules.subject, std::move(onEnd));
+  std::shared_ptr<LinuxRpcConnection> connection(new LinuxRpcConnection(std::move(peer), urls));
   handlers.onHello = [&peers, weak = std::weak_ptr(connection)](const Hello& hello) -> std::optional<QXError> {
     const auto strongSelf = weak.lock();
     return strongSelf ? strongSelf->peerSaidHello(peers, hello) : std::nullopt;
   };
-  connection->endpoint_ = Endpoint::create(reactor, std::move(socket), Hello{}, std::move(handlers), std::move(budget));
+  connection->endpoint_ = Endpoint::create(reactor, std::move(socket), Hello{}, std::move(handlers), std::move(rules));
   return connection;
 }
 
@@ -50,7 +53,9 @@ std::shared_ptr<const PeerIdentity> LinuxRpcConnection::peer() const {
 
 void LinuxRpcConnection::setExportedInterface(QXRpcInterface interface) { endpoint_->setExportedInterface(std::move(interface)); }
 
-void LinuxRpcConnection::setExportedObject(std::shared_ptr<QXRpcExportedObject> object) { endpoint_->setExportedObject(std::move(object)); }
+void LinuxRpcConnection::setExportedObject(std::shared_ptr<QXRpcExportedObject> object) {
+  endpoint_->setExportedObject(urls_ == URLNames::straight ? withStraightArguments(std::move(object)) : std::move(object));
+}
 
 void LinuxRpcConnection::resume() { endpoint_->resume(); }
 

@@ -11,7 +11,8 @@
 
 #include "platform/linux/base/UniqueDescriptor.h"
 #include "platform/linux/identity/PeerIdentity.h"
-#include "platform/linux/wire/CallBudget.h"
+#include "platform/linux/rpc/NamedService.h"
+#include "platform/linux/wire/CallRules.h"
 #include "platform/linux/wire/Endpoint.h"
 #include "platform/linux/wire/Reactor.h"
 #include "platform/log.h"
@@ -24,11 +25,11 @@ class LinuxRpcConnection final : public QXRpcConnection, public std::enable_shar
   using EndHandler = std::function<void(const QXError& reason)>;
 
   // A peer that a listener accepted. A bundle that it declares in its hello is put to the directory; a refusal ends the connection. `onEnd`
-  // is called once, on a thread of the reactor; the directory and the log outlive the reactor's threads. Requests count in `budget` until
-  // they are answered, also when the connection ends before.
+  // is called once, on a thread of the reactor; the directory and the log outlive the reactor's threads. Requests count in
+  // the rules' budget until they are answered, also when the connection ends before.
   [[nodiscard]] static std::shared_ptr<LinuxRpcConnection> create(Reactor& reactor, PeerDirectory& peers, QXLogHandle& log,
                                                                   std::shared_ptr<const PeerIdentity> peer, UniqueDescriptor socket,
-                                                                  std::shared_ptr<CallBudget> budget, EndHandler onEnd);
+                                                                  CallRules rules, URLNames urls, EndHandler onEnd);
 
   void setExportedInterface(QXRpcInterface interface) override;
   void setExportedObject(std::shared_ptr<QXRpcExportedObject> object) override;
@@ -43,10 +44,11 @@ class LinuxRpcConnection final : public QXRpcConnection, public std::enable_shar
   void close(const QXError& reason);
 
  private:
-  explicit LinuxRpcConnection(std::shared_ptr<const PeerIdentity> peer) : peer_(std::move(peer)) {}
+  LinuxRpcConnection(std::shared_ptr<const PeerIdentity> peer, URLNames urls) : urls_(urls), peer_(std::move(peer)) {}
   [[nodiscard]] std::optional<QXError> peerSaidHello(PeerDirectory& peers, const Hello& hello);
   [[nodiscard]] std::shared_ptr<const PeerIdentity> peer() const;
 
+  const URLNames urls_;
   std::shared_ptr<Endpoint> endpoint_;  // constant after creation
 
   mutable std::mutex mutex_;

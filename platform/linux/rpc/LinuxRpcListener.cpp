@@ -24,14 +24,26 @@ QXError refusal(std::string description) {
 
 // What a peer's connections are counted by.
 std::string countedAs(const PeerIdentity& peer) {
-  if (peer.standing == Standing::nobody) return "a process without an identity";
+  if (peer.standing == Standing::nobody) return "processes without an identity";
   if (peer.standing == Standing::confined && peer.bundleIdentifier) return *peer.bundleIdentifier;
   return "unconfined processes";
 }
 
 ConnectionLimiter::Limits limitsFor(const PeerIdentity& peer) {
-  if (peer.standing == Standing::unconfined) return {kMaximumUnconfinedConnections, kMaximumUnconfinedCalls};
-  return {kMaximumConnectionsPerPeer, kMaximumCallsPerPeer};
+  switch (peer.standing) {
+    case Standing::nobody:
+      return {kMaximumConnectionsOfNobody, {kMaximumCallsOfNobody, kMaximumCallBytesPerPeer}};
+    case Standing::unconfined:
+      return {kMaximumUnconfinedConnections, {kMaximumUnconfinedCalls, kMaximumUnconfinedCallBytes}};
+    case Standing::confined:
+      break;
+  }
+  return {kMaximumConnectionsPerPeer, {kMaximumCallsPerPeer, kMaximumCallBytesPerPeer}};
+}
+
+// Whose lines are kept from filling the log: those of peers that are not trusted.
+LogSubject::Name logSubjectFor(const PeerIdentity& peer) {
+  return peer.standing == Standing::unconfined ? nullptr : std::make_shared<const std::string>(countedAs(peer));
 }
 
 }  // namespace
@@ -113,6 +125,7 @@ void LinuxRpcListener::acceptAndDrop(int errnoValue) {
 
 void LinuxRpcListener::admit(UniqueDescriptor socket) {
   auto peer = surroundings_.peers.identify(socket.get());
+  const LogSubject subject(logSubjectFor(*peer));
   if (!isFor(*peer)) {
     refuseOutsider(*peer, std::move(socket));
     return;
@@ -129,11 +142,13 @@ void LinuxRpcListener::admit(UniqueDescriptor socket) {
     refuse(std::move(socket), "too many connections");
     return;
   }
+  CallRules rules = rulesFor(*peer, std::move(budget));
   const std::uint64_t number = nextNumber_++;
-  auto connection = LinuxRpcConnection::create(surroundings_.reactor, surroundings_.peers, surroundings_.log, std::move(peer),
-                                               std::move(socket), std::move(budget), [weak = weak_from_this(), number](const QXError&) {
-                                                 if (const auto strongSelf = weak.lock()) strongSelf->forget(number);
-                                               });
+  auto connection =
+      LinuxRpcConnection::create(surroundings_.reactor, surroundings_.peers, surroundings_.log, std::move(peer), std::move(socket),
+                                 std::move(rules), service_.urls, [weak = weak_from_this(), number](const QXError&) {
+                                   if (const auto strongSelf = weak.lock()) strongSelf->forget(number);
+                                 });
   {
     const std::lock_guard lock(mutex_);
     accepted_.emplace(number, Accepted{connection, std::move(place)});
@@ -144,6 +159,12 @@ void LinuxRpcListener::admit(UniqueDescriptor socket) {
 // A declared bundle changes nothing here: it comes later, and only from an unconfined process.
 bool LinuxRpcListener::isFor(const PeerIdentity& peer) const {
   return service_.audience == Audience::everyone || peer.standing == Standing::unconfined;
+}
+
+CallRules LinuxRpcListener::rulesFor(const PeerIdentity& peer, std::shared_ptr<CallBudget> budget) const {
+  CallRules rules{std::move(budget), /*operations=*/{}, LogSubject::current()};
+  if (peer.standing == Standing::nobody) rules.operations = service_.operationsForNobody;
+  return rules;
 }
 
 void LinuxRpcListener::refuseOutsider(const PeerIdentity& peer, UniqueDescriptor socket) {

@@ -9,6 +9,7 @@
 #include <memory>
 #include <mutex>
 #include <string>
+#include <vector>
 
 #include "platform/linux/base/UniqueDescriptor.h"
 #include "platform/linux/identity/PeerIdentity.h"
@@ -36,6 +37,8 @@ class LinuxRpcListener final : public QXRpcListener, public std::enable_shared_f
   struct Service {
     std::string name;
     Audience audience;
+    URLNames urls;
+    std::vector<std::string> operationsForNobody;
   };
 
   // A socket of our own, or one that was passed to us; both listen already.
@@ -57,6 +60,7 @@ class LinuxRpcListener final : public QXRpcListener, public std::enable_shared_f
   void acceptAndDrop(int errnoValue);
   void admit(UniqueDescriptor socket);
   [[nodiscard]] bool isFor(const PeerIdentity& peer) const;
+  [[nodiscard]] CallRules rulesFor(const PeerIdentity& peer, std::shared_ptr<CallBudget> budget) const;
   void refuseOutsider(const PeerIdentity& peer, UniqueDescriptor socket);
   void refuse(UniqueDescriptor socket, std::string reason) const;
   void offer(const std::shared_ptr<LinuxRpcConnection>& connection);

@@ -3,17 +3,26 @@
 
 #include <map>
 #include <string>
+#include <vector>
 
 namespace docuvend::linux_platform {
 
 enum class Audience {
-  everyone,         // also peers without an identity: what they may do is decided request by request
+  everyone,         // also peers without an identity, who may ask for little
   unconfinedPeers,  // processes of this user outside every confinement, whether or not they act for a bundle
+};
+
+// How its requests name files.
+enum class URLNames {
+  straight,  // made so (files/StraightURL.h) before the exported object hears of them
+  asSent,    // the service looks at the way itself
 };
 
 struct NamedService {
   std::string socketPath;  // absolute, in a directory that is there
   Audience audience = Audience::everyone;
+  URLNames urls = URLNames::asSent;
+  std::vector<std::string> operationsForNobody = {};  // all that a peer without an identity may ask for
 };
 
 // By name.

@@ -22,7 +22,8 @@
 // Reading belongs to the one thread on which the reactor runs the socket's handler: it takes what is there, and runs every whole frame
 // before the socket is armed again. Writing belongs to whoever holds the mutex: frames are numbered, put in line and offered to the socket
 // under it, so that numbers rise on the wire; what the socket does not take waits for its readiness. A peer that lets more than the
-// bound pile up is dropped.
+// bound pile up is dropped. It is not for what this end asks of it, perhaps in the name of others: while half of that lies there already,
+// a message that would add to it is not sent. So the other half at least is the answers that the peer asked for and does not take.
 //
 // No handler is called with the mutex held. Replies and failures that arrive run on the reading thread; failures that this end finds by
 // itself, also those of the connection's end, are posted to the reactor, so that nobody is called back from inside `send` or `close`.
@@ -52,8 +53,8 @@ enum class Cause {
 
 class Endpoint::State final : public AnswerSink, public std::enable_shared_from_this<State> {
  public:
-  State(Reactor& reactor, UniqueDescriptor socket, Handlers handlers, std::shared_ptr<CallBudget> budget)
-      : incoming(std::move(budget)),
+  State(Reactor& reactor, UniqueDescriptor socket, Handlers handlers, CallRules rules)
+      : incoming(std::move(rules)),
         reactor_(reactor),
         post_(reactor.poster()),
         handlers_(std::move(handlers)),
@@ -92,6 +93,7 @@ class Endpoint::State final : public AnswerSink, public std::enable_shared_from_
 
   // With the mutex held.
   Delivery write();
+  [[nodiscard]] bool hasRoomFor(const EncodedFrame& request) const;
 
   void write(const Frame& frame);
   // Ends the connection when the peer cannot be given what is due to it; it would wait for ever.
@@ -125,7 +127,10 @@ class Endpoint::Proxy final : public QXRpcProxy {
       : endpoint_(std::move(endpoint)), failureHandler_(std::make_shared<const FailureHandler>(std::move(failureHandler))) {}
 
   void send(const QXRpcOperation& operation, QXArray arguments, QXRpcReply reply) override {
-    endpoint_->state_->send(operation, std::move(arguments), std::move(reply), failureHandler_);
+    const bool isForSomebody = LogSubject::current() != nullptr;
+    endpoint_->state_->send(
+        operation, std::move(arguments), LogSubject::carrying(std::move(reply)),
+        isForSomebody ? std::make_shared<const FailureHandler>(LogSubject::carrying(*failureHandler_)) : failureHandler_);
   }
 
  private:
@@ -229,7 +234,7 @@ void Endpoint::State::run(RequestFrame request) {
     return;
   }
   lastRequest_ = request.callID;
-  incoming.run(std::move(request), shared_from_this());
+  incoming.run(std::move(request), reader_.frameBytes(), shared_from_this());
 }
 
 std::optional<OutgoingCalls::Call> Endpoint::State::settle(std::uint64_t callID) {
@@ -336,6 +341,8 @@ void Endpoint::State::send(const QXRpcOperation& operation, QXArray arguments, Q
       auto encoded = encodeFrame(std::move(request));
       if (const auto* malformed = std::get_if<Malformed>(&encoded)) {
         problem = failure(QXRpcErrorCode::notTransmissible, malformed->reason);
+      } else if (!hasRoomFor(std::get<EncodedFrame>(encoded))) {
+        problem = failure(QXRpcErrorCode::tooManyCalls, "the peer has not taken yet what was sent to it before");
       } else {
         writer_.add(std::get<EncodedFrame>(std::move(encoded)), outgoing_.nextID());
         outgoing_.add({operation.replies, std::move(reply), failureHandler}, forgotten);
@@ -392,6 +399,12 @@ Endpoint::State::Delivery Endpoint::State::write() {
     if (progress == FrameWriter::Progress::blocked && registration_) registration_->rearm(kWritable);
   }
   return writer_.pendingBytes() > kMaximumOutputBytes ? Delivery::overBound : Delivery::underway;
+}
+
+// One that finds nothing before it is let in whatever its length.
+bool Endpoint::State::hasRoomFor(const EncodedFrame& request) const {
+  const std::size_t before = writer_.pendingBytes();
+  return before == 0 || before + request.bytes.size() <= kMaximumOutputBeforeRequest;
 }
 
 void Endpoint::State::closeUnlessUnderway(Delivery delivery) {
@@ -451,9 +464,8 @@ Endpoint::Endpoint(std::shared_ptr<State> state) : state_(std::move(state)) {}
 
 Endpoint::~Endpoint() { state_->close(QXError::system(ECONNABORTED, "the connection was released"), Farewell::silent); }
 
-std::shared_ptr<Endpoint> Endpoint::create(Reactor& reactor, UniqueDescriptor socket, Hello hello, Handlers handlers,
-                                           std::shared_ptr<CallBudget> budget) {
-  auto state = std::make_shared<State>(reactor, std::move(socket), std::move(handlers), std::move(budget));
+std::shared_ptr<Endpoint> Endpoint::create(Reactor& reactor, UniqueDescriptor socket, Hello hello, Handlers handlers, CallRules rules) {
+  auto state = std::make_shared<State>(reactor, std::move(socket), std::move(handlers), std::move(rules));
   auto endpoint = std::shared_ptr<Endpoint>(new Endpoint(state));
   state->sendHello(std::move(hello));
   return endpoint;

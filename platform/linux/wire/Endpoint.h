@@ -14,7 +14,7 @@
 #include <variant>
 
 #include "platform/linux/base/UniqueDescriptor.h"
-#include "platform/linux/wire/CallBudget.h"
+#include "platform/linux/wire/CallRules.h"
 #include "platform/linux/wire/Frame.h"
 #include "platform/linux/wire/OutgoingCalls.h"
 #include "platform/linux/wire/Reactor.h"
@@ -37,10 +37,9 @@ class Endpoint : public std::enable_shared_from_this<Endpoint> {
   };
 
   // Takes a connected socket and sends the hello; its version is put in when it is 0. Nothing is read before `resume`. The endpoint lives
-  // as long as its owner holds it: released, it closes the connection. The peer's unanswered requests also count in `budget`, which may be
-  // shared with other endpoints.
+  // as long as its owner holds it: released, it closes the connection.
   [[nodiscard]] static std::shared_ptr<Endpoint> create(Reactor& reactor, UniqueDescriptor socket, Hello hello, Handlers handlers,
-                                                        std::shared_ptr<CallBudget> budget = {});
+                                                        CallRules rules = {});
   ~Endpoint();
   Endpoint(const Endpoint&) = delete;
   Endpoint& operator=(const Endpoint&) = delete;
@@ -51,7 +50,8 @@ class Endpoint : public std::enable_shared_from_this<Endpoint> {
   void setExportedObject(std::shared_ptr<QXRpcExportedObject> object);
   void resume();
 
-  // Each failed message calls the handler once. Keeps the endpoint alive.
+  // Each failed message calls the handler once. A message fails at once, and may be tried again later, when too many wait for their answers
+  // or too many bytes for the peer to take them. Keeps the endpoint alive.
   [[nodiscard]] std::shared_ptr<QXRpcProxy> remoteObjectProxy(QXErrorHandler errorHandler);
   // The same, for those whom it concerns how far a failed message came.
   [[nodiscard]] std::shared_ptr<QXRpcProxy> remoteObjectProxy(FailureHandler failureHandler);

@@ -95,7 +95,8 @@ std::variant<FrameReader::Incomplete, Frame, Malformed> FrameReader::next() {
         descriptors_.pop_front();
       }
       auto decoded = decodeFrame(contents, std::move(descriptors));
-      start_ += kFrameLengthBytes + length;
+      frameBytes_ = kFrameLengthBytes + length;
+      start_ += frameBytes_;
       if (auto* malformed = std::get_if<Malformed>(&decoded)) return std::move(*malformed);
       return std::get<Frame>(std::move(decoded));
     }

@@ -28,6 +28,9 @@ class FrameReader {
   // The next whole frame. Call it until it is incomplete before reading again. After something malformed nothing more is to be read.
   [[nodiscard]] std::variant<Incomplete, Frame, Malformed> next();
 
+  // Of the last frame that was given, with its length.
+  [[nodiscard]] std::size_t frameBytes() const { return frameBytes_; }
+
   // True when the bytes so far end inside a frame.
   [[nodiscard]] bool insideFrame() const { return start_ < buffer_.size(); }
 
@@ -36,6 +39,7 @@ class FrameReader {
 
   std::vector<std::uint8_t> buffer_;
   std::size_t start_ = 0;  // of the next frame in the buffer
+  std::size_t frameBytes_ = 0;
   std::deque<UniqueDescriptor> descriptors_;
 };
 

@@ -1,5 +1,6 @@
 #include "platform/linux/wire/IncomingCalls.h"
 
+#include <algorithm>
 #include <atomic>
 #include <optional>
 #include <string>
@@ -49,8 +50,8 @@ struct IncomingCalls::Answer {
   std::unique_ptr<CallBudget::Share> share;  // of whoever gives the answer, and of the destructor
 };
 
-IncomingCalls::IncomingCalls(std::shared_ptr<CallBudget> shared)
-    : budget_(std::make_shared<CallBudget>(kMaximumPendingCalls, std::move(shared))) {}
+IncomingCalls::IncomingCalls(CallRules rules)
+    : rules_(std::move(rules)), budget_(std::make_shared<CallBudget>(CallLimits{kMaximumPendingCalls, kMaximumCallBytes}, rules_.budget)) {}
 
 void IncomingCalls::setInterface(QXRpcInterface interface) {
   const std::lock_guard lock(mutex_);
@@ -64,7 +65,15 @@ void IncomingCalls::setObject(std::shared_ptr<QXRpcExportedObject> object) {
 
 void IncomingCalls::release() { setObject(nullptr); }
 
-void IncomingCalls::run(RequestFrame request, const std::shared_ptr<AnswerSink>& sink) {
+bool IncomingCalls::mayAskFor(const std::string& operation) const {
+  return !rules_.operations || std::find(rules_.operations->begin(), rules_.operations->end(), operation) != rules_.operations->end();
+}
+
+void IncomingCalls::run(RequestFrame request, std::size_t bytes, const std::shared_ptr<AnswerSink>& sink) {
+  if (!mayAskFor(request.operation)) {
+    sink->sendFailure({request.callID, failure(QXRpcErrorCode::notPermitted, "the operation is not for a process without an identity")});
+    return;
+  }
   std::shared_ptr<const QXRpcInterface> interface;
   std::shared_ptr<QXRpcExportedObject> object;
   {
@@ -81,7 +90,7 @@ void IncomingCalls::run(RequestFrame request, const std::shared_ptr<AnswerSink>&
     sink->sendFailure({request.callID, failure(QXRpcErrorCode::invalidArguments, request.operation + ": " + *mismatch)});
     return;
   }
-  auto share = budget_->take();
+  auto share = budget_->take(bytes);
   if (!share) {
     sink->sendFailure({request.callID, failure(QXRpcErrorCode::tooManyCalls, "too many requests wait for their answers")});
     return;
@@ -89,6 +98,7 @@ void IncomingCalls::run(RequestFrame request, const std::shared_ptr<AnswerSink>&
   // A request that wants no answer is as much work as one that does.
   const auto answer =
       std::make_shared<Answer>(request.wantsReply ? sink : nullptr, request.callID, std::move(interface), *operation, std::move(share));
+  const LogSubject subject(rules_.subject);
   object->invoke(*operation, std::move(request.arguments), [answer](QXArray values) { answer->give(std::move(values)); });
 }
 

@@ -6,7 +6,7 @@
 #include <memory>
 #include <mutex>
 
-#include "platform/linux/wire/CallBudget.h"
+#include "platform/linux/wire/CallRules.h"
 #include "platform/linux/wire/Frame.h"
 #include "platform/rpc.h"
 
@@ -26,8 +26,7 @@ class AnswerSink {
 
 class IncomingCalls {
  public:
-  // What the requests take besides the own budget of these calls; may be empty.
-  explicit IncomingCalls(std::shared_ptr<CallBudget> shared);
+  explicit IncomingCalls(CallRules rules);
 
   void setInterface(QXRpcInterface interface);
   void setObject(std::shared_ptr<QXRpcExportedObject> object);
@@ -35,17 +34,19 @@ class IncomingCalls {
   // until then: what was asked for is still at work.
   void release();
 
-  // Runs the request, or refuses it.
-  void run(RequestFrame request, const std::shared_ptr<AnswerSink>& sink);
+  // Runs the request, which came in that many bytes, or refuses it.
+  void run(RequestFrame request, std::size_t bytes, const std::shared_ptr<AnswerSink>& sink);
 
  private:
   struct Answer;
+  [[nodiscard]] bool mayAskFor(const std::string& operation) const;
 
   std::mutex mutex_;  // guards the two below
   std::shared_ptr<const QXRpcInterface> interface_;
   std::shared_ptr<QXRpcExportedObject> object_;
 
-  // Of requests whose replies are not called and not dropped yet, wanted or not.
+  const CallRules rules_;
+  // Within that of the rules. Of requests whose replies are not called and not dropped yet, wanted or not.
   const std::shared_ptr<CallBudget> budget_;
 };
 

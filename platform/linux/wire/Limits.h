@@ -14,7 +14,10 @@ inline constexpr std::size_t kMaximumNesting = 32;                         // ar
 inline constexpr std::size_t kMaximumElements = std::size_t{1} << 14U;     // values and error texts of one frame, all levels together
 inline constexpr std::size_t kMaximumDescriptors = 16;                     // of one frame
 inline constexpr std::size_t kMaximumPendingCalls = 1024;                  // requests of one direction without an answer yet
+inline constexpr std::size_t kMaximumCallBytes = std::size_t{4} << 20U;    // of such requests that a peer has made
 inline constexpr std::size_t kMaximumOutputBytes = std::size_t{4} << 20U;  // written for a peer and not taken by it yet
-inline constexpr std::size_t kReadBytes = std::size_t{1} << 16U;           // taken from a socket at a time
+// The same; while there are more, this end asks nothing further of the peer. So what this end asks alone never ends the connection.
+inline constexpr std::size_t kMaximumOutputBeforeRequest = kMaximumOutputBytes / 2;
+inline constexpr std::size_t kReadBytes = std::size_t{1} << 16U;  // taken from a socket at a time
 
 }  // namespace docuvend::linux_platform

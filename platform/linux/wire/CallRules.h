@@ -1,0 +1,23 @@
+// What a connection's peer may ask of this end, beside what holds for every peer.
+#pragma once
+
+#include <memory>
+#include <optional>
+#include <string>
+#include <vector>
+
+#include "platform/linux/base/LogSubject.h"
+#include "platform/linux/wire/CallBudget.h"
+
+namespace docuvend::linux_platform {
+
+struct CallRules {
+  // What its unanswered requests take, besides the connection's own limits; may be empty and shared with other connections.
+  std::shared_ptr<CallBudget> budget;
+  // The operations that it may ask for, when these are not all: every other request fails.
+  std::optional<std::vector<std::string>> operations;
+  // For whom its requests are run.
+  LogSubject::Name subject;
+};
+
+}  // namespace docuvend::linux_platform
