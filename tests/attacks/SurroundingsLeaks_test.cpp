@@ -22,9 +22,12 @@ class Leaks : public AttackTest {
     AttackTest::SetUp();
     installAttacker();
     writeFile(house_.home() + "/secret", "secret\n");
-    // Left open on purpose: every program that this one starts has it, and so has what they start, unless they see to it.
-    leaked_ = UniqueDescriptor(::open((house_.home() + "/secret").c_str(), O_RDONLY));
-    ASSERT_GT(leaked_.get(), STDERR_FILENO);
+    // Left open on purpose: every program that this one starts has it, and so has what they start, unless they see to it. The first numbers
+    // they take for what they pass on themselves, which would close it by chance.
+    constexpr int kOutOfTheWay = 50;
+    const UniqueDescriptor secret(::open((house_.home() + "/secret").c_str(), O_RDONLY | O_CLOEXEC));
+    leaked_ = UniqueDescriptor(::fcntl(secret.get(), F_DUPFD, kOutOfTheWay));
+    ASSERT_GE(leaked_.get(), kOutOfTheWay);
     // Something that a shell's user has, for the tests' programs inherit no environment of their own.
     house_.addToEnvironment("SECRET=x");
     house_.addToEnvironment("SSH_AUTH_SOCK=" + house_.runtime() + "/agent");
