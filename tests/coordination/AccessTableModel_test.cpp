@@ -1,10 +1,7 @@
 // Random accesses to few files by few processes, against what must hold whatever happened before.
-//
-// The seed of a run is printed; --gtest_random_seed=SEED repeats it.
 #include <gtest/gtest.h>
 
 #include <algorithm>
-#include <iostream>
 #include <map>
 #include <optional>
 #include <random>
@@ -14,6 +11,7 @@
 #include "platform/linux/coordination/AccessTable.h"
 #include "tests/coordination/Turns.h"
 #include "tests/support/Sanitizers.h"
+#include "tests/support/Seed.h"
 
 namespace docuvend::linux_platform {
 namespace {
@@ -26,13 +24,6 @@ constexpr int kSteps = 400;
 constexpr std::uint8_t kProcesses = 4;
 constexpr int kPartiesOfAProcess = 2;
 constexpr int kFiles = 4;
-
-std::uint32_t seedOfThisRun() {
-  const auto given = static_cast<std::uint32_t>(GTEST_FLAG_GET(random_seed));
-  const std::uint32_t seed = given != 0 ? given : std::random_device{}() % 99999 + 1;  // as the flag allows
-  std::cout << "seed " << seed << "\n";
-  return seed;
-}
 
 // Whether parties do one thing after another, or ask for more while they wait.
 enum class Parties { sequential, careless };
@@ -183,7 +174,7 @@ class Sequence {
 };
 
 void runManySequences(Parties parties) {
-  const std::uint32_t seed = seedOfThisRun();
+  const std::uint32_t seed = tests::seedOfThisRun();
   int refused = 0;
   for (int i = 0; i < kSequences && !::testing::Test::HasFailure(); ++i) {
     SCOPED_TRACE("seed " + std::to_string(seed) + ", sequence " + std::to_string(i));
