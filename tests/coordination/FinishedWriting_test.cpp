@@ -87,7 +87,7 @@ TEST_F(FinishedWriting, IsAnnouncedByTheOneWhoReplacedTheItemAndByNoOther) {
   const auto stranger = client(editor("2"));
   expectError(*saver.didFinishWriting(item), FileCoordinationErrorCode::notPermitted);
   ASSERT_TRUE(std::holds_alternative<UniqueDescriptor>(sandbox.redeem(saving, issued(sibling), TokenUse::writing)));
-  ASSERT_EQ(sandbox.replaceItem(saving, issued(document), issued(sibling)), std::nullopt);
+  ASSERT_EQ(testing::replaceItem(sandbox, saving, issued(document), issued(sibling)), std::nullopt);
   expectError(*stranger.didFinishWriting(item), FileCoordinationErrorCode::notPermitted);
   expectSuccess(*saver.didFinishWriting(item));
   ASSERT_EQ(provider->told.size(), 1U);

@@ -309,7 +309,7 @@ TEST_F(AccessQueryTest, GivesTheOneWhoReplacedAnItemTheNewObject) {
   const QXAuditToken first = peers.add(confined("com.example.editor", "1"));
   const QXAuditToken second = peers.add(confined("com.example.editor", "2"));
   redeemFor(first, sibling, TokenUse::writing);
-  EXPECT_EQ(sandbox.replaceItem(second, issued(document), issued(sibling)), std::nullopt);
+  EXPECT_EQ(testing::replaceItem(sandbox, second, issued(document), issued(sibling)), std::nullopt);
   EXPECT_EQ(ask(second, document), AccessVerdict::allowedByRedemption);
   EXPECT_EQ(ask(first, document), AccessVerdict::allowedByRedemption) << "it holds the very file";
 }

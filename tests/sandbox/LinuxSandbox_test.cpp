@@ -207,7 +207,7 @@ TEST_F(TakingTokensBack, TakesBackWhatWasGainedByRedeeming) {
   static_cast<void>(sandbox->redeem(another, issued(document), TokenUse::writing));
   ASSERT_TRUE(opens(issued(otherDocument)));
   ASSERT_TRUE(opens(issued(sibling)));
-  ASSERT_EQ(sandbox->replaceItem(editor, issued(document), issued(sibling)), std::nullopt);
+  ASSERT_EQ(testing::replaceItem(*sandbox, editor, issued(document), issued(sibling)), std::nullopt);
   ASSERT_EQ(sandbox->checkWithoutReport(editor, kQXSandboxFileWriteData, document), 0);
   takeBack(storage);
   for (const QXAuditToken& peer : {editor, another}) {
@@ -238,12 +238,12 @@ TEST_F(TakingTokensBack, RefusesToReplaceByOldTokens) {
   ASSERT_TRUE(opens(by));
   takeBack(storage);
   for (const auto& [first, second] : {std::pair(item, by), std::pair(item, issued(sibling)), std::pair(issued(document), by)}) {
-    const auto error = sandbox->replaceItem(editor, first, second);
+    const auto error = testing::replaceItem(*sandbox, editor, first, second);
     ASSERT_TRUE(error);
     expectBadToken(*error);
   }
   EXPECT_EQ(read(document), "contents");
-  EXPECT_EQ(sandbox->replaceItem(editor, issued(document), issued(sibling)), std::nullopt);
+  EXPECT_EQ(testing::replaceItem(*sandbox, editor, issued(document), issued(sibling)), std::nullopt);
 }
 
 TEST_F(TakingTokensBack, LetsNoOldTokenOpenAnythingOnceItIsDone) {
@@ -288,7 +288,7 @@ TEST_F(TakingTokensBack, LetsNoOldTokenChangeTheDirectoryOnceItIsDone) {
     std::thread saver([this, &item, &by, &stop, &replaced] {
       while (!stop.load()) {
         static_cast<void>(sandbox->redeem(editor, by, TokenUse::writing));
-        if (!sandbox->replaceItem(editor, item, by)) ++replaced;
+        if (!testing::replaceItem(*sandbox, editor, item, by)) ++replaced;
       }
     });
     while (replaced.load() == 0) std::this_thread::yield();

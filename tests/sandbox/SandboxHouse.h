@@ -11,11 +11,14 @@
 #include <filesystem>
 #include <fstream>
 #include <functional>
+#include <future>
 #include <map>
 #include <memory>
+#include <optional>
 #include <sstream>
 #include <stdexcept>
 #include <string>
+#include <utility>
 #include <vector>
 
 #include "platform/fake/FakeLog.h"
@@ -60,6 +63,15 @@ inline std::string read(const std::string& path) {
   std::ostringstream text;
   text << std::ifstream(path, std::ios::binary).rdbuf();
   return text.str();
+}
+
+// What the replacement came to, when it has.
+inline std::optional<QXError> replaceItem(LinuxSandbox& sandbox, const QXAuditToken& caller, const std::string& item,
+                                          const std::string& sibling) {
+  const auto answer = std::make_shared<std::promise<std::optional<QXError>>>();
+  auto result = answer->get_future();
+  sandbox.replaceItem(caller, item, sibling, [answer](std::optional<QXError> error) { answer->set_value(std::move(error)); });
+  return result.get();
 }
 
 // With the files of the tokens' session in the directory.

@@ -3,14 +3,18 @@
 #include <gtest/gtest.h>
 
 #include <array>
+#include <chrono>
+#include <future>
 #include <memory>
 #include <optional>
 #include <string>
+#include <utility>
 
 #include "platform/fake/FakeLog.h"
 #include "platform/fake/FakeRpc.h"
 #include "platform/linux/sandbox/SandboxListenerDelegate.h"
 #include "tests/sandbox/SandboxHouse.h"
+#include "tests/sandbox/SystemCalls.h"
 
 namespace docuvend::linux_platform {
 namespace {
@@ -52,16 +56,16 @@ class SandboxServicerTest : public testing::SandboxHouse {
     EXPECT_EQ(heard.answers, 1);
     return heard;
   }
-  std::optional<QXError> replace(std::optional<QXData> item, std::optional<QXData> by) {
-    int answers = 0;
-    std::optional<QXError> heard;
+  // Its answer comes from a thread that waits for the disk.
+  std::future<std::optional<QXError>> replacing(std::optional<QXData> item, std::optional<QXData> by) {
+    const auto answer = std::make_shared<std::promise<std::optional<QXError>>>();
     QXRemote<QXSandboxRedemption>(connection->peer())
-        .call<&QXSandboxRedemption::replaceItemWithToken>(std::move(item), std::move(by), [&answers, &heard](std::optional<QXError> error) {
-          ++answers;
-          heard = std::move(error);
-        });
-    EXPECT_EQ(answers, 1);
-    return heard;
+        .call<&QXSandboxRedemption::replaceItemWithToken>(std::move(item), std::move(by),
+                                                          [answer](std::optional<QXError> error) { answer->set_value(std::move(error)); });
+    return answer->get_future();
+  }
+  std::optional<QXError> replace(std::optional<QXData> item, std::optional<QXData> by) {
+    return replacing(std::move(item), std::move(by)).get();
   }
   static void expectError(const std::optional<QXError>& error, SandboxErrorCode code) {
     ASSERT_TRUE(error);
@@ -144,8 +148,77 @@ TEST_F(SandboxServicerTest, ServesNobodyElse) {
   }
 }
 
+// A disk that has taken up a flush and does not end it, until it is let go.
+class StuckDisk {
+ public:
+  StuckDisk() {
+    calls_.beforeFlush = [this](int) {
+      if (std::exchange(hasFlushed_, true)) return;
+      reached_.set_value();
+      static_cast<void>(go_.wait_for(kPatience));
+    };
+  }
+  StuckDisk(const StuckDisk&) = delete;
+  StuckDisk& operator=(const StuckDisk&) = delete;
+  ~StuckDisk() = default;
+
+  [[nodiscard]] bool awaitFlush() { return reached_.get_future().wait_for(kPatience) == std::future_status::ready; }
+  void letGo() { let_.set_value(); }
+
+ private:
+  static constexpr std::chrono::seconds kPatience{60};
+  std::promise<void> reached_;
+  std::promise<void> let_;
+  const std::shared_future<void> go_ = let_.get_future().share();
+  bool hasFlushed_ = false;  // only on the thread that flushes
+  testing::SystemCalls calls_;
+};
+
+TEST_F(SandboxServicerTest, ServesTheNextRequestsWhileAReplacementWaitsForTheDisk) {
+  ASSERT_EQ(::pwrite(redeem(issued(sibling), true).file->number, "saved", 5, 0), 5);
+  StuckDisk disk;
+  auto replacement = replacing(issued(document), issued(sibling));
+  ASSERT_TRUE(disk.awaitFlush());
+  EXPECT_TRUE(redeem(issued(document), true).file);
+  QXData bad = issued(document);
+  bad.bytes[30] ^= 1U;
+  expectError(replace(bad, issued(sibling)), SandboxErrorCode::badToken);
+  EXPECT_EQ(testing::read(document), "contents");
+  disk.letGo();
+  EXPECT_EQ(replacement.get(), std::nullopt);
+  EXPECT_EQ(testing::read(document), "saved");
+}
+
+TEST_F(SandboxServicerTest, MakesAReplacementThoughItsCallerLeavesMeanwhile) {
+  ASSERT_EQ(::pwrite(redeem(issued(sibling), true).file->number, "saved", 5, 0), 5);
+  StuckDisk disk;
+  auto servicer = std::make_shared<SandboxServicer>(sandbox, log.defaultLog(), connection);
+  const auto answer = std::make_shared<std::promise<std::optional<QXError>>>();
+  servicer->replaceItemWithToken(issued(document), issued(sibling),
+                                 [answer](std::optional<QXError> error) { answer->set_value(std::move(error)); });
+  ASSERT_TRUE(disk.awaitFlush());
+  servicer.reset();
+  connection.reset();
+  disk.letGo();
+  EXPECT_EQ(answer->get_future().get(), std::nullopt);
+  EXPECT_EQ(testing::read(document), "saved");
+}
+
+TEST_F(SandboxServicerTest, LogsATokenThatIsTakenBackBeforeTheDiskHasTheReplacement) {
+  ASSERT_TRUE(redeem(issued(sibling), true).file);
+  StuckDisk disk;
+  auto replacement = replacing(issued(document), issued(sibling));
+  ASSERT_TRUE(disk.awaitFlush());
+  EXPECT_EQ(sandbox.invalidateReadWriteExtensions(storage), std::nullopt);
+  disk.letGo();
+  expectError(replacement.get(), SandboxErrorCode::badToken);
+  ASSERT_EQ(log.entries().size(), 1U);
+  EXPECT_EQ(log.entries()[0].text, "[NOTICE] Refusing a sandbox token from PID 4711: QXSandboxErrorDomain 1: the token was taken back");
+}
+
 TEST_F(SandboxServicerTest, IsNobodyOnceItsConnectionIsGone) {
-  SandboxServicer servicer(sandbox, log.defaultLog(), /*connection=*/{});
+  const auto gone = std::make_shared<SandboxServicer>(sandbox, log.defaultLog(), /*connection=*/std::weak_ptr<QXRpcConnection>());
+  SandboxServicer& servicer = *gone;
   std::optional<QXError> heard;
   servicer.redeemToken(issued(document), true, [&heard](std::optional<QXError> error, std::optional<QXDescriptor> file) {
     heard = std::move(error);

@@ -153,10 +153,28 @@ TEST_F(TokenRedeemerTest, ForgetsContainersOfRemovedBundles) {
   expectError(token, TokenUse::reading, SandboxErrorCode::gone, "removed");
 }
 
-TEST_F(TokenRedeemerTest, LeavesAccessToTheSystem) {
-  ASSERT_EQ(::chmod(document.c_str(), 0400), 0);
-  expectError(tokenFor(document), TokenUse::writing, SandboxErrorCode::notPermitted, "read-only");
-  EXPECT_EQ(contentsOf(redeemed(tokenFor(document), TokenUse::reading)), "contents");
+// A bearer owns the file that it was given, and may have taken the others' way to it.
+TEST_F(TokenRedeemerTest, GivesTheOwnerBackTheAccessThatABearerTookAway) {
+  for (const mode_t mode : {0000U, 0400U, 0200U, 0077U}) {
+    for (const TokenUse use : {TokenUse::reading, TokenUse::writing}) {
+      const UniqueDescriptor bearers = redeemed(tokenFor(document), TokenUse::reading);
+      ASSERT_EQ(::fchmod(bearers.get(), mode), 0);
+      EXPECT_EQ(contentsOf(redeemed(tokenFor(document), use)), "contents") << mode;
+      const bool isEnough = use == TokenUse::reading && (mode & 0400U) != 0;
+      EXPECT_EQ(modeOf(document), isEnough ? mode : mode | 0600U) << "no more than what was missing";
+    }
+  }
+  ASSERT_TRUE(puts(redeemed(tokenFor(sibling), TokenUse::writing), "new"));
+  ASSERT_EQ(::chmod(sibling.c_str(), 0), 0);
+  ASSERT_TRUE(std::holds_alternative<ReplacedItem>(redeemer.replaceItem(tokenFor(document), tokenFor(sibling))));
+  EXPECT_EQ(read(document), "new");
+}
+
+TEST_F(TokenRedeemerTest, GivesNothingBackToAFileThatIsNoItem) {
+  ASSERT_EQ(::link(document.c_str(), (storage + "/second.txt").c_str()), 0);
+  ASSERT_EQ(::chmod(document.c_str(), 0), 0);
+  expectError(tokenFor(document), TokenUse::writing, SandboxErrorCode::notRegularFile, "two links");
+  EXPECT_EQ(modeOf(document), 0U);
 }
 
 TEST_F(TokenRedeemerTest, AnswersBusyInsteadOfWaitingForALease) {
@@ -283,7 +301,7 @@ TEST_F(TokenRedeemerTest, RenamesNothingByATokenThatIsTakenBackWhileTheSiblingIs
   EXPECT_EQ(modeOf(sibling), 0600U);
 }
 
-TEST_F(TokenRedeemerTest, ForcesContentsBeforeTheRenameAndModeAndDirectoryAfterIt) {
+TEST_F(TokenRedeemerTest, ForcesContentsAndModeBeforeTheRenameAndTheDirectoryAfterIt) {
   ASSERT_EQ(::chmod(document.c_str(), 0640), 0);
   ASSERT_TRUE(puts(redeemed(tokenFor(sibling), TokenUse::writing), "new"));
   std::vector<std::string> flushed;
@@ -293,12 +311,29 @@ TEST_F(TokenRedeemerTest, ForcesContentsBeforeTheRenameAndModeAndDirectoryAfterI
     struct stat status {};
     ASSERT_EQ(::fstat(descriptor, &status), 0);
     flushed.push_back(object.value_or("") + (S_ISDIR(status.st_mode) ? "/" : "") + (read(document) == "new" ? " after it" : " before it"));
-    if (object == document) {
+    if (object == sibling) {
       EXPECT_EQ(status.st_mode & 0777U, 0640U);
     }
   };
-  ASSERT_TRUE(std::holds_alternative<ReplacedItem>(redeemer.replaceItem(tokenFor(document), tokenFor(sibling))));
-  EXPECT_EQ(flushed, (std::vector<std::string>{sibling + " before it", document + " after it", storage + "/ after it"}));
+  auto result = redeemer.replaceItem(tokenFor(document), tokenFor(sibling));
+  ASSERT_TRUE(std::holds_alternative<ReplacedItem>(result));
+  EXPECT_EQ(TokenRedeemer::forceToDisk(std::move(std::get<ReplacedItem>(result))), std::nullopt);
+  EXPECT_EQ(flushed, (std::vector<std::string>{sibling + " before it", storage + "/ after it"}));
+}
+
+// One that goes on writing would put it off.
+TEST_F(TokenRedeemerTest, ForcesNothingToDiskThatARevocationWouldWaitFor) {
+  ASSERT_TRUE(puts(redeemed(tokenFor(sibling), TokenUse::writing), "new"));
+  int cuts = 0;
+  testing::SystemCalls calls;
+  auto replaced = redeemer.replaceItem(tokenFor(document), tokenFor(sibling));
+  ASSERT_TRUE(std::holds_alternative<ReplacedItem>(replaced));
+  calls.beforeFlush = [this, &cuts](int) {
+    EXPECT_EQ(session.takeBack({storage + "/"}), std::nullopt);
+    ++cuts;
+  };
+  EXPECT_EQ(TokenRedeemer::forceToDisk(std::move(std::get<ReplacedItem>(replaced))), std::nullopt);
+  EXPECT_EQ(cuts, 1);
 }
 
 TEST_F(TokenRedeemerTest, RenamesNothingButAHiddenSiblingOverItsItem) {

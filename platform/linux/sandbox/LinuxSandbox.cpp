@@ -34,6 +34,11 @@ int codeFor(AccessVerdict verdict) {
   return EPERM;
 }
 
+// Whose replacements wait for one another. What is not confined counts as one, as everywhere.
+std::string ownerOf(const PeerIdentity& peer) {
+  return peer.standing == Standing::confined ? peer.bundleIdentifier.value_or("") : std::string();
+}
+
 QXError nobodyError() { return sandboxError(SandboxErrorCode::notPermitted, "the caller is not known"); }
 
 }  // namespace
@@ -96,14 +101,26 @@ std::variant<UniqueDescriptor, QXError> LinuxSandbox::redeem(const QXAuditToken&
   return std::move(file.file);
 }
 
-std::optional<QXError> LinuxSandbox::replaceItem(const QXAuditToken& caller, std::string_view itemToken, std::string_view siblingToken) {
+void LinuxSandbox::replaceItem(const QXAuditToken& caller, std::string itemToken, std::string siblingToken, Completion completion) {
   const auto peer = somebody(caller);
-  if (!peer) return nobodyError();
+  if (!peer) return completion(nobodyError());
+  // What waits is no longer than a good token.
+  for (const std::string& token : {itemToken, siblingToken}) {
+    if (auto error = redeemer_.refusalOf(token)) return completion(std::move(error));
+  }
+  diskWork_.submit(ownerOf(*peer),
+                   [this, instance = peer->instance, itemToken = std::move(itemToken), siblingToken = std::move(siblingToken),
+                    completion = std::move(completion)] { completion(replaceItemNow(instance, itemToken, siblingToken)); });
+}
+
+std::optional<QXError> LinuxSandbox::replaceItemNow(const std::string& instance, const std::string& itemToken,
+                                                    const std::string& siblingToken) {
   auto replaced = redeemer_.replaceItem(itemToken, siblingToken);
   if (auto* error = std::get_if<QXError>(&replaced)) return std::move(*error);
+  auto& item = std::get<ReplacedItem>(replaced);
   // The item is another object now, and the one who put it there may say that it has written it.
-  ledger_.enter(peer->instance, std::get<ReplacedItem>(replaced).identity);
-  return std::nullopt;
+  ledger_.enter(instance, item.identity);
+  return TokenRedeemer::forceToDisk(std::move(item));
 }
 
 }  // namespace docuvend::linux_platform

@@ -4,6 +4,7 @@
 // writing is remembered for the access query, until the next time that tokens are taken back. May be used from any thread.
 #pragma once
 
+#include <functional>
 #include <memory>
 #include <optional>
 #include <string>
@@ -12,6 +13,7 @@
 
 #include "platform/linux/base/Paths.h"
 #include "platform/linux/sandbox/AccessQuery.h"
+#include "platform/linux/sandbox/DiskWork.h"
 #include "platform/linux/sandbox/GroupContainers.h"
 #include "platform/linux/sandbox/RedemptionLedger.h"
 #include "platform/linux/sandbox/TokenRedeemer.h"
@@ -22,7 +24,9 @@ namespace docuvend::linux_platform {
 
 class LinuxSandbox final : public QXSandbox {
  public:
-  // With the session that `paths` has. The registry and the directory outlive it.
+  using Completion = std::function<void(std::optional<QXError>)>;
+
+  // With the session that `paths` has. The registry and the directory outlive it. std::system_error when there is no thread for it.
   [[nodiscard]] static std::variant<std::unique_ptr<LinuxSandbox>, QXError> create(const Paths& paths, BundleRegistry& registry,
                                                                                    PeerDirectory& peers, QXLogHandle& log);
   LinuxSandbox(std::unique_ptr<TokenSession> session, BundleRegistry& registry, PeerDirectory& peers);
@@ -41,10 +45,14 @@ class LinuxSandbox final : public QXSandbox {
 
   // For the process that the audit token identifies, which must be one of this user's: confined or not, what it brings is what counts.
   [[nodiscard]] std::variant<UniqueDescriptor, QXError> redeem(const QXAuditToken& caller, std::string_view token, TokenUse use);
-  [[nodiscard]] std::optional<QXError> replaceItem(const QXAuditToken& caller, std::string_view itemToken, std::string_view siblingToken);
+  // The completion is called before this returns when the caller or a token is refused, else on a thread that may wait for the disk. One
+  // replacement of a bundle is made at a time, whether or not the caller is still there, and none once this object goes.
+  void replaceItem(const QXAuditToken& caller, std::string itemToken, std::string siblingToken, Completion completion);
 
  private:
   [[nodiscard]] std::shared_ptr<const PeerIdentity> somebody(const QXAuditToken& caller) const;
+  [[nodiscard]] std::optional<QXError> replaceItemNow(const std::string& instance, const std::string& itemToken,
+                                                      const std::string& siblingToken);
 
   const std::unique_ptr<TokenSession> session_;
   PeerDirectory& peers_;
@@ -52,6 +60,7 @@ class LinuxSandbox final : public QXSandbox {
   RedemptionLedger ledger_;
   const TokenRedeemer redeemer_;
   const AccessQuery query_;
+  DiskWork diskWork_;  // the last, since its work uses the others
 };
 
 }  // namespace docuvend::linux_platform

@@ -1,6 +1,7 @@
 #include "platform/linux/sandbox/SandboxServicer.h"
 
 #include <string>
+#include <utility>
 
 namespace docuvend::linux_platform {
 namespace {
@@ -21,9 +22,12 @@ void SandboxServicer::redeemToken(std::optional<QXData> token, std::optional<boo
 
 void SandboxServicer::replaceItemWithToken(std::optional<QXData> itemToken, std::optional<QXData> bySiblingWithToken,
                                            ErrorReply completionHandler) {
-  auto error = sandbox_.replaceItem(caller(), textOf(itemToken), textOf(bySiblingWithToken));
-  if (error) noteRefusal(*error);
-  if (completionHandler) completionHandler(std::move(error));
+  // The connection may let go of this before the disk has what is to be there.
+  sandbox_.replaceItem(caller(), textOf(itemToken), textOf(bySiblingWithToken),
+                       [self = shared_from_this(), completionHandler = std::move(completionHandler)](std::optional<QXError> error) {
+                         if (error) self->noteRefusal(*error);
+                         if (completionHandler) completionHandler(std::move(error));
+                       });
 }
 
 QXAuditToken SandboxServicer::caller() const {
@@ -32,8 +36,7 @@ QXAuditToken SandboxServicer::caller() const {
 }
 
 void SandboxServicer::noteRefusal(const QXError& error) {
-  if (noted_ || error.code != static_cast<std::int64_t>(SandboxErrorCode::badToken)) return;
-  noted_ = true;
+  if (error.code != static_cast<std::int64_t>(SandboxErrorCode::badToken) || noted_.exchange(true)) return;
   const auto connection = connection_.lock();
   const int pid = connection ? connection->processIdentifier() : 0;
   log_.write(QXLogType::defaultType, "[NOTICE] Refusing a sandbox token from PID " + std::to_string(pid) + ": " + error.description());

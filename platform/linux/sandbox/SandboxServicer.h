@@ -1,9 +1,11 @@
 // One connection's share of the service "com.orvane.Sandbox".
 //
-// Answers on the connection's serial context, before the operation returns. A refused token is logged once per connection, with its
-// reason but never with its text.
+// Redeems on the connection's serial context, before the operation returns. A replacement waits for the disk, so it is answered later and
+// elsewhere, and the connection's next requests are served meanwhile. A refused token is logged once per connection, with its reason but
+// never with its text.
 #pragma once
 
+#include <atomic>
 #include <memory>
 #include <optional>
 
@@ -14,9 +16,9 @@
 
 namespace docuvend::linux_platform {
 
-class SandboxServicer final : public QXSandboxRedemption {
+class SandboxServicer final : public QXSandboxRedemption, public std::enable_shared_from_this<SandboxServicer> {
  public:
-  // The sandbox and the log outlive it; the connection owns it.
+  // The sandbox and the log outlive it. The connection owns it, with the replacements that are being made for it.
   SandboxServicer(LinuxSandbox& sandbox, QXLogHandle& log, std::weak_ptr<QXRpcConnection> connection)
       : sandbox_(sandbox), log_(log), connection_(std::move(connection)) {}
 
@@ -31,7 +33,7 @@ class SandboxServicer final : public QXSandboxRedemption {
   LinuxSandbox& sandbox_;
   QXLogHandle& log_;
   const std::weak_ptr<QXRpcConnection> connection_;
-  bool noted_ = false;  // only on the connection's serial context
+  std::atomic<bool> noted_{false};
 };
 
 }  // namespace docuvend::linux_platform

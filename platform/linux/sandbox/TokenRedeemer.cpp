@@ -8,7 +8,11 @@
 //
 // A token may be taken back at any moment, too. Whatever comes of it happens within one use of the session, which began before the token
 // was looked at: a cut that the token has not seen yet waits for the use to end. Forcing a sibling's contents to disk takes as long as its
-// writer likes, so that comes before the use.
+// writer likes, so that comes before the use, and with it the item's mode, which needs no flush of its own then; the directory is forced
+// when the use is over. A crash in between finds the item as it was or as it is to be.
+//
+// Whoever is given an open file owns it, as all of this user's processes do, and may take the owner's own permission from it. It is given
+// back to the file that was looked at when the next one comes with a token: a mode is no wall between bearers.
 
 #include "platform/linux/sandbox/TokenRedeemer.h"
 
@@ -28,6 +32,8 @@ namespace {
 constexpr int kTries = 8;
 constexpr mode_t kSiblingMode = 0600;
 constexpr mode_t kPermissionBits = 0777;
+constexpr mode_t kModeBits = 07777;
+constexpr mode_t kOwnersAccess = 0600;
 constexpr int kNeverWaiting = O_NONBLOCK | O_NOCTTY | O_CLOEXEC;
 
 int accessMode(TokenUse use) { return use == TokenUse::writing ? O_RDWR : O_RDONLY; }
@@ -46,9 +52,30 @@ struct OpenFile {
 // The name has come to mean another file meanwhile, as when somebody saves atomically.
 struct Exchanged {};
 
+// Gives the owner's permission back to a file of this user's that lacks it. False when that is not why it cannot be opened.
+bool giveOwnersAccessBack(const PlacedFile& placed) {
+  const auto examined = statusOf(placed.path.get());
+  const auto* status = std::get_if<ObjectStatus>(&examined);
+  if (status == nullptr || !S_ISREG(status->mode) || status->links != 1) return false;
+  if ((status->mode & kOwnersAccess) == kOwnersAccess) return false;
+  return ::chmod(descriptorPath(placed.path.get()).c_str(), (status->mode & kModeBits) | kOwnersAccess) == 0;
+}
+
+UniqueDescriptor openObject(const PlacedFile& placed, int access) {
+  return UniqueDescriptor(::open(descriptorPath(placed.path.get()).c_str(), access | kNeverWaiting));
+}
+
 // Opens the object itself and makes sure that it is still a regular file with one link.
 std::variant<OpenFile, Exchanged, QXError> openPlaced(const PlacedFile& placed, int access) {
-  UniqueDescriptor file(::open(descriptorPath(placed.path.get()).c_str(), access | kNeverWaiting));
+  UniqueDescriptor file = openObject(placed, access);
+  if (!file && errno == EACCES) {
+    // The refusal stands when there is nothing to give back.
+    if (giveOwnersAccessBack(placed)) {
+      file = openObject(placed, access);
+    } else {
+      errno = EACCES;
+    }
+  }
   if (!file) return sandboxErrorFor(SystemFailure{errno}, "the file cannot be opened");
   const auto examined = statusOf(file.get());
   if (const auto* failure = std::get_if<SystemFailure>(&examined)) return sandboxErrorFor(*failure, "the file cannot be examined");
@@ -96,22 +123,35 @@ std::optional<QXError> flushDirectory(int directory) {
   return flush(readable.get(), "the directory cannot be written");
 }
 
-// Renames the open sibling over the item, which gives it the item's permission bits.
-std::optional<QXError> renameOver(const PlacedItem& item, const std::string& siblingName, int sibling) {
-  const auto itemStatus = statusOf(item.file->path.get());
-  const auto siblingStatus = statusOf(sibling);
-  for (const auto* status : {&itemStatus, &siblingStatus}) {
-    if (const auto* failure = std::get_if<SystemFailure>(status)) return sandboxErrorFor(*failure, "the files cannot be examined");
+// The item's permission bits on its hidden sibling. Unless they are to stay, the sibling gets back what it had: it is still the hidden
+// sibling then, and its next writer needs that.
+class BorrowedMode {
+ public:
+  explicit BorrowedMode(int sibling) : sibling_(sibling) {}
+  BorrowedMode(const BorrowedMode&) = delete;
+  BorrowedMode& operator=(const BorrowedMode&) = delete;
+  ~BorrowedMode() {
+    if (before_) static_cast<void>(::fchmod(sibling_, *before_));
   }
-  if (::fchmod(sibling, std::get<ObjectStatus>(itemStatus).mode & kPermissionBits) != 0) {
-    return sandboxErrorFor(SystemFailure{errno}, "the hidden sibling cannot be given the item's mode");
+
+  [[nodiscard]] std::optional<QXError> take(const PlacedFile& item) {
+    const auto itemStatus = statusOf(item.path.get());
+    const auto siblingStatus = statusOf(sibling_);
+    for (const auto* status : {&itemStatus, &siblingStatus}) {
+      if (const auto* failure = std::get_if<SystemFailure>(status)) return sandboxErrorFor(*failure, "the files cannot be examined");
+    }
+    if (::fchmod(sibling_, std::get<ObjectStatus>(itemStatus).mode & kPermissionBits) != 0) {
+      return sandboxErrorFor(SystemFailure{errno}, "the hidden sibling cannot be given the item's mode");
+    }
+    before_ = std::get<ObjectStatus>(siblingStatus).mode & kPermissionBits;
+    return std::nullopt;
   }
-  if (::renameat(item.directory.get(), siblingName.c_str(), item.directory.get(), item.name.c_str()) == 0) return std::nullopt;
-  const SystemFailure failure{errno};
-  // It is still the hidden sibling, and the next one to write it needs the mode that it had.
-  static_cast<void>(::fchmod(sibling, std::get<ObjectStatus>(siblingStatus).mode & kPermissionBits));
-  return sandboxErrorFor(failure, "the hidden sibling cannot be renamed");
-}
+  void stays() { before_.reset(); }
+
+ private:
+  const int sibling_;
+  std::optional<mode_t> before_;
+};
 
 QXError goneError() { return sandboxError(SandboxErrorCode::gone, "the file does not exist"); }
 
@@ -163,12 +203,18 @@ bool TokenRedeemer::isFor(std::string_view token, const std::string& path) const
   return file != nullptr && file->path == item->path;
 }
 
+std::optional<QXError> TokenRedeemer::refusalOf(std::string_view token) const {
+  auto path = pathOf(token);
+  if (auto* error = std::get_if<QXError>(&path)) return std::move(*error);
+  return std::nullopt;
+}
+
 std::variant<ReplacedItem, QXError> TokenRedeemer::replaceItem(std::string_view itemToken, std::string_view siblingToken) const {
   auto itemPlace = placed(itemToken);
   if (auto* error = std::get_if<QXError>(&itemPlace)) return std::move(*error);
   auto siblingPlace = placed(siblingToken);
   if (auto* error = std::get_if<QXError>(&siblingPlace)) return std::move(*error);
-  const auto& item = std::get<PlacedItem>(itemPlace);
+  auto& item = std::get<PlacedItem>(itemPlace);
   const auto& sibling = std::get<PlacedItem>(siblingPlace);
 
   const std::string directoryPath = item.path.substr(0, item.path.size() - item.name.size());
@@ -186,22 +232,29 @@ std::variant<ReplacedItem, QXError> TokenRedeemer::replaceItem(std::string_view 
   if (auto* error = std::get_if<QXError>(&opened)) return std::move(*error);
   if (std::holds_alternative<Exchanged>(opened)) return goneError();
   const int file = std::get<OpenFile>(opened).file.get();
+  BorrowedMode mode(file);
+  if (auto error = mode.take(*item.file)) return *std::move(error);
   if (auto error = flush(file, "the hidden sibling cannot be written")) return *std::move(error);
 
   auto use = session_.beginUse();
   for (const std::string_view token : {itemToken, siblingToken}) {
-    auto path = pathOf(token);
-    if (auto* error = std::get_if<QXError>(&path)) return std::move(*error);
+    if (auto error = refusalOf(token)) return *std::move(error);
   }
-  if (auto error = renameOver(item, sibling.name, file)) return *std::move(error);
-  if (auto error = flush(file, "the item's mode cannot be written")) return *std::move(error);
-  if (auto error = flushDirectory(item.directory.get())) return *std::move(error);
+  if (::renameat(item.directory.get(), sibling.name.c_str(), item.directory.get(), item.name.c_str()) != 0) {
+    return sandboxErrorFor(SystemFailure{errno}, "the hidden sibling cannot be renamed");
+  }
+  mode.stays();
 
   auto after = placeEntry(item.directory.get(), item.name);
   if (const auto* refusal = std::get_if<PathRefusal>(&after)) return sandboxErrorFor(*refusal);
   const auto& now = std::get<std::optional<PlacedFile>>(after);
   if (!now || now->identity != source->identity) return sandboxError(SandboxErrorCode::gone, "the item was exchanged meanwhile");
-  return ReplacedItem{source->identity, std::move(use)};
+  return ReplacedItem{source->identity, std::move(use), std::move(item.directory)};
+}
+
+std::optional<QXError> TokenRedeemer::forceToDisk(ReplacedItem replaced) {
+  { const auto over = std::move(replaced.use); }
+  return flushDirectory(replaced.directory.get());
 }
 
 }  // namespace docuvend::linux_platform

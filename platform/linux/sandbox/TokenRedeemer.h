@@ -3,6 +3,7 @@
 // Whoever brings a good token is served; who that is does not matter here. May be used from any thread; blocks for the disk only.
 #pragma once
 
+#include <optional>
 #include <string_view>
 #include <variant>
 
@@ -21,8 +22,9 @@ struct RedeemedFile {
 };
 
 struct ReplacedItem {
-  ObjectIdentity identity;  // what is the item now
+  ObjectIdentity identity;  // what is the item now; its contents and mode are on disk
   UsesInFlight::Use use;
+  UniqueDescriptor directory;  // of the item; that it is the item is not on disk yet
 };
 
 class TokenRedeemer {
@@ -35,8 +37,14 @@ class TokenRedeemer {
   // Whether the token is good now and names the file at that path, however the path is spelled. The file need not be there.
   [[nodiscard]] bool isFor(std::string_view token, const std::string& path) const;
 
+  // Why the token is not good now; none when it is. What it names is not looked at.
+  [[nodiscard]] std::optional<QXError> refusalOf(std::string_view token) const;
+
   // The item's new file has the permission bits of the old one.
   [[nodiscard]] std::variant<ReplacedItem, QXError> replaceItem(std::string_view itemToken, std::string_view siblingToken) const;
+
+  // The rest of a replacement. It ends the use first, for nothing of the token's is done any more.
+  [[nodiscard]] static std::optional<QXError> forceToDisk(ReplacedItem replaced);
 
  private:
   [[nodiscard]] std::variant<std::string, QXError> pathOf(std::string_view token) const;
