@@ -19,7 +19,6 @@ SystemCalls::~SystemCalls() { inForce = nullptr; }
 
 extern "C" {
 int __real_fsync(int);
-uid_t __real_geteuid();
 
 int __wrap_fsync(int descriptor) {
   auto* const calls = docuvend::linux_platform::testing::inForce;
@@ -29,10 +28,5 @@ int __wrap_fsync(int descriptor) {
     calls->beforeFlush = told;
   }
   return __real_fsync(descriptor);
-}
-
-uid_t __wrap_geteuid() {
-  auto* const calls = docuvend::linux_platform::testing::inForce;
-  return calls != nullptr && calls->effectiveUser ? *calls->effectiveUser : __real_geteuid();
 }
 }

@@ -1,11 +1,8 @@
-// Stands between this test program and two of the system's calls (--wrap in CMakeLists.txt). One object is in force at a time; calls of
+// Stands between this test program and one of the system's calls (--wrap in CMakeLists.txt). One object is in force at a time; calls of
 // every thread count, so it is made and goes while no other thread is at work.
 #pragma once
 
-#include <sys/types.h>
-
 #include <functional>
-#include <optional>
 
 namespace docuvend::linux_platform::testing {
 
@@ -18,8 +15,6 @@ class SystemCalls {
 
   // Before each flush of a file, until there is another; a flush within it is not told.
   std::function<void(int descriptor)> beforeFlush;
-  // Whom the process runs as, as far as it can see.
-  std::optional<uid_t> effectiveUser;
 };
 
 }  // namespace docuvend::linux_platform::testing

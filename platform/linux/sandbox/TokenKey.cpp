@@ -6,7 +6,7 @@
 #include <cerrno>
 #include <cstdlib>
 
-#include "platform/linux/sandbox/PrivateFile.h"
+#include "platform/linux/files/PrivateFile.h"
 
 namespace docuvend::linux_platform {
 namespace {

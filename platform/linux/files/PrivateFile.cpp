@@ -1,4 +1,4 @@
-#include "platform/linux/sandbox/PrivateFile.h"
+#include "platform/linux/files/PrivateFile.h"
 
 #include <fcntl.h>
 #include <sys/stat.h>

@@ -1,4 +1,4 @@
-#include "platform/linux/sandbox/PrivateFile.h"
+#include "platform/linux/files/PrivateFile.h"
 
 #include <gtest/gtest.h>
 #include <sys/stat.h>
@@ -8,8 +8,8 @@
 #include <filesystem>
 #include <string>
 
-#include "tests/sandbox/SandboxHouse.h"
-#include "tests/sandbox/SystemCalls.h"
+#include "tests/files/TemporaryDirectory.h"
+#include "tests/files/system_calls.h"
 
 namespace docuvend::linux_platform {
 namespace {
@@ -22,7 +22,7 @@ struct PrivateFile : ::testing::Test {
     EXPECT_EQ(std::get<QXError>(read).code, code) << std::get<QXError>(read).description();
   }
 
-  const testing::TemporaryDirectory directory;
+  const test::TemporaryDirectory directory;
   const std::string path = directory.path() + "/file";
 };
 
@@ -46,8 +46,8 @@ TEST_F(PrivateFile, IsMissingBeforeItIsWritten) { expectError(100, ENOENT); }
 
 TEST_F(PrivateFile, IsNotReadWhenItBelongsToAnother) {
   ASSERT_EQ(writePrivateFile(path, "text"), std::nullopt);
-  testing::SystemCalls calls;
-  calls.effectiveUser = ::geteuid() + 1;
+  test::SystemCalls calls;
+  calls.setEffectiveUser(::geteuid() + 1);
   expectError(100, EPERM);
 }
 
@@ -55,7 +55,7 @@ TEST_F(PrivateFile, TakesThePlaceOfWhateverIsThereButADirectory) {
   ASSERT_EQ(::mkfifo(path.c_str(), 0600), 0);
   expectError(100, EINVAL);
   EXPECT_EQ(writePrivateFile(path, "new"), std::nullopt);
-  EXPECT_EQ(testing::read(path), "new");
+  EXPECT_EQ(test::readText(path), "new");
   std::filesystem::remove(path);
   ASSERT_EQ(::mkdir(path.c_str(), 0700), 0);
   EXPECT_TRUE(writePrivateFile(path, "new"));

@@ -1,4 +1,4 @@
-// Small files of this user alone: the session's secrets, which nobody else may have read or written.
+// Small files of this user alone: secrets and records, which nobody else may have read or written.
 #pragma once
 
 #include <cstddef>
