@@ -22,6 +22,7 @@ namespace docuvend::linux_platform {
 class BundleHouse {
  public:
   BundleHouse() {
+    ::umask(022);  // others may not write bundles, or they are none
     std::string name = "/tmp/dvlXXXXXX";
     if (::mkdtemp(name.data()) == nullptr) throw std::runtime_error("no temporary directory");
     root_ = name;
@@ -31,6 +32,7 @@ class BundleHouse {
     paths.userBundles = share + "/bundles";
     paths.containers = share + "/containers";
     paths.groupContainers = share + "/groups";
+    paths.groupOwners = share + "/group-owners";
     paths.runtime = root_ + "/run/docuvend";
     paths.publicSockets = paths.runtime + "/public";
     paths.lockState = paths.runtime + "/lock-state";

@@ -23,8 +23,14 @@ TEST(BundleIdentifier, IsNothingThatCouldBeAnotherDirectoryOrAnOption) {
   }
 }
 
+TEST(BundleIdentifier, HasSeveralPartsWhenItHasADot) {
+  EXPECT_TRUE(hasSeveralParts("com.a"));
+  EXPECT_TRUE(hasSeveralParts("com.a.b"));
+  EXPECT_FALSE(hasSeveralParts("com"));
+}
+
 TEST(BundleIdentifier, ReachesToTheNextDot) {
-  EXPECT_TRUE(isBelowIdentifier("com.a", "com.a"));
+  EXPECT_FALSE(isBelowIdentifier("com.a", "com.a")) << "a group of that name would be of whoever takes it for an identifier";
   EXPECT_TRUE(isBelowIdentifier("com.a.documents", "com.a"));
   EXPECT_FALSE(isBelowIdentifier("com.ab", "com.a"));
   EXPECT_FALSE(isBelowIdentifier("com", "com.a"));

@@ -28,6 +28,7 @@ namespace {
 namespace fs = std::filesystem;
 using Outcome = InstalledBundle::Outcome;
 using ::testing::ElementsAre;
+using ::testing::EndsWith;
 using ::testing::HasSubstr;
 using ::testing::IsEmpty;
 
@@ -157,6 +158,57 @@ TEST_F(BundleInstallerTest, AnIdentifierOfTheSystemsIsRefused) {
   BundleHouse::install(house_.paths.systemBundles + "/anything", "org.a");
   fs::create_directories(house_.paths.userBundles);
   EXPECT_THAT(refusal(BundleErrorCode::notPermitted, source_), HasSubstr("org.a is the system's"));
+}
+
+TEST_F(BundleInstallerTest, ABundleThatClaimsWhatIsAnothersIsRefusedWithTheReason) {
+  const std::string docs = BundleHouse::entry("QXGroups", BundleHouse::array({"org.owner.one.docs"}));
+  const std::string list =
+      BundleHouse::entry("QXGroupMembers", "<dict><key>org.owner.one.docs</key>" + BundleHouse::array({"org.a"}) + "</dict>");
+  const std::string whose = " the group org.owner.one.docs, which is org.owner.one's.";
+  const auto expectRefused = [&](const std::string& where) {
+    for (const std::string& claimant : {std::string("org.a"), std::string("org.owner.one.docs"), std::string("org.owner")}) {
+      BundleHouse::install(source_, claimant, docs);
+      EXPECT_THAT(refusal(BundleErrorCode::notItsOwn, source_), EndsWith(": The bundle " + claimant + " may not belong to" + whose))
+          << where;
+    }
+    BundleHouse::install(source_, "org.a", list);
+    EXPECT_THAT(refusal(BundleErrorCode::notItsOwn, source_), EndsWith(": The bundle org.a may not name members of" + whose)) << where;
+  };
+  BundleHouse::install(user("owner"), "org.owner.one", docs);
+  expectRefused("nothing is recorded yet");
+  (void)house_.scan();
+  fs::remove_all(user("owner"));
+  expectRefused("only the record is left");
+  fs::remove(house_.paths.groupOwners + "/org.owner.one.docs");
+  BundleHouse::install(house_.paths.systemBundles + "/owner", "org.owner.one", docs);
+  expectRefused("the system's");
+}
+
+TEST_F(BundleInstallerTest, WhoIsNamedAsAMemberMayBeInstalledAndWhoWaitsForAnOwnerToo) {
+  const std::string docs = BundleHouse::entry("QXGroups", BundleHouse::array({"org.owner.docs"}));
+  BundleHouse::install(source_, "org.a", docs);
+  EXPECT_EQ(installed(source_).outcome, Outcome::installed) << "nobody owns it";
+  BundleHouse::install(user("owner"), "org.owner",
+                       BundleHouse::entry("QXGroupMembers", "<dict><key>org.owner.docs</key>" + BundleHouse::array({"org.a"}) + "</dict>"));
+  EXPECT_EQ(installed(source_).outcome, Outcome::updated);
+  EXPECT_EQ(house_.scan().at("org.a").groups.size(), 1U);
+}
+
+TEST_F(BundleInstallerTest, TheUsersDirectoryIsTheUsersAloneWhateverTheMask) {
+  const auto modeOf = [](const std::string& path) {
+    struct stat status {};
+    EXPECT_EQ(::stat(path.c_str(), &status), 0) << path;
+    return status.st_mode & 07777U;
+  };
+  const mode_t before = ::umask(0);
+  installed(source_);
+  ::umask(before);
+  EXPECT_EQ(modeOf(house_.paths.userBundles), 0700U);
+  EXPECT_EQ(modeOf(fs::path(house_.paths.userBundles).parent_path()), 0700U);
+  ::chmod(house_.paths.userBundles.c_str(), 0775);
+  installed(source_);
+  EXPECT_EQ(modeOf(house_.paths.userBundles), 0755U) << "closed to those who could write it";
+  EXPECT_TRUE(house_.scan().contains("org.a"));
 }
 
 TEST_F(BundleInstallerTest, WhatIsNoBundleIsRefusedWithTheReason) {

@@ -105,6 +105,11 @@ TEST_F(BundleParser, RefusesEntriesOfTheWrongKind) {
            {executable, "Info.plist has no string QXBundleIdentifier"},
            {executable + BundleHouse::entry("QXBundleIdentifier", "<integer>1</integer>"), "Info.plist has no string QXBundleIdentifier"},
            {executable + BundleHouse::entry("QXBundleIdentifier", BundleHouse::text("../a")), "its identifier is malformed"},
+           {executable + BundleHouse::entry("QXBundleIdentifier", BundleHouse::text("com")),
+            "its identifier has a single part and needs two or more, like org.name"},
+           {identifier + executable +
+                BundleHouse::entry("QXGroupMembers", "<dict><key>../org.b.one</key>" + BundleHouse::array({"org.c"}) + "</dict>"),
+            "QXGroupMembers has a malformed name"},
            {identifier, "Info.plist has no string QXBundleExecutable"},
            {identifier + BundleHouse::entry("QXBundleExecutable", "<true/>"), "Info.plist has no string QXBundleExecutable"},
            {identifier + BundleHouse::entry("QXBundleExecutable", BundleHouse::text("")), "Info.plist has no string QXBundleExecutable"},

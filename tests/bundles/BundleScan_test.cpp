@@ -136,7 +136,97 @@ TEST_F(BundleScanTest, GivesGroupContainersToMembersAlone) {
   EXPECT_THAT(bundles.at("org.owner").groups, ElementsAre(Pair("org.owner.docs", container)));
   EXPECT_THAT(bundles.at("org.member").groups, ElementsAre(Pair("org.owner.docs", container)));
   EXPECT_THAT(bundles.at("org.stranger").groups, IsEmpty());
-  EXPECT_THAT(house_.log.texts(), ElementsAre("[ERROR] The bundle org.stranger may not belong to the group org.owner.docs."));
+  EXPECT_THAT(house_.log.texts(),
+              ElementsAre("[ERROR] The bundle org.stranger may not belong to the group org.owner.docs, which is org.owner's."));
+}
+
+TEST_F(BundleScanTest, AGroupStaysItsFirstOwnersWhateverIsInstalledLater) {
+  const std::string docs = BundleHouse::entry("QXGroups", BundleHouse::array({"org.owner.one.docs"}));
+  const std::string line = " may not belong to the group org.owner.one.docs, which is org.owner.one's.";
+  BundleHouse::install(user("owner"), "org.owner.one", docs);
+  ASSERT_EQ(house_.scan().at("org.owner.one").groups.size(), 1U);
+  BundleHouse::install(user("equal"), "org.owner.one.docs", docs);
+  BundleHouse::install(system("shorter"), "org.owner", docs);
+  auto bundles = house_.scan();
+  EXPECT_EQ(bundles.at("org.owner.one").groups.size(), 1U);
+  EXPECT_THAT(bundles.at("org.owner.one.docs").groups, IsEmpty());
+  EXPECT_THAT(bundles.at("org.owner").groups, IsEmpty());
+  EXPECT_THAT(house_.log.texts(), ElementsAre("[ERROR] The bundle org.owner" + line, "[ERROR] The bundle org.owner.one.docs" + line));
+
+  fs::remove_all(user("owner"));
+  house_.log.clear();
+  bundles = house_.scan();
+  EXPECT_THAT(bundles.at("org.owner").groups, IsEmpty());
+  EXPECT_THAT(bundles.at("org.owner.one.docs").groups, IsEmpty());
+  EXPECT_EQ(house_.log.texts().size(), 2U);
+
+  BundleHouse::install(user("owner"), "org.owner.one", docs);
+  EXPECT_EQ(house_.scan().at("org.owner.one").groups.size(), 1U);
+  fs::remove_all(user("owner"));
+  fs::remove(house_.paths.groupOwners + "/org.owner.one.docs");
+  EXPECT_EQ(house_.scan().at("org.owner").groups.size(), 1U) << "given free";
+}
+
+TEST_F(BundleScanTest, AContainerFromBeforeThereWereRecordsGetsOneByTheNames) {
+  fs::create_directories(house_.paths.groupContainers + "/org.a.docs");
+  BundleHouse::install(user("a"), "org.a", BundleHouse::entry("QXGroups", BundleHouse::array({"org.a.docs", "org.a.docs"})));
+  EXPECT_EQ(house_.scan().at("org.a").groups.size(), 1U);
+  EXPECT_TRUE(fs::exists(house_.paths.groupOwners + "/org.a.docs"));
+  EXPECT_THAT(house_.log.texts(), IsEmpty());
+}
+
+TEST_F(BundleScanTest, AGroupWhoseOwnerCannotBeRecordedIsNobodys) {
+  BundleHouse::write(house_.paths.groupOwners, "in the way");
+  BundleHouse::install(user("a"), "org.a", BundleHouse::entry("QXGroups", BundleHouse::array({"org.a.docs"})));
+  EXPECT_THAT(house_.scan().at("org.a").groups, IsEmpty());
+  EXPECT_EQ(house_.log.texts().size(), 1U);
+}
+
+TEST_F(BundleScanTest, AWordAboutTheMembersOfAnothersGroupIsOneLineAndWorthNothing) {
+  const std::string docs = BundleHouse::entry("QXGroups", BundleHouse::array({"org.owner.docs"}));
+  BundleHouse::install(user("owner"), "org.owner", docs);
+  BundleHouse::install(
+      user("thief"), "org.thief",
+      BundleHouse::entry("QXGroupMembers", "<dict><key>org.owner.docs</key>" + BundleHouse::array({"org.thief"}) + "</dict>"));
+  EXPECT_EQ(house_.scan().at("org.owner").groups.size(), 1U);
+  EXPECT_THAT(house_.log.texts(),
+              ElementsAre("[ERROR] The bundle org.thief may not name members of the group org.owner.docs, which is org.owner's."));
+}
+
+TEST_F(BundleScanTest, WhatOthersCanWriteIsNoBundle) {
+  const std::string program = BundleHouse::entry("QXBundleExecutable", BundleHouse::text("bin/program"));
+  BundleHouse::install(user("a"), "org.a");
+  BundleHouse::write(user("a") + "/Info.plist",
+                     BundleHouse::propertyList(BundleHouse::entry("QXBundleIdentifier", BundleHouse::text("org.a")) + program));
+  BundleHouse::writeExecutable(user("a") + "/bin/program", "#!/bin/sh\n");
+  BundleHouse::write(user("a") + "/Entitlements.plist", BundleHouse::propertyList(""));
+  BundleHouse::install(system("b"), "org.b");
+  ASSERT_EQ(house_.scan().size(), 2U);
+  struct Case {
+    std::string path;
+    std::string line;
+    std::size_t left;
+  };
+  const std::string inA = "[ERROR] Ignoring the bundle at " + user("a") + ": it";
+  for (const auto& [path, line, left] : std::vector<Case>{
+           {user("a"), inA + " can be written by others.", 1},
+           {user("a") + "/Info.plist", inA + "s Info.plist can be written by others.", 1},
+           {user("a") + "/Entitlements.plist", inA + "s Entitlements.plist can be written by others.", 1},
+           {user("a") + "/bin", inA + "s bin can be written by others.", 1},
+           {user("a") + "/bin/program", inA + "s bin/program can be written by others.", 1},
+           {system("b"), "[ERROR] Ignoring the bundle at " + system("b") + ": it can be written by others.", 1},
+           {house_.paths.userBundles, "[ERROR] Ignoring the bundles in " + house_.paths.userBundles + ": it can be written by others.", 1},
+           {house_.paths.systemBundles, "[ERROR] Ignoring the bundles in " + house_.paths.systemBundles + ": it can be written by others.",
+            1}}) {
+    for (const auto others : {fs::perms::group_write, fs::perms::others_write}) {
+      house_.log.clear();
+      fs::permissions(path, others, fs::perm_options::add);
+      EXPECT_EQ(house_.scan().size(), left) << path;
+      EXPECT_THAT(house_.log.texts(), ElementsAre(line));
+      fs::permissions(path, others, fs::perm_options::remove);
+    }
+  }
+  EXPECT_EQ(house_.scan().size(), 2U);
 }
 
 TEST_F(BundleScanTest, ContainersAreRealPaths) {

@@ -13,6 +13,7 @@
 
 #include "platform/linux/bundles/BundleInstaller.h"
 #include "tests/bundles/BundleHouse.h"
+#include "tests/bundles/WatchRefusals.h"
 
 namespace docuvend::linux_platform {
 namespace {
@@ -281,6 +282,62 @@ TEST_F(InstalledBundlesTest, NoticesThatItsDirectoryIsReplaced) {
   EXPECT_TRUE(disappears("org.a"));
   BundleHouse::install(user("b"), "org.b");
   EXPECT_TRUE(appears("org.b"));
+}
+
+// What happens without watches is seen all the same, and when there are some again it is seen by them.
+class InstalledBundlesWithoutWatches : public InstalledBundlesTest,
+                                       public ::testing::WithParamInterface<std::atomic<bool> WatchRefusals::*> {
+ protected:
+  [[nodiscard]] long logged(const std::string& beginning) const {
+    const auto texts = house_.log.texts();
+    return std::count_if(texts.begin(), texts.end(), [&beginning](const std::string& text) { return text.starts_with(beginning); });
+  }
+
+  const std::string begins_ = "[ERROR] Not every bundle directory can be watched";
+  const std::string ends_ = "[NOTICE] Every bundle directory is watched again.";
+  WatchRefusals refusals_;
+};
+
+TEST_P(InstalledBundlesWithoutWatches, LooksNowAndThenAndSaysSoOnceUntilTheyAreBack) {
+  BundleHouse::install(user("a"), "org.a");
+  BundleHouse::write(user("a") + "/Entitlements.plist", BundleHouse::propertyList("<key>right</key><true/>"));
+  refusals_.*GetParam() = true;
+  start();
+  EXPECT_TRUE(bundles_->find("org.a"));
+  EXPECT_EQ(logged(begins_), 1);
+  std::filesystem::remove(user("a") + "/Entitlements.plist");
+  EXPECT_TRUE(changes_.waitFor([this] { return bundles_->find("org.a")->entitlements.empty(); }));
+  BundleHouse::install(user("b"), "org.b");
+  EXPECT_TRUE(appears("org.b"));
+  EXPECT_EQ(logged(begins_), 1) << "however often it looks";
+  EXPECT_EQ(logged(ends_), 0);
+
+  refusals_.*GetParam() = false;
+  EXPECT_TRUE(eventually([this] { return logged(ends_) == 1; }));
+  const int refused = refusals_.count;
+  for (const std::string& name : {std::string("c"), std::string("d")}) {
+    BundleHouse::install(user(name), "org." + name);
+    EXPECT_TRUE(appears("org." + name));
+  }
+  EXPECT_EQ(refusals_.count, refused);
+  EXPECT_EQ(logged(begins_), 1);
+  EXPECT_EQ(logged(ends_), 1);
+}
+
+INSTANTIATE_TEST_SUITE_P(OfEitherKind, InstalledBundlesWithoutWatches,
+                         ::testing::Values(&WatchRefusals::ofQueues, &WatchRefusals::ofWatches),
+                         [](const auto& tested) { return tested.param == &WatchRefusals::ofQueues ? "Queues" : "Watches"; });
+
+TEST_F(InstalledBundlesTest, AWatchThatIsRefusedLaterIsMadeUpForByLooks) {
+  std::filesystem::create_directories(house_.paths.userBundles);
+  WatchRefusals refusals;
+  start();
+  refusals.ofWatches = true;
+  BundleHouse::install(user("a"), "org.a");
+  ASSERT_TRUE(appears("org.a"));
+  BundleHouse::write(user("a") + "/Entitlements.plist", BundleHouse::propertyList("<key>right</key><true/>"));
+  EXPECT_TRUE(changes_.waitFor([this] { return !bundles_->find("org.a")->entitlements.empty(); }));
+  EXPECT_GT(refusals.count, 0);
 }
 
 TEST_F(InstalledBundlesTest, AnUpdateOfTheOwnerUpdatesItsGroupsMembers) {

@@ -64,6 +64,7 @@ TEST(Outcome, AKindOfFailureHasAStatusOfItsOwn) {
       {bundle(BundleErrorCode::notPermitted), ExitStatus::notPermitted},
       {bundle(BundleErrorCode::notFound), ExitStatus::notFound},
       {bundle(BundleErrorCode::inTheWay), ExitStatus::fileError},
+      {bundle(BundleErrorCode::notItsOwn), ExitStatus::notPermitted},
       {makeControlError(ControlErrorCode::usage, "x"), ExitStatus::usage},
       {makeControlError(ControlErrorCode::confined, "x"), ExitStatus::notPermitted},
       {foreign, ExitStatus::other},

@@ -21,6 +21,7 @@ ExitStatus statusOfBundleError(BundleErrorCode code) {
     case BundleErrorCode::tooLarge:
       return ExitStatus::invalidInput;
     case BundleErrorCode::notPermitted:
+    case BundleErrorCode::notItsOwn:
       return ExitStatus::notPermitted;
     case BundleErrorCode::notFound:
       return ExitStatus::notFound;

@@ -18,6 +18,7 @@ enum class BundleErrorCode : std::int64_t {
   notPermitted = 4,  // the system's directory has a bundle of that identifier
   notFound = 5,      // no bundle of that identifier is installed
   inTheWay = 6,      // something else lies where the bundle is to be put
+  notItsOwn = 7,     // it claims a group that is another bundle's
 };
 
 [[nodiscard]] inline QXError bundleError(BundleErrorCode code, std::string description) {

@@ -15,8 +15,10 @@ bool isBundleIdentifier(std::string_view text) {
   return text.find("..") == std::string_view::npos && std::all_of(text.begin(), text.end(), isAllowed);
 }
 
+bool hasSeveralParts(std::string_view identifier) { return identifier.find('.') != std::string_view::npos; }
+
 bool isBelowIdentifier(std::string_view name, std::string_view identifier) {
-  return name.starts_with(identifier) && (name.size() == identifier.size() || name[identifier.size()] == '.');
+  return name.size() > identifier.size() && name.starts_with(identifier) && name[identifier.size()] == '.';
 }
 
 }  // namespace docuvend::linux_platform

@@ -18,23 +18,24 @@
 #include "platform/linux/bundles/BundleErrors.h"
 #include "platform/linux/bundles/BundleParser.h"
 #include "platform/linux/bundles/BundleScan.h"
+#include "platform/linux/bundles/GroupMembership.h"
 #include "platform/linux/bundles/UserBundleDirectory.h"
 
 namespace docuvend::linux_platform {
 namespace {
 
 namespace fs = std::filesystem;
-using Identified = std::variant<std::string, QXError>;
+using Sound = std::variant<ParsedBundle, QXError>;
 
 std::string nameOf(const std::string& path) { return fs::path(path).filename().string(); }
 
-// The identifier of the bundle that lies there.
-Identified identify(const std::string& directory, const std::string& shownAs, QXPropertyLists& propertyLists) {
+// The bundle that lies there.
+Sound examine(const std::string& directory, const std::string& shownAs, QXPropertyLists& propertyLists) {
   auto parsed = parseBundle(directory, propertyLists);
   if (const auto* problem = std::get_if<BundleProblem>(&parsed)) {
     return bundleError(BundleErrorCode::noBundle, shownAs + " is no bundle: " + problem->text + ".");
   }
-  return std::get<ParsedBundle>(std::move(parsed)).bundle.identifier;
+  return std::get<ParsedBundle>(std::move(parsed));
 }
 
 // The names of the directories of `root` that hold a bundle of that identifier, the one that counts first.
@@ -51,6 +52,40 @@ std::vector<std::string> copiesOf(const std::string& identifier, const std::stri
 std::optional<QXError> refuseTheSystems(const std::string& identifier, const Paths& paths, QXPropertyLists& propertyLists) {
   if (copiesOf(identifier, paths.systemBundles, propertyLists).empty()) return std::nullopt;
   return bundleError(BundleErrorCode::notPermitted, "The bundle " + identifier + " is the system's; only the system changes it.");
+}
+
+// What would be installed beside the bundle, as the registry would take it.
+std::vector<ParsedBundle> bundlesWith(const ParsedBundle& bundle, const Paths& paths, QXPropertyLists& propertyLists) {
+  std::vector<ParsedBundle> result{bundle};
+  for (const auto& [root, origin] :
+       {std::pair(paths.systemBundles, BundleOrigin::system), std::pair(paths.userBundles, BundleOrigin::user)}) {
+    for (const std::string& directory : bundleDirectories(root)) {
+      auto parsed = parseBundle(directory, propertyLists);
+      auto* other = std::get_if<ParsedBundle>(&parsed);
+      if (other == nullptr) continue;
+      other->origin = origin;
+      const bool isNew = std::none_of(result.begin(), result.end(),
+                                      [other](const ParsedBundle& known) { return known.bundle.identifier == other->bundle.identifier; });
+      if (isNew && !distrustOf(*other)) result.push_back(std::move(*other));
+    }
+  }
+  return result;
+}
+
+std::optional<QXError> refuseWhatIsAnothers(const ParsedBundle& bundle, const Paths& paths, QXPropertyLists& propertyLists) {
+  const auto bundles = bundlesWith(bundle, paths, propertyLists);
+  const GroupOwners owners(paths.groupOwners);
+  const GroupMembership membership(bundles, owners);
+  for (const std::string& group : bundle.wantedGroups) {
+    const auto answer = membership.admit(bundle.bundle.identifier, group);
+    const auto* refusal = std::get_if<GroupMembership::Refusal>(&answer);
+    // Without an owner the bundle may wait for one.
+    if (refusal == nullptr || refusal->reason == GroupMembership::Refusal::Reason::noOwner) continue;
+    return bundleError(BundleErrorCode::notItsOwn, refusal->text + ".");
+  }
+  const auto lists = membership.foreignLists(bundle);
+  if (lists.empty()) return std::nullopt;
+  return bundleError(BundleErrorCode::notItsOwn, lists.front() + ".");
 }
 
 // A bundle's copy under a hidden name, and whatever else has taken that name; gone with the object.
@@ -106,8 +141,8 @@ std::variant<InstalledBundle, QXError> installBundle(const std::string& director
   const fs::path source = fs::canonical(directory, error);
   if (error) return bundleError(BundleErrorCode::noBundle, directory + " cannot be opened: " + error.message() + ".");
   // What can be refused at once is not copied first. What counts is the copy.
-  auto identified = identify(source.string(), directory, propertyLists);
-  if (auto* refusal = std::get_if<QXError>(&identified)) return std::move(*refusal);
+  auto examined = examine(source.string(), directory, propertyLists);
+  if (auto* refusal = std::get_if<QXError>(&examined)) return std::move(*refusal);
 
   auto opened = UserBundleDirectory::open(paths, UserBundleDirectory::Absence::isMended);
   if (auto* failure = std::get_if<QXError>(&opened)) return std::move(*failure);
@@ -116,11 +151,13 @@ std::variant<InstalledBundle, QXError> installBundle(const std::string& director
   if (auto* failure = std::get_if<QXError>(&hidden)) return std::move(*failure);
   const HiddenCopy copy(place, std::get<std::string>(std::move(hidden)));
   if (auto failure = copy.fill(source.string())) return *std::move(failure);
-  identified = identify(place.path() + "/" + copy.name(), directory, propertyLists);
-  if (auto* refusal = std::get_if<QXError>(&identified)) return std::move(*refusal);
+  examined = examine(place.path() + "/" + copy.name(), directory, propertyLists);
+  if (auto* refusal = std::get_if<QXError>(&examined)) return std::move(*refusal);
 
-  const auto& identifier = std::get<std::string>(identified);
+  const auto& bundle = std::get<ParsedBundle>(examined);
+  const std::string& identifier = bundle.bundle.identifier;
   if (auto refusal = refuseTheSystems(identifier, paths, propertyLists)) return *std::move(refusal);
+  if (auto refusal = refuseWhatIsAnothers(bundle, paths, propertyLists)) return *std::move(refusal);
   const auto older = copiesOf(identifier, place.path(), propertyLists);
   if (older.empty()) {
     const auto occupant = occupantOf(place.path() + "/" + identifier, propertyLists);

@@ -74,6 +74,7 @@ class Parser {
     const auto* identifier = qxFind<std::string>(result_.bundle.info, kIdentifierKey);
     if (identifier == nullptr) return problem("Info.plist has no string " + std::string(kIdentifierKey));
     if (!isBundleIdentifier(*identifier)) return problem("its identifier is malformed");
+    if (!hasSeveralParts(*identifier)) return problem("its identifier has a single part and needs two or more, like org.name");
     result_.bundle.identifier = *identifier;
     return std::nullopt;
   }
@@ -121,6 +122,7 @@ class Parser {
     const auto* groups = found->second.as<QXDictionary>();
     if (groups == nullptr) return problem(std::string(kGroupMembersKey) + " is not a dictionary");
     for (const auto& [group, members] : *groups) {
+      if (!isBundleIdentifier(group)) return problem(std::string(kGroupMembersKey) + " has a malformed name");
       if (auto wrong = takeStrings(members, kGroupMembersKey, result_.groupMembers[group])) return wrong;
     }
     return std::nullopt;

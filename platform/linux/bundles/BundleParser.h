@@ -11,9 +11,12 @@
 
 namespace docuvend::linux_platform {
 
+enum class BundleOrigin { system, user };
+
 // A bundle as its own files describe it. What depends on other bundles and on where containers lie is still empty in `bundle`.
 struct ParsedBundle {
   Bundle bundle;
+  BundleOrigin origin = BundleOrigin::user;  // for who knows whose directory it lies in
   std::vector<std::string> wantedGroups;
   std::map<std::string, std::vector<std::string>, std::less<>> groupMembers;  // group to identifiers of other bundles
 };

@@ -1,10 +1,13 @@
 #include "platform/linux/bundles/BundleScan.h"
 
+#include <sys/stat.h>
+
 #include <algorithm>
 #include <filesystem>
 #include <system_error>
+#include <utility>
 
-#include "platform/linux/bundles/GroupMembership.h"
+#include "platform/linux/bundles/OwnDirectory.h"
 
 namespace docuvend::linux_platform {
 namespace {
@@ -30,7 +33,33 @@ std::string realPath(const std::string& path) {
   return error ? path : real.string();
 }
 
+TrustedOwner trustedOwnerOf(BundleOrigin origin) {
+  return origin == BundleOrigin::system ? TrustedOwner::thisUserOrRoot : TrustedOwner::thisUser;
+}
+
+// What is not there is nobody's.
+std::optional<std::string_view> distrustAt(const std::string& path, BundleOrigin origin) {
+  struct stat status {};
+  if (::lstat(path.c_str(), &status) != 0) return std::nullopt;
+  return distrust(status, trustedOwnerOf(origin));
+}
+
 }  // namespace
+
+std::optional<BundleProblem> distrustOf(const ParsedBundle& parsed) {
+  const std::string& directory = parsed.bundle.directory;
+  if (const auto why = distrustAt(directory, parsed.origin)) return BundleProblem{"it " + std::string(*why)};
+  std::vector<std::string> names = {"Info.plist", "Entitlements.plist"};
+  const std::string executable = parsed.bundle.executable.substr(directory.size() + 1);
+  for (std::size_t slash = executable.find('/'); slash != std::string::npos; slash = executable.find('/', slash + 1)) {
+    names.push_back(executable.substr(0, slash));
+  }
+  names.push_back(executable);
+  for (const std::string& name : names) {
+    if (const auto why = distrustAt(directory + "/" + name, parsed.origin)) return BundleProblem{"its " + name + " " + std::string(*why)};
+  }
+  return std::nullopt;
+}
 
 std::vector<std::string> bundleDirectories(const std::string& root) {
   std::vector<std::string> result;
@@ -61,14 +90,20 @@ BundleMap BundleScan::run(const std::set<std::string>& unsettled) {
   found_.clear();
   reported_.clear();
   const auto lastParsed = std::exchange(parsed_, {});
-  scanDirectory(paths_.systemBundles, unsettled, lastParsed);
-  scanDirectory(paths_.userBundles, unsettled, lastParsed);
+  scanDirectory(paths_.systemBundles, BundleOrigin::system, unsettled, lastParsed);
+  scanDirectory(paths_.userBundles, BundleOrigin::user, unsettled, lastParsed);
   BundleMap result = resolve();
   lastReported_ = std::move(reported_);
   return result;
 }
 
-void BundleScan::scanDirectory(const std::string& root, const std::set<std::string>& unsettled, const Parsed& lastParsed) {
+void BundleScan::scanDirectory(const std::string& root, BundleOrigin origin, const std::set<std::string>& unsettled,
+                               const Parsed& lastParsed) {
+  const std::string real = realPath(root);
+  if (const auto why = distrustAt(real, origin)) {
+    report("[ERROR] Ignoring the bundles in " + real + ": it " + std::string(*why) + ".");
+    return;
+  }
   for (const auto& path : visibleEntries(root)) {
     std::error_code error;
     const auto type = fs::symlink_status(path, error).type();
@@ -81,7 +116,14 @@ void BundleScan::scanDirectory(const std::string& root, const std::set<std::stri
       continue;
     }
     auto parsed = parseBundle(path.string(), propertyLists_);
-    if (const auto* problem = std::get_if<BundleProblem>(&parsed)) {
+    std::optional<BundleProblem> problem;
+    if (auto* bundle = std::get_if<ParsedBundle>(&parsed)) {
+      bundle->origin = origin;
+      problem = distrustOf(*bundle);
+    } else {
+      problem = std::get<BundleProblem>(std::move(parsed));
+    }
+    if (problem) {
       report("[ERROR] Ignoring the bundle at " + path.string() + ": " + problem->text + ".");
     } else {
       add(std::get<ParsedBundle>(parsed));
@@ -103,20 +145,35 @@ void BundleScan::add(const ParsedBundle& parsed) {
 BundleMap BundleScan::resolve() {
   const std::string containers = realPath(paths_.containers);
   const std::string groupContainers = realPath(paths_.groupContainers);
+  const GroupMembership membership(found_, owners_);
   BundleMap result;
   for (const auto& parsed : found_) {
     Bundle bundle = parsed.bundle;
     bundle.container = containers + "/" + bundle.identifier;
     for (const auto& group : parsed.wantedGroups) {
-      if (mayBelongToGroup(bundle.identifier, group, found_)) {
-        if (bundle.groups.try_emplace(group, groupContainers + "/" + group).second) bundle.version += "/" + group;
-      } else {
-        report("[ERROR] The bundle " + bundle.identifier + " may not belong to the group " + group + ".");
-      }
+      if (!gives(membership.admit(bundle.identifier, group), group)) continue;
+      if (bundle.groups.try_emplace(group, groupContainers + "/" + group).second) bundle.version += "/" + group;
     }
+    for (const auto& list : membership.foreignLists(parsed)) report("[ERROR] " + list + ".");
     result.emplace(bundle.identifier, std::move(bundle));
   }
   return result;
+}
+
+// Another process may have recorded another owner meanwhile; then it is not given, and the next look tells.
+bool BundleScan::gives(const GroupMembership::Answer& answer, const std::string& group) {
+  if (const auto* refusal = std::get_if<GroupMembership::Refusal>(&answer)) {
+    report("[ERROR] " + refusal->text + ".");
+    return false;
+  }
+  const auto& admission = std::get<GroupMembership::Admission>(answer);
+  if (admission.isRecorded) return true;
+  const auto recorded = owners_.record(group, admission.owner);
+  if (const auto* error = std::get_if<QXError>(&recorded)) {
+    report("[ERROR] Nobody gets the group " + group + ", because its owner cannot be recorded: " + error->description());
+    return false;
+  }
+  return std::get<std::string>(recorded) == admission.owner;
 }
 
 void BundleScan::report(const std::string& text) {

@@ -2,12 +2,15 @@
 #pragma once
 
 #include <map>
+#include <optional>
 #include <set>
 #include <string>
 #include <vector>
 
 #include "platform/linux/base/Paths.h"
 #include "platform/linux/bundles/BundleParser.h"
+#include "platform/linux/bundles/GroupMembership.h"
+#include "platform/linux/bundles/GroupOwners.h"
 #include "platform/log.h"
 
 namespace docuvend::linux_platform {
@@ -18,23 +21,26 @@ using BundleMap = std::map<std::string, Bundle, std::less<>>;
 class BundleScan {
  public:
   BundleScan(const Paths& paths, QXPropertyLists& propertyLists, QXLogHandle& log)
-      : paths_(paths), propertyLists_(propertyLists), log_(log) {}
+      : paths_(paths), owners_(paths.groupOwners), propertyLists_(propertyLists), log_(log) {}
 
   // Every sound bundle of the system's and then of the user's directory. Of several with one identifier the system's wins, then the
   // first by name of directory. Directories whose name begins with "." are not looked at: an installer copies under such a name, then
-  // renames. Links are no bundles. Creates nothing. A directory of `unsettled` is not read: it counts as what the last look found there,
-  // and as nothing if that was no bundle.
+  // renames. Links are no bundles, nor is what another user owns or can write (distrustOf). A directory of `unsettled` is not read: it
+  // counts as what the last look found there, and as nothing if that was no bundle. Creates nothing but the records of groups that are
+  // given out for the first time (GroupOwners.h); a group whose record cannot be made is given to nobody.
   [[nodiscard]] BundleMap run(const std::set<std::string>& unsettled = {});
 
  private:
   using Parsed = std::map<std::string, ParsedBundle>;  // by directory
 
-  void scanDirectory(const std::string& root, const std::set<std::string>& unsettled, const Parsed& lastParsed);
+  void scanDirectory(const std::string& root, BundleOrigin origin, const std::set<std::string>& unsettled, const Parsed& lastParsed);
   void add(const ParsedBundle& parsed);
   [[nodiscard]] BundleMap resolve();
+  [[nodiscard]] bool gives(const GroupMembership::Answer& answer, const std::string& group);
   void report(const std::string& text);
 
   const Paths paths_;
+  const GroupOwners owners_;
   QXPropertyLists& propertyLists_;
   QXLogHandle& log_;
 
@@ -43,6 +49,10 @@ class BundleScan {
   std::set<std::string> reported_;      // by the look that is going on
   std::set<std::string> lastReported_;  // by the one before
 };
+
+// Why what the bundle is known by, its property lists, its program and the directories on the way to them, may be another user's work, in
+// one line. A bundle of the system's may be root's.
+[[nodiscard]] std::optional<BundleProblem> distrustOf(const ParsedBundle& parsed);
 
 // The real paths of the directories directly below `root` that may be bundles, in order of name.
 [[nodiscard]] std::vector<std::string> bundleDirectories(const std::string& root);

@@ -22,9 +22,8 @@ bool isAbsent(int error) { return error == ENOENT || error == ENOTDIR; }
 
 }  // namespace
 
-DirectoryWatch::DirectoryWatch() : queue_(::inotify_init1(IN_CLOEXEC | IN_NONBLOCK)) {}
-
 bool DirectoryWatch::watch(const std::vector<std::string>& whole) {
+  if (!queue_) queue_.reset(::inotify_init1(IN_CLOEXEC | IN_NONBLOCK));
   if (!queue_) return false;
   wanted_.clear();
   bool complete = true;
@@ -70,6 +69,7 @@ bool DirectoryWatch::add(const std::string& path, unsigned mask, const std::stri
 
 std::vector<DirectoryChange> DirectoryWatch::takeChanges() {
   std::vector<DirectoryChange> changes;
+  if (!queue_) return changes;
   alignas(inotify_event) std::array<char, 16384> bytes{};
   for (;;) {
     const ssize_t count = ::read(queue_.get(), bytes.data(), bytes.size());

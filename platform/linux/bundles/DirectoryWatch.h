@@ -25,13 +25,12 @@ struct DirectoryChange {
 // Used by one thread.
 class DirectoryWatch {
  public:
-  DirectoryWatch();
-
-  // Becomes readable when there are events; -1 when the kernel gave no watch.
+  // Becomes readable when there are events; -1 as long as the kernel has given no queue for them.
   [[nodiscard]] int descriptor() const { return queue_.get(); }
 
   // From now on watches what happens directly in each directory of `whole`, and whether the directories of `whole` come and go, however
-  // much of their paths exists. False when the kernel refused a watch on something that exists.
+  // much of their paths exists. False when the kernel refused the queue, or a watch on something that exists: a user has so many of both,
+  // and any process may have taken them. Another call asks again.
   [[nodiscard]] bool watch(const std::vector<std::string>& whole);
 
   // Takes every event that waits; those that matter, in their order. When an entry that is itself watched came or went, nothing more is

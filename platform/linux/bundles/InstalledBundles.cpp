@@ -1,5 +1,8 @@
 // Watches are set before the directories are read, so that what changes while they are read leads to another look. A directory that appears
 // is watched at once, not only when it is looked at, so that it is known how long nothing has been written there.
+//
+// Every look asks for the watches anew. As long as they are not complete a look is due some time after the last one, whatever was heard;
+// the first look with all of them sees what was missed before.
 #include "platform/linux/bundles/InstalledBundles.h"
 
 #include <poll.h>
@@ -38,9 +41,10 @@ InstalledBundles::InstalledBundles(const Paths& paths, QXPropertyLists& property
       stop_(::eventfd(0, EFD_CLOEXEC)),
       roots_{Root{paths.systemBundles, {}}, Root{paths.userBundles, {}}},
       scan_(paths, propertyLists, log) {
+  lastLook_ = Clock::now();
   renewWatch();
   bundles_ = std::make_shared<const BundleMap>(scan_.run());
-  if (stop_ && watch_.descriptor() >= 0) thread_ = std::thread([this] { run(); });  // joined by the destructor
+  if (stop_) thread_ = std::thread([this] { run(); });  // joined by the destructor
 }
 
 InstalledBundles::~InstalledBundles() {
@@ -73,17 +77,24 @@ void InstalledBundles::onChange(std::function<void()> callback) {
 void InstalledBundles::run() {
   while (waitForEvents()) {
     takeChanges();
-    const auto nextLook = settling_.nextLook();
-    if (nextLook && *nextLook <= Clock::now()) lookAgain();
+    const auto next = nextLook();
+    if (next && *next <= Clock::now()) lookAgain();
   }
+}
+
+std::optional<Settling::Time> InstalledBundles::nextLook() const {
+  const auto settled = settling_.nextLook();
+  if (watchIsComplete_) return settled;
+  const Settling::Time unwatched = lastLook_ + kLookWithoutWatch;
+  return settled ? std::min(*settled, unwatched) : unwatched;
 }
 
 // Until something happens or the time for a look has come. False when the registry is to end.
 bool InstalledBundles::waitForEvents() {
   std::array<pollfd, 2> waiting = {pollfd{stop_.get(), POLLIN, 0}, pollfd{watch_.descriptor(), POLLIN, 0}};
   int timeout = kForEver;
-  if (const auto nextLook = settling_.nextLook()) {
-    const auto left = std::chrono::ceil<std::chrono::milliseconds>(*nextLook - Clock::now()).count();
+  if (const auto next = nextLook()) {
+    const auto left = std::chrono::ceil<std::chrono::milliseconds>(*next - Clock::now()).count();
     timeout = static_cast<int>(std::max<std::int64_t>(left, 0));
   }
   while (::poll(waiting.data(), waiting.size(), timeout) < 0 && errno == EINTR) {
@@ -132,6 +143,7 @@ std::string InstalledBundles::bundleAround(const std::string& path) const {
 void InstalledBundles::lookAgain() {
   renewWatch();
   const auto began = Clock::now();
+  lastLook_ = began;
   auto looked = std::make_shared<const BundleMap>(scan_.run(settling_.unsettled(began)));
   std::vector<std::function<void()>> callbacks;
   bool isChanged = false;
@@ -172,10 +184,14 @@ void InstalledBundles::renewWatch() {
     if (present == directories) break;
     directories = std::move(present);
   }
-  if (!isComplete && watchIsComplete_ && log_.isEnabled(QXLogType::fault)) {
-    log_.write(QXLogType::fault, "[ERROR] Not every bundle directory can be watched; changes there are seen late or not at all.");
-  }
+  if (isComplete == watchIsComplete_) return;
   watchIsComplete_ = isComplete;
+  if (isComplete) {
+    log_.write(QXLogType::defaultType, "[NOTICE] Every bundle directory is watched again.");
+  } else {
+    log_.write(QXLogType::fault, "[ERROR] Not every bundle directory can be watched, so they are looked at every " +
+                                     std::to_string(kLookWithoutWatch.count()) + " seconds.");
+  }
 }
 
 }  // namespace docuvend::linux_platform

@@ -6,9 +6,13 @@
 // bundle that was seen is written to, it counts as it was; its files are those on disk, so a process started from it meanwhile may find a
 // program that does not run yet, and the process of the version after that is another. Changes deeper in a bundle than
 // kMostBundleDirectories reach are not noticed.
+//
+// When the kernel has no watch to give, of which a user has only so many, the directories are looked at every kLookWithoutWatch until it
+// has; the log says when that begins and when it is over. Meanwhile a bundle that is written in place may be seen in part.
 #pragma once
 
 #include <array>
+#include <chrono>
 #include <functional>
 #include <memory>
 #include <mutex>
@@ -25,6 +29,8 @@
 #include "platform/linux/bundles/Settling.h"
 
 namespace docuvend::linux_platform {
+
+inline constexpr std::chrono::seconds kLookWithoutWatch{3};
 
 // The property lists and the log outlive it. The first look is over when the constructor returns.
 class InstalledBundles final : public BundleRegistry {
@@ -46,6 +52,7 @@ class InstalledBundles final : public BundleRegistry {
 
   void run();
   [[nodiscard]] bool waitForEvents();
+  [[nodiscard]] std::optional<Settling::Time> nextLook() const;
   void takeChanges();
   void lookAgain();
   void renewWatch();
@@ -63,6 +70,7 @@ class InstalledBundles final : public BundleRegistry {
   DirectoryWatch watch_;
   Settling settling_;
   bool watchIsComplete_ = true;
+  Settling::Time lastLook_;
 
   std::mutex mutex_;
   std::shared_ptr<const BundleMap> bundles_;      // guarded by mutex_; the map itself never changes

@@ -13,6 +13,8 @@
 #include <string_view>
 #include <system_error>
 
+#include "platform/linux/bundles/OwnDirectory.h"
+
 namespace docuvend::linux_platform {
 namespace {
 
@@ -21,7 +23,19 @@ namespace fs = std::filesystem;
 // Not the beginning of names that people give.
 constexpr std::string_view kHiddenPrefix = ".docuvend-install-";
 
+constexpr mode_t kNotWritableByOthers = 07755;
+
 QXError failure(const std::string& what) { return QXError::system(errno, what); }
+
+// The registry ignores a directory that others can write, as a lax mask may have left it.
+std::optional<QXError> closeToOthers(const UniqueDescriptor& directory, const std::string& path) {
+  struct stat status {};
+  if (::fstat(directory.get(), &status) != 0) return failure("cannot examine " + path);
+  if (status.st_uid != ::geteuid()) return QXError::system(EPERM, path + " belongs to another user");
+  if (!distrust(status, TrustedOwner::thisUser)) return std::nullopt;
+  if (::fchmod(directory.get(), status.st_mode & kNotWritableByOthers) != 0) return failure("cannot close " + path + " to others");
+  return std::nullopt;
+}
 
 // A directory that its owner may not write can be removed only after he may.
 void makeRemovable(const fs::path& path) {
@@ -35,14 +49,15 @@ void makeRemovable(const fs::path& path) {
 
 std::variant<UserBundleDirectory, QXError> UserBundleDirectory::open(const Paths& paths, Absence absence) {
   std::error_code error;
-  if (absence == Absence::isMended) {
-    fs::create_directories(paths.userBundles, error);
-    if (error) return QXError::system(error.value(), "cannot make " + paths.userBundles);
+  if (absence == Absence::isMended && !fs::exists(paths.userBundles, error)) {
+    const auto made = makeOwnDirectory(paths.userBundles);
+    if (const auto* failed = std::get_if<QXError>(&made)) return *failed;
   }
   const fs::path real = fs::canonical(paths.userBundles, error);
   if (error) return QXError::system(error.value(), "cannot find " + paths.userBundles);
   UniqueDescriptor directory(::open(real.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC));
   if (!directory) return failure("cannot open " + real.string());
+  if (auto failed = closeToOthers(directory, real.string())) return *std::move(failed);
   while (::flock(directory.get(), LOCK_EX) != 0) {
     if (errno != EINTR) return failure("cannot lock " + real.string());
   }

@@ -2,7 +2,6 @@
 
 #include <fcntl.h>
 #include <sys/mman.h>
-#include <sys/stat.h>
 #include <unistd.h>
 
 #include <algorithm>
@@ -13,6 +12,7 @@
 #include <string_view>
 
 #include "platform/linux/base/confinement.h"
+#include "platform/linux/bundles/OwnDirectory.h"
 #include "platform/linux/launch/HostLayout.h"
 #include "platform/linux/launch/LaunchArguments.h"
 #include "platform/linux/launch/LaunchDescription.h"
@@ -21,7 +21,6 @@
 namespace docuvend::linux_platform {
 namespace {
 
-constexpr mode_t kOwnerOnly = 0700;
 constexpr int kDescriptionNumber = kExtensionSocketNumber + 1;
 constexpr int kFirstInherited = 3;
 constexpr const char* kProgramPath = "/usr/local/bin:/usr/bin:/bin";
@@ -39,22 +38,6 @@ PathResult canonical(const std::string& path) {
   return std::string(resolved.get());
 }
 
-// Makes the directory and its parents; what exists must be this user's own directory, not a link to one.
-PathResult makeDirectory(const std::string& path) {
-  for (std::size_t slash = path.find('/', 1);; slash = path.find('/', slash + 1)) {
-    const std::string prefix = path.substr(0, slash);
-    if (::mkdir(prefix.c_str(), kOwnerOnly) != 0 && errno != EEXIST && ::access(prefix.c_str(), F_OK) != 0) {
-      return failure("cannot create " + prefix);
-    }
-    if (slash == std::string::npos) break;
-  }
-  struct stat status {};
-  if (::lstat(path.c_str(), &status) != 0) return failure("cannot examine " + path);
-  if (!S_ISDIR(status.st_mode)) return QXError::system(ENOTDIR, path + " is no directory");
-  if (status.st_uid != ::geteuid()) return QXError::system(EPERM, path + " belongs to another user");
-  return canonical(path);
-}
-
 // Everything the subject needs on disk; its paths are canonical then.
 std::optional<QXError> prepareDirectories(const Bundle& bundle, const Paths& paths, LaunchSubject& subject) {
   const auto keep = [](PathResult result, std::string& place) -> std::optional<QXError> {
@@ -67,9 +50,9 @@ std::optional<QXError> prepareDirectories(const Bundle& bundle, const Paths& pat
   if (!subject.executable.starts_with(subject.bundleDirectory + "/")) {
     return QXError::system(EPERM, "the executable of " + bundle.identifier + " lies outside its bundle");
   }
-  if (auto error = keep(makeDirectory(bundle.container), subject.container)) return error;
+  if (auto error = keep(makeOwnDirectory(bundle.container), subject.container)) return error;
   for (const auto& [group, directory] : bundle.groups) {
-    if (auto error = keep(makeDirectory(directory), subject.groups.emplace_back())) return error;
+    if (auto error = keep(makeOwnDirectory(directory), subject.groups.emplace_back())) return error;
   }
   if (subject.kind == LaunchKind::extension) return std::nullopt;
   if (auto error = prepareRuntimeDirectories(paths)) return error;
