@@ -36,10 +36,13 @@ function(docuvend_room name)
   endif()
 endfunction()
 
-# docuvend_tests(NAME [DEPS target...] [NEEDS target...]): the program NAME_tests of all *_test.cpp in this folder, each test a process of its
-# own. NEEDS are programs that the tests start.
+# docuvend_tests(NAME [DEPS target...] [NEEDS target...] [TIMEOUT seconds]): the program NAME_tests of all *_test.cpp in this folder, each
+# test a process of its own. NEEDS are programs that the tests start.
 function(docuvend_tests name)
-  cmake_parse_arguments(TESTS "" "" "DEPS;NEEDS" ${ARGN})
+  cmake_parse_arguments(TESTS "" "TIMEOUT" "DEPS;NEEDS" ${ARGN})
+  if(NOT TESTS_TIMEOUT)
+    set(TESTS_TIMEOUT 120)
+  endif()
   file(GLOB sources CONFIGURE_DEPENDS *.cpp)
   add_executable(${name}_tests ${sources})
   target_include_directories(${name}_tests PRIVATE ${CMAKE_SOURCE_DIR})
@@ -48,5 +51,5 @@ function(docuvend_tests name)
   if(TESTS_NEEDS)
     add_dependencies(${name}_tests ${TESTS_NEEDS})
   endif()
-  gtest_discover_tests(${name}_tests TEST_PREFIX "${name}." PROPERTIES TIMEOUT 120 DISCOVERY_TIMEOUT 60)
+  gtest_discover_tests(${name}_tests TEST_PREFIX "${name}." PROPERTIES TIMEOUT ${TESTS_TIMEOUT} DISCOVERY_TIMEOUT 60)
 endfunction()

@@ -21,6 +21,8 @@
 #include <string_view>
 #include <thread>
 
+#include "platform/fake/AssertedMessages.h"
+
 namespace docuvend::tests {
 namespace {
 
@@ -229,7 +231,9 @@ int count(const std::vector<std::string>& lines, Match match) {
 }  // namespace
 
 int DaemonHouse::logged(const std::string& text) const {
-  return count(log(), [&text](const std::string& line) { return line == text; });
+  const int times = count(log(), [&text](const std::string& line) { return line == text; });
+  if (const auto type = fake_platform::typeOfLevel(text); type && times > 0) fake_platform::noteAsserted({*type, text});
+  return times;
 }
 
 int DaemonHouse::loggedBeginning(const std::string& text) const {

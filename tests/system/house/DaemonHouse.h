@@ -89,7 +89,7 @@ class DaemonHouse {
 
   // The messages of all daemons so far, without what stands before them.
   [[nodiscard]] std::vector<std::string> log() const;
-  // How many messages are that text; those that begin with it; those that contain it.
+  // How many messages are that text (which asserts it, AssertedMessages.h); those that begin with it; those that contain it.
   [[nodiscard]] int logged(const std::string& text) const;
   [[nodiscard]] int loggedBeginning(const std::string& text) const;
   [[nodiscard]] int loggedContaining(const std::string& text) const;
