@@ -25,7 +25,8 @@ inline std::string inAProcess(const std::function<std::string()>& work) {
   if (child == 0) {
     ::alarm(kLongestWork);
     ::dup2(pipe[1], STDERR_FILENO);
-    const std::string answer = work();
+    // Nothing gets past here: the tests that come next are not for this process.
+    const std::string answer = [&work]() noexcept { return work(); }();
     const auto written = ::write(STDERR_FILENO, answer.data(), answer.size());
     ::_exit(written == static_cast<ssize_t>(answer.size()) ? 0 : 1);
   }

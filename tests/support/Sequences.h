@@ -51,7 +51,7 @@ template <class Step>
 
 // How many: with seeds that are the same in every run, and with one that each run chooses and prints.
 struct SequenceCounts {
-  std::uint32_t fixed = kSanitized ? 200 : 2000;
+  std::uint32_t fixed = kSanitized ? 200 : 1500;
   std::uint32_t random = kSanitized ? 50 : 500;
 };
 

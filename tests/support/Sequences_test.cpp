@@ -5,6 +5,7 @@
 #include <gtest/gtest.h>
 
 #include <cstdlib>
+#include <stdexcept>
 
 namespace docuvend::tests {
 namespace {
@@ -50,6 +51,10 @@ TEST(InAProcess, AnEndOfTheProcessIsAnAnswer) {
               }),
               HasSubstr("ended by signal 9"));
   EXPECT_THAT(inAProcess([]() -> std::string { std::_Exit(3); }), HasSubstr("ended with 3"));
+}
+
+TEST(InAProcess, AnExceptionEndsTheProcess) {
+  EXPECT_THAT(inAProcess([]() -> std::string { throw std::runtime_error("no"); }), HasSubstr("ended by signal 6"));
 }
 
 TEST(InAProcess, NothingThatIsChangedThereIsChangedHere) {
