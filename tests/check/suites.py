@@ -1,7 +1,7 @@
 """Runs test programs of GoogleTest, each test as a process of its own and within limits.
 
 As a program: suites.py PROGRAM... runs every test of these programs, prints what failed, and at the end one line for each figure that tests
-print of themselves.
+print of themselves. A figure that none prints is a failure too.
 """
 
 import concurrent.futures
@@ -17,7 +17,7 @@ import time
 MEMORY_BYTES = 4 << 30
 OUTPUT_BYTES = 64 << 20
 KEPT_OUTPUT_BYTES = 1 << 20
-SECONDS_OF_A_TEST = 120
+SECONDS_OF_A_TEST = 900
 SECONDS_OF_A_LISTING = 60
 
 # What tests print, a line for each share of it, and the check sums up.
@@ -105,6 +105,9 @@ class Figures:
     def lines(self):
         return [figure.format(*self.sums[figure]) for figure in FIGURES if figure in self.sums]
 
+    def missing(self):
+        return [figure for figure in FIGURES if figure not in self.sums]
+
 
 def main(programs):
     figures = Figures()
@@ -118,7 +121,9 @@ def main(programs):
     print(f"check: {count - failures} of {count} tests passed")
     for line in figures.lines():
         print(line)
-    return 1 if failures else 0
+    for figure in figures.missing():
+        print(f"check: no test has printed a line like: {figure}")
+    return 1 if failures or figures.missing() else 0
 
 
 if __name__ == "__main__":

@@ -302,6 +302,12 @@ class TheSuites(unittest.TestCase):
         figures.read("[ RUN ]\nsequences tried 3\nmessages asserted 1 of 2\nnot sequences tried 5\n")
         figures.read("messages asserted 4 of 4\nsequences tried 2\n")
         self.assertEqual(figures.lines(), ["messages asserted 5 of 6", "sequences tried 5"])
+        self.assertEqual(figures.missing(), [])
+
+    def test_a_figure_that_no_test_prints_is_missing(self):
+        figures = suites.Figures()
+        figures.read("sequences tried 3\n")
+        self.assertEqual(figures.missing(), ["messages asserted {} of {}"])
 
 
 if __name__ == "__main__":
