@@ -22,6 +22,15 @@ std::string dvDescribe(std::span<const std::string_view> list) {
   return QXValue(std::move(array)).description();
 }
 
+std::string dvShortened(std::string text) {
+  if (text.size() <= kDVLongestLoggedValue) return text;
+  std::size_t length = kDVLongestLoggedValue;
+  const auto continuesCharacter = [&text](std::size_t at) { return (static_cast<unsigned char>(text[at]) & 0xC0U) == 0x80U; };
+  while (length > 0 && continuesCharacter(length)) --length;
+  text.resize(length);
+  return text.append("…");
+}
+
 std::string dvFormat(std::string_view format, std::span<const std::string> values) {
   std::string text;
   std::size_t next = 0;

@@ -4,7 +4,7 @@
 //
 // Every message begins with its level in brackets, and the level decides the log type: "[NOTICE]" default, "[INFO]" info, "[DEBUG]"
 // debug, "[ERROR]" fault. The level and the number of placeholders (%@ %s %d) are checked when the program is compiled. A message is
-// formatted only when its type is enabled. An absent value prints as "(null)".
+// formatted only when its type is enabled. An absent value prints as "(null)", and of a long one only the beginning is shown.
 #pragma once
 
 #include <array>
@@ -48,6 +48,12 @@ requires requires(const T& thing) {
 }
 [[nodiscard]] std::string dvDescribe(const std::shared_ptr<T>& value) { return value ? value->description() : "(null)"; }
 
+// Of one value in a message, in bytes: most values are what somebody else chose.
+inline constexpr std::size_t kDVLongestLoggedValue = 1024;
+
+// The text, or its beginning of whole characters and an ellipsis when it is longer than that.
+[[nodiscard]] std::string dvShortened(std::string text);
+
 // Puts the values in the places of the format's placeholders, in order.
 [[nodiscard]] std::string dvFormat(std::string_view format, std::span<const std::string> values);
 
@@ -79,7 +85,7 @@ template <class... Values>
 void dvLog(std::type_identity_t<DVLogFormat<Values...>> format, const Values&... values) {
   QXLogHandle& log = dv_default_log();
   if (!log.isEnabled(format.type)) return;
-  const std::array<std::string, sizeof...(Values)> texts = {dvDescribe(values)...};
+  const std::array<std::string, sizeof...(Values)> texts = {dvShortened(dvDescribe(values))...};
   log.write(format.type, dvFormat(format.text, texts));
 }
 

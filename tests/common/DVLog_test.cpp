@@ -52,6 +52,16 @@ TEST_F(DVLogTest, PlaceholdersAreReplacedInOrder) {
   EXPECT_THAT(platform.log.texts(), ElementsAre("[INFO] -[Class operation:] handles com.example.provider with 3 tries left, text."));
 }
 
+TEST_F(DVLogTest, OfALongValueTheBeginningIsShown) {
+  const std::string whole(kDVLongestLoggedValue, 'a');
+  dvLog("[NOTICE] %@ is not %@", whole, whole + "b");
+  // A character that the limit would divide is left out.
+  dvLog("[NOTICE] %@", whole.substr(1) + "é");
+  dvLog("[NOTICE] %@", ItemID{whole.substr(2) + "é"});
+  EXPECT_THAT(platform.log.texts(), ElementsAre("[NOTICE] " + whole + " is not " + whole + "…", "[NOTICE] " + whole.substr(1) + "…",
+                                                "[NOTICE] " + whole.substr(2) + "é"));
+}
+
 TEST_F(DVLogTest, AbsentValuesPrintAsNull) {
   dvLog("[INFO] %@ %@ %@ %@", std::optional<std::string>(), std::optional<QXError>(), std::optional<QXURL>(),
         std::shared_ptr<SelfDescribing>());

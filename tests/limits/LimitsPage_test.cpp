@@ -7,6 +7,7 @@
 #include <vector>
 
 #include "acl/DVGrantLimits.h"
+#include "common/DVLog.h"
 #include "daemon/DVGrantPage.h"
 #include "platform/linux/bundles/BundleIdentifier.h"
 #include "platform/linux/bundles/BundleScan.h"
@@ -18,6 +19,7 @@
 #include "platform/linux/files/property_list_scalars.h"
 #include "platform/linux/launch/LaunchArguments.h"
 #include "platform/linux/launch/LaunchDescription.h"
+#include "platform/linux/log/LogAllowance.h"
 #include "platform/linux/log/LogText.h"
 #include "platform/linux/rpc/ConnectionLimiter.h"
 #include "platform/linux/sandbox/RedemptionLedger.h"
@@ -81,7 +83,9 @@ std::vector<Limit> limits() {
           {"kExtensionMemory", kExtensionMemory.value_or(kMemoryWithoutSanitizer)},
           {"OutputLines::kLongestLine", OutputLines::kLongestLine},
           {"LineAllowance::kLinesOfAPeriod", LineAllowance::kLinesOfAPeriod},
-          {"kLongestLogText", kLongestLogText}};
+          {"kLongestLogText", kLongestLogText},
+          {"kDVLongestLoggedValue", kDVLongestLoggedValue},
+          {"LogAllowance::kLinesAtOnce", LogAllowance::kLinesAtOnce}};
 }
 
 std::vector<std::string> cellsOf(const std::string& row) {

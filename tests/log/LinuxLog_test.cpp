@@ -4,10 +4,14 @@
 #include <gtest/gtest.h>
 #include <sys/time.h>
 
+#include <algorithm>
+#include <chrono>
 #include <csignal>
 #include <cstdlib>
 #include <string>
 
+#include "platform/linux/base/LogSubject.h"
+#include "platform/linux/log/LogAllowance.h"
 #include "platform/linux/log/LogText.h"
 #include "tests/log/LogBench.h"
 
@@ -148,6 +152,53 @@ TEST_F(LinuxLogTest, AFullPipeThatDoesNotWaitAndAClosedDescriptorLoseTheEntry) {
   LinuxLog other(closed);
   other.defaultLog().write(QXLogType::fault, "[ERROR] lost");
   EXPECT_EQ(stream.read(), "");
+}
+
+TEST_F(LinuxLogTest, ASubjectsLinesThatAreAlwaysOnAreNoMoreThanItsAllowanceAndAllOthersAreWritten) {
+  ASSERT_GT(::fcntl(stream.writeEnd.get(), F_SETPIPE_SZ, 1 << 20), 0);
+  LinuxLogOptions some = options();
+  some.setting = "debug";
+  LinuxLog log(some);
+  constexpr std::size_t kMany = 4 * LogAllowance::kLinesAtOnce;
+  const auto began = std::chrono::steady_clock::now();
+  {
+    const LogSubject subject(std::make_shared<const std::string>("com.example.App"));
+    for (std::size_t i = 0; i < kMany; ++i) {
+      log.defaultLog().write(i % 2 == 0 ? QXLogType::fault : QXLogType::defaultType, "limited");
+      log.defaultLog().write(QXLogType::info, "asked for");
+      log.defaultLog().write(QXLogType::debug, "asked for");
+    }
+  }
+  const std::size_t back = (std::chrono::steady_clock::now() - began) / LogAllowance::kTimeForALine + 1;
+  for (std::size_t i = 0; i < kMany; ++i) log.defaultLog().write(QXLogType::fault, "the system's own");
+  const std::string text = stream.read();
+  const auto written = [&text](const std::string& line) {
+    std::size_t count = 0;
+    for (std::size_t at = text.find(line); at != std::string::npos; at = text.find(line, at + 1)) ++count;
+    return count;
+  };
+  EXPECT_GE(written("limited"), LogAllowance::kLinesAtOnce);
+  EXPECT_LE(written("limited"), LogAllowance::kLinesAtOnce + back);
+  EXPECT_EQ(written("asked for"), 2 * kMany);
+  EXPECT_EQ(written("the system's own"), kMany);
+}
+
+// The datagrams lie there unread until no more fit.
+TEST_F(LinuxLogTest, AJournalThatStandsStillIsWaitedForOnceAndNotForEveryLine) {
+  ASSERT_GT(::fcntl(stream.writeEnd.get(), F_SETPIPE_SZ, 1 << 20), 0);
+  LinuxLogOptions some = options();
+  some.journalStream = stream.deviceAndInode();
+  LinuxLog log(some);
+  constexpr int kLines = 400;
+  const auto began = std::chrono::steady_clock::now();
+  for (int i = 0; i < kLines; ++i) log.defaultLog().write(QXLogType::fault, "text");
+  const std::string text = stream.read();
+  const auto lost = std::count(text.begin(), text.end(), '\n');
+  EXPECT_GT(lost, 60) << "the journal took them all, or this test shows nothing";
+  EXPECT_EQ(static_cast<std::size_t>(lost) + journal.read().size(), static_cast<std::size_t>(kLines));
+  EXPECT_LT(std::chrono::steady_clock::now() - began, std::chrono::seconds(60)) << "a second for each";
+  log.defaultLog().write(QXLogType::fault, "text");
+  EXPECT_EQ(journal.read().size(), 1U) << "it is not given up";
 }
 
 // A line that waits for room in the pipe is interrupted again and again and still arrives whole.

@@ -15,6 +15,7 @@
 #include <thread>
 #include <vector>
 
+#include "platform/linux/base/LogSubject.h"
 #include "tests/queue/Arrivals.h"
 
 namespace docuvend::linux_platform {
@@ -46,6 +47,45 @@ TEST(LinuxQueues, AsynchronousReadersOfAConcurrentQueueOverlap) {
   for (int i = 0; i < 3; ++i) queue->async([&] { arrivals.arrive(meeting.attend() ? "met" : "alone"); });
   ASSERT_TRUE(arrivals.waitFor(3));
   EXPECT_THAT(arrivals.names(), ElementsAre("met", "met", "met"));
+}
+
+// Also when it is run by a thread that is at work for somebody else, and waits for its turn meanwhile.
+TEST(LinuxQueues, ATaskIsForWhomItsSubmitterWasAtWork) {
+  Arrivals arrivals;
+  const auto tell = [&arrivals] {
+    const auto subject = LogSubject::current();
+    arrivals.arrive(subject ? *subject : "nobody in particular");
+  };
+  LinuxQueues queues({2, 2});
+  const auto queue = queues.serialQueue("serial");
+  {
+    const LogSubject subject(std::make_shared<const std::string>("one"));
+    for (QXQueue* each : {queue.get(), &queues.globalQueue()}) {
+      each->async(tell);
+      each->barrierAsync(tell);
+      each->sync(tell);
+      each->after(1ms, tell);
+    }
+  }
+  ASSERT_TRUE(arrivals.waitFor(8));
+  EXPECT_THAT(arrivals.names(), testing::Each("one"));
+
+  const auto other = queues.serialQueue("other");
+  Arrivals others;
+  other->suspend();
+  for (int i = 0; i < 2; ++i) {
+    other->async([&others] {
+      const auto subject = LogSubject::current();
+      others.arrive(subject ? *subject : "nobody in particular");
+    });
+  }
+  std::thread waiting([&other, &others] {
+    const LogSubject subject(std::make_shared<const std::string>("two"));
+    other->sync([&others] { others.arrive(*LogSubject::current()); });
+  });
+  other->resume();
+  waiting.join();
+  EXPECT_THAT(others.names(), ElementsAre("nobody in particular", "nobody in particular", "two"));
 }
 
 TEST(LinuxQueues, SynchronousReadersOfAConcurrentQueueOverlap) {

@@ -8,6 +8,7 @@
 #include <string_view>
 #include <utility>
 
+#include "platform/linux/base/LogSubject.h"
 #include "platform/linux/log/LogText.h"
 
 namespace docuvend::linux_platform {
@@ -70,7 +71,26 @@ bool LinuxLog::Handle::isEnabled(QXLogType type) const {
 }
 
 void LinuxLog::Handle::write(QXLogType type, const std::string& message) {
-  if (!isEnabled(type)) return;
+  if (isEnabled(type) && isAllowed(type)) put(type, message);
+}
+
+bool LinuxLog::Handle::isAllowed(QXLogType type) {
+  const auto now = std::chrono::steady_clock::now();
+  const auto subject = type == QXLogType::defaultType || type == QXLogType::fault ? LogSubject::current() : nullptr;
+  std::vector<LogAllowance::LeftOut> counts;
+  bool allowed = true;
+  {
+    const std::lock_guard lock(mutex_);
+    counts = allowance_.dueCounts(now);
+    allowed = !subject || allowance_.line(*subject, now);
+  }
+  for (const auto& [name, lines] : counts) {
+    put(QXLogType::defaultType, "[NOTICE] " + std::to_string(lines) + " lines about " + name + " were left out.");
+  }
+  return allowed;
+}
+
+void LinuxLog::Handle::put(QXLogType type, const std::string& message) {
   const std::string text = visibleLogText(message);
   if (journal_ && journal_->write(type, text) == LogWritten::yes) return;
   stream_.write(text);

@@ -1,12 +1,15 @@
 // The log service on Linux: lines on standard error, or entries in the journal when the service manager has connected standard error to it.
 //
 // The log setting is the environment variable DOCUVEND_LOG, read once: "info" switches on the info type, "debug" info and debug; else
-// neither is on. Default and fault are always on.
+// neither is on. Default and fault are always on; of these, no subject's lines (LogSubject) are more than its allowance. Whoever switches
+// on the others wants all of them.
 #pragma once
 
+#include <mutex>
 #include <optional>
 #include <string>
 
+#include "platform/linux/log/LogAllowance.h"
 #include "platform/linux/log/LogSink.h"
 #include "platform/log.h"
 
@@ -37,10 +40,17 @@ class LinuxLog final : public QXLogService {
     void write(QXLogType type, const std::string& message) override;
 
    private:
+    // Whether a line that this thread writes is within what is allowed; tells what was left out before.
+    [[nodiscard]] bool isAllowed(QXLogType type);
+    void put(QXLogType type, const std::string& message);
+
     const bool isInfoEnabled_;
     const bool isDebugEnabled_;
     const StreamLogSink stream_;
     std::optional<JournalLogSink> journal_;
+
+    std::mutex mutex_;  // guards the allowance; nothing is written with it
+    LogAllowance allowance_;
   };
 
   Handle handle_;

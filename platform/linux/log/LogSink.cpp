@@ -16,6 +16,8 @@ namespace docuvend::linux_platform {
 namespace {
 
 constexpr timeval kLongestWaitForTheJournal{1, 0};
+// Nobody waits so long after somebody did in vain: a journal that stands still must not slow down every line.
+constexpr std::chrono::seconds kTimeBetweenWaits{60};
 
 // Keeps a broken pipe's signal from the calling thread, and takes back the one that its own writing caused.
 class WithoutPipeSignal {
@@ -91,10 +93,15 @@ LogWritten JournalLogSink::write(QXLogType type, std::string_view text) const {
   std::string entry = "PRIORITY=" + std::to_string(priorityOf(type)) + "\nSYSLOG_IDENTIFIER=" + identifier_ + "\nMESSAGE=";
   entry += text;
   entry += '\n';
+  const bool mayWait = std::chrono::steady_clock::now() >= waitsAgain_.load();
+  const int flags = mayWait ? MSG_NOSIGNAL : MSG_NOSIGNAL | MSG_DONTWAIT;
   ssize_t count = -1;
   do {
-    count = ::sendto(socket_.get(), entry.data(), entry.size(), MSG_NOSIGNAL, reinterpret_cast<const sockaddr*>(&address), sizeof address);
+    count = ::sendto(socket_.get(), entry.data(), entry.size(), flags, reinterpret_cast<const sockaddr*>(&address), sizeof address);
   } while (count < 0 && errno == EINTR);
+  if (count < 0 && mayWait && (errno == EAGAIN || errno == EWOULDBLOCK)) {
+    waitsAgain_ = std::chrono::steady_clock::now() + kTimeBetweenWaits;
+  }
   return count < 0 ? LogWritten::no : LogWritten::yes;
 }
 

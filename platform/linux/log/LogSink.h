@@ -1,6 +1,8 @@
 // Where log entries go. Nothing here fails its caller: what cannot be written is lost. All operations may be called from any thread.
 #pragma once
 
+#include <atomic>
+#include <chrono>
 #include <string>
 #include <string_view>
 
@@ -30,13 +32,14 @@ class JournalLogSink {
  public:
   JournalLogSink(std::string socketPath, std::string identifier);
 
-  // The text must be one line. Waits a bounded time for a journal that is behind.
+  // The text must be one line. Waits a bounded time for a journal that is behind, and after that a while not at all.
   [[nodiscard]] LogWritten write(QXLogType type, std::string_view text) const;
 
  private:
   const std::string socketPath_;
   const std::string identifier_;
   UniqueDescriptor socket_;
+  mutable std::atomic<std::chrono::steady_clock::time_point> waitsAgain_{};
 };
 
 }  // namespace docuvend::linux_platform

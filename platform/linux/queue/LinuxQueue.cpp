@@ -3,6 +3,7 @@
 #include <cassert>
 #include <utility>
 
+#include "platform/linux/base/LogSubject.h"
 #include "platform/linux/queue/CurrentQueue.h"
 
 namespace docuvend::linux_platform {
@@ -22,14 +23,16 @@ void LinuxQueue::sync(const QXTask& task) {
 }
 
 void LinuxQueue::after(std::chrono::nanoseconds delay, QXTask task) {
-  timer_->add(delay, [core = core_, task = std::move(task)]() mutable { core->submit(QueueAccess::shared, std::move(task)); });
+  timer_->add(delay, [core = core_, task = LogSubject::carrying(std::move(task))]() mutable {
+    core->submit(QueueAccess::shared, std::move(task));
+  });
 }
 
 LinuxGlobalQueue::LinuxGlobalQueue(std::shared_ptr<ThreadPool> pool, std::shared_ptr<QueueTimer> timer)
     : pool_(std::move(pool)), timer_(std::move(timer)) {}
 
 void LinuxGlobalQueue::async(QXTask task) {
-  pool_->submit([task = std::move(task)] {
+  pool_->submit([task = LogSubject::carrying(std::move(task))] {
     const CurrentQueue current(&kGlobalQueue, CurrentQueue::Chain::fresh);
     task();
   });
@@ -41,7 +44,9 @@ void LinuxGlobalQueue::sync(const QXTask& task) {
 }
 
 void LinuxGlobalQueue::after(std::chrono::nanoseconds delay, QXTask task) {
-  timer_->add(delay, [this, task = std::move(task)]() mutable { async(std::move(task)); });  // the timer stops before this queue goes
+  timer_->add(delay, [this, task = LogSubject::carrying(std::move(task))]() mutable {
+    async(std::move(task));
+  });  // the timer stops before this queue goes
 }
 
 void LinuxGlobalQueue::suspend() { assert(!"the global queue cannot be suspended"); }

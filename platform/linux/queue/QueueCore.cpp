@@ -46,7 +46,7 @@ QueueCore::QueueCore(std::string label, QueueKind kind, std::shared_ptr<ThreadPo
 void QueueCore::submit(QueueAccess access, QXTask task) {
   const std::lock_guard lock(mutex_);
   if (closed_) return;  // the caller's copy is destroyed after the lock
-  line_.push_back({kind_ == QueueKind::serial ? QueueAccess::exclusive : access, std::move(task), nullptr});
+  line_.push_back({kind_ == QueueKind::serial ? QueueAccess::exclusive : access, std::move(task), nullptr, LogSubject::current()});
   callFor(letIn());
 }
 
@@ -58,7 +58,7 @@ void QueueCore::sync(const QXTask& task) {
     enter(access);
   } else {
     Waiter waiter;
-    line_.push_back({access, {}, &waiter});
+    line_.push_back({access, {}, &waiter, {}});
     while (!waiter.isInside) waitOrHelp(lock, waiter);
   }
   lock.unlock();
@@ -138,6 +138,7 @@ std::size_t QueueCore::runReady(std::unique_lock<std::mutex>& lock, Entry entry)
   lock.unlock();
   {
     const CurrentQueue current(this, CurrentQueue::Chain::fresh);
+    const LogSubject subject(std::move(entry.subject));  // not that of a thread that helps
     runTask(entry.task);
     entry.task = {};  // what the task held is released as part of the task
   }

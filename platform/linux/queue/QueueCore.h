@@ -10,6 +10,7 @@
 #include <string>
 #include <vector>
 
+#include "platform/linux/base/LogSubject.h"
 #include "platform/linux/queue/ThreadPool.h"
 #include "platform/queue.h"
 
@@ -44,6 +45,7 @@ class QueueCore : public std::enable_shared_from_this<QueueCore> {
     QueueAccess access;
     QXTask task;     // empty for a waiter
     Waiter* waiter;  // lives on the stack of its `sync`
+    LogSubject::Name subject;
   };
 
   [[nodiscard]] bool admits(QueueAccess access) const;

@@ -401,10 +401,9 @@ Endpoint::State::Delivery Endpoint::State::write() {
   return writer_.pendingBytes() > kMaximumOutputBytes ? Delivery::overBound : Delivery::underway;
 }
 
-// One that finds nothing before it is let in whatever its length.
 bool Endpoint::State::hasRoomFor(const EncodedFrame& request) const {
-  const std::size_t before = writer_.pendingBytes();
-  return before == 0 || before + request.bytes.size() <= kMaximumOutputBeforeRequest;
+  static_assert(kMaximumOutputBeforeRequest > kFrameLengthBytes + kMaximumFrameBytes, "one that finds nothing before it has room");
+  return writer_.pendingBytes() + request.bytes.size() <= kMaximumOutputBeforeRequest;
 }
 
 void Endpoint::State::closeUnlessUnderway(Delivery delivery) {

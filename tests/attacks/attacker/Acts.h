@@ -32,6 +32,7 @@ using Acts = std::map<std::string, Act>;
 [[nodiscard]] Acts fileActs();
 [[nodiscard]] Acts surroundingsActs();
 [[nodiscard]] Acts pressureActs();
+[[nodiscard]] Acts floodActs();
 [[nodiscard]] Acts pretenceActs();
 [[nodiscard]] Acts mountActs();
 

@@ -148,14 +148,24 @@ UniqueDescriptor connected(const std::string& path) {
   return std::get<UniqueDescriptor>(std::move(socket));
 }
 
-std::string connectAndDie(const std::string& service) {
+}  // namespace
+
+UniqueDescriptor connectionOfTheDead(const std::string& service) {
   // Its descriptors are this process's.
   const auto child = static_cast<pid_t>(::syscall(SYS_clone, CLONE_FILES | SIGCHLD, nullptr, nullptr, nullptr, nullptr));
   if (child == 0) ::_exit(connected(publicSocket(service)).release());
   int status = 0;
   constexpr int kNone = 255;
-  if (::waitpid(child, &status, 0) != child || !WIFEXITED(status) || WEXITSTATUS(status) == kNone) return "the child has no connection";
-  setAside(UniqueDescriptor(WEXITSTATUS(status)));
+  if (::waitpid(child, &status, 0) != child || !WIFEXITED(status) || WEXITSTATUS(status) == kNone) return {};
+  return UniqueDescriptor(WEXITSTATUS(status));
+}
+
+namespace {
+
+std::string connectAndDie(const std::string& service) {
+  auto connection = connectionOfTheDead(service);
+  if (!connection) return "the child has no connection";
+  setAside(std::move(connection));
   return "ok";
 }
 

@@ -18,6 +18,9 @@ using tests::told;
 void setAside(linux_platform::UniqueDescriptor connection);
 [[nodiscard]] linux_platform::UniqueDescriptor takeSetAside();
 
+// A connection made by a child of this process that has ended since; none when there is none.
+[[nodiscard]] linux_platform::UniqueDescriptor connectionOfTheDead(const std::string& service);
+
 [[nodiscard]] Acts requestActs();
 
 }  // namespace docuvend::attacker

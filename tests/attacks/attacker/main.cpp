@@ -47,6 +47,7 @@ int main(int count, char** arguments) {
   add(acts, fileActs());
   add(acts, surroundingsActs());
   add(acts, pressureActs());
+  add(acts, floodActs());
   add(acts, pretenceActs());
   add(acts, mountActs());
   const bool isExtension = count == 1;
