@@ -3,6 +3,7 @@
 #include <cerrno>
 #include <string>
 #include <utility>
+#include <vector>
 
 #include "acl/DVAccessControlStore.h"
 #include "common/DVErrors.h"
@@ -22,12 +23,27 @@ std::optional<QXError> missingParameter(const std::optional<ItemID>& itemID, con
   return std::nullopt;
 }
 
-// None when it is not known: then a token of that provider's may lie anywhere.
-std::optional<std::string> directoryOf(const ProviderID& providerID) {
+// The containers of all groups that the provider's bundle belongs to: an update may have changed which of them has its documents, while
+// tokens for a container that it has left have ended with that. None when nothing is known of the provider: then a token may lie anywhere.
+std::vector<std::string> containersOf(const ProviderID& providerID) {
+  std::vector<std::string> containers;
   const auto provider = DVExtensionDocuvend::providerWithIdentifier(providerID);
-  const auto directory = provider ? provider->providedItemsURL() : std::nullopt;
-  if (!directory) return std::nullopt;
-  return directory->fileSystemPath();
+  const auto record = QXPlatform::current().applicationRegistry.recordForIdentifier(providerID.value);
+  if (!provider || !provider->providedItemsURL() || !record) return containers;
+  for (const auto& [group, container] : record->groupContainers()) containers.push_back(container.fileSystemPath());
+  return containers;
+}
+
+std::optional<QXError> takeBackTokens(const ProviderID& providerID) {
+  QXSandbox& sandbox = QXPlatform::current().sandbox;
+  const auto containers = containersOf(providerID);
+  if (containers.empty()) return sandbox.invalidateReadWriteExtensions(/*directory=*/std::nullopt);
+  std::optional<QXError> firstError;
+  for (const std::string& container : containers) {
+    auto error = sandbox.invalidateReadWriteExtensions(container);
+    if (!firstError) firstError = std::move(error);
+  }
+  return firstError;
 }
 
 // The list first: from then on it entitles nobody to a new token, and the old ones go after that. When the list could not be written they
@@ -43,7 +59,7 @@ std::optional<QXError> revoke(const ProviderID& providerID, const ItemID& itemID
     return DVNotFoundError(itemID);
   }
   const bool isOnDisk = !store.hasUnwrittenChanges();
-  auto tokensError = QXPlatform::current().sandbox.invalidateReadWriteExtensions(directoryOf(providerID));
+  auto tokensError = takeBackTokens(providerID);
   if (!isOnDisk) return QXError::system(EIO, "the access control list could not be written; when it is read again the grant is back");
   return tokensError;
 }

@@ -221,11 +221,46 @@ TEST_F(DVAdministratorTest, TakesTheGrantFromTheListThenTheTokensAndAnswersThen)
   EXPECT_EQ(steps, (std::vector<std::string>{"not listed, written", "answered"}));
 }
 
-TEST_F(DVAdministratorTest, TheTokensOfTheProvidersDirectoryAreTakenBack) {
+TEST_F(DVAdministratorTest, TheTokensOfEveryContainerOfTheProvidersGroupsAreTakenBack) {
   registerCellar();
   grant(kCellar, kReport, kEditor);
   EXPECT_EQ(revoke(kReport, kCellar, kEditor), std::nullopt);
-  EXPECT_EQ(platform_.sandbox.invalidations(), std::vector<std::optional<std::string>>{FakePlatform::storagePath(kCellar.value)});
+  EXPECT_EQ(platform_.sandbox.invalidations(), std::vector<std::optional<std::string>>{FakePlatform::containerPath(kCellar.value)});
+
+  // Its documents were in another group once, or will be.
+  platform_.applicationRegistry.setRecord(kCellar.value, {},
+                                          {{"com.orvane.cellar.v1", QXURL::fileURL("/groups/v1", QXURLKind::directory)},
+                                           {"com.orvane.cellar.v2", QXURL::fileURL("/groups/v2", QXURLKind::directory)}});
+  grant(kCellar, kReport, kEditor);
+  EXPECT_EQ(revoke(kReport, kCellar, kEditor), std::nullopt);
+  EXPECT_EQ(platform_.sandbox.invalidations(),
+            (std::vector<std::optional<std::string>>{FakePlatform::containerPath(kCellar.value), "/groups/v1", "/groups/v2"}));
+}
+
+TEST_F(DVAdministratorTest, WhenOneOfItsContainersCannotBeCutTheOthersAreAllTheSameAndTheErrorIsTheAnswer) {
+  registerCellar();
+  platform_.applicationRegistry.setRecord(kCellar.value, {},
+                                          {{"com.orvane.cellar.v1", QXURL::fileURL("/groups/v1", QXURLKind::directory)},
+                                           {"com.orvane.cellar.v2", QXURL::fileURL("/groups/v2", QXURLKind::directory)}});
+  const QXError error = QXError::system(ENOSPC, "no room for it");
+  platform_.sandbox.setInvalidationError(error);
+  platform_.sandbox.onInvalidation([this] {
+    if (platform_.sandbox.invalidations().size() == 2) platform_.sandbox.setInvalidationError(std::nullopt);
+  });
+  grant(kCellar, kReport, kEditor);
+  EXPECT_EQ(revoke(kReport, kCellar, kEditor), error);
+  EXPECT_EQ(platform_.sandbox.invalidations().size(), 2U);
+}
+
+TEST_F(DVAdministratorTest, AProviderWithoutARecordOrWithoutGroupsHasAllTokensTakenBack) {
+  registerCellar();
+  platform_.applicationRegistry.setRecord(kCellar.value, {}, {});
+  grant(kCellar, kReport, kEditor);
+  EXPECT_EQ(revoke(kReport, kCellar, kEditor), std::nullopt);
+  platform_.applicationRegistry.removeRecord(kCellar.value);
+  grant(kCellar, kReport, kEditor);
+  EXPECT_EQ(revoke(kReport, kCellar, kEditor), std::nullopt);
+  EXPECT_EQ(platform_.sandbox.invalidations(), (std::vector<std::optional<std::string>>{std::nullopt, std::nullopt}));
 }
 
 TEST_F(DVAdministratorTest, AProviderThatIsNotRegisteredOrHasNoDirectoryHasAllTokensTakenBack) {

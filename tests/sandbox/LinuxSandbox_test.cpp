@@ -144,6 +144,122 @@ TEST_F(TakingTokensBack, HoldsWhenTheBundleIsRemovedAndComesBack) {
   expectTakenBack(token, "item");
 }
 
+// A bundle of each of these groups, beside the one that is there; the group's container is the provider's too.
+class LeavingGroups : public TakingTokensBack {
+ protected:
+  void SetUp() override {
+    TakingTokensBack::SetUp();
+    provider_ = *bundles.find("com.example.cellar.provider");
+    token_ = issued(document);
+    other_ = issued(otherDocument);
+  }
+  void become(const Bundle& bundle) {
+    bundles.put(bundle);
+    changed();
+  }
+  void changed() {
+    bundles.tellOfChange();
+    EXPECT_EQ(sandbox->followInstalledBundles(), std::nullopt);
+  }
+
+  Bundle provider_;
+  std::string token_;
+  std::string other_;
+};
+
+TEST_F(LeavingGroups, EndsTheTokensForItsContainerAndNoOthers) {
+  Bundle left = provider_;
+  left.groups = {{"com.example.cellar.v2", home + "/groups/com.example.cellar.v2"}};
+  become(left);
+  EXPECT_FALSE(opens(token_)) << "nobody has the group";
+  become(provider_);
+  expectTakenBack(token_, "the same group again");
+  EXPECT_TRUE(opens(other_));
+  EXPECT_TRUE(opens(issued(document)));
+}
+
+TEST_F(LeavingGroups, EndsThemAlsoWhenAnotherBundleStays) {
+  Bundle member = *bundles.find("com.example.other");
+  member.groups.insert(*provider_.groups.begin());
+  become(member);
+  EXPECT_TRUE(opens(token_)) << "who comes ends nothing";
+  Bundle left = provider_;
+  left.groups.clear();
+  become(left);
+  expectTakenBack(token_, "another's");
+  EXPECT_TRUE(opens(other_));
+}
+
+TEST_F(LeavingGroups, EndsThemWhenTheBundleIsRemovedAndInstalledAgain) {
+  ASSERT_NE(sandbox->checkWithoutReport(editor, kQXSandboxFileWriteData, document), 0);
+  ASSERT_TRUE(opens(token_));
+  ASSERT_EQ(sandbox->checkWithoutReport(editor, kQXSandboxFileWriteData, document), 0);
+  bundles.remove(provider_.identifier);
+  changed();
+  become(provider_);
+  expectTakenBack(token_, "removed");
+  EXPECT_NE(sandbox->checkWithoutReport(editor, kQXSandboxFileWriteData, document), 0);
+}
+
+TEST_F(LeavingGroups, IsHeldToAfterARestart) {
+  bundles.remove(provider_.identifier);
+  changed();
+  sandbox = restarted();
+  become(provider_);
+  sandbox = restarted();
+  expectTakenBack(token_, "removed");
+  EXPECT_TRUE(opens(other_));
+}
+
+TEST_F(LeavingGroups, IsNoticedByTheNextProcessWhenNoneWasThere) {
+  sandbox = restarted();
+  EXPECT_TRUE(opens(token_)) << "nothing has changed";
+  sandbox.reset();
+  bundles.remove(provider_.identifier);
+  sandbox = restarted();
+  become(provider_);
+  expectTakenBack(token_, "removed");
+  expectTakenBack(other_, "what had changed is not known any more");
+  EXPECT_TRUE(log.entries().empty());
+}
+
+TEST_F(LeavingGroups, IsFollowedByARevocationThatTheRegistryHasNotAnnouncedYet) {
+  Bundle left = provider_;
+  left.groups.clear();
+  bundles.put(left);
+  takeBack(otherGroup);
+  bundles.put(provider_);
+  expectTakenBack(token_, "left before the other was taken back");
+}
+
+TEST_F(LeavingGroups, IsFollowedByWhoIssuesTheNextTokenAndThenNotForgotten) {
+  Bundle joined = *bundles.find("com.example.other");
+  joined.groups["com.example.third"] = home + "/groups/com.example.third";
+  std::filesystem::create_directories(joined.groups["com.example.third"]);
+  bundles.put(joined);
+  bundles.tellOfChange();
+  const std::string third = issued(home + "/groups/com.example.third/new.txt");
+  sandbox = restarted();
+  EXPECT_TRUE(opens(token_)) << "the session has been told of the third";
+  write(home + "/groups/com.example.third/new.txt", "third");
+  EXPECT_TRUE(opens(third));
+}
+
+TEST_F(LeavingGroups, EndsThemInThisProcessWhenItCannotBeWritten) {
+  bundles.remove(provider_.identifier);
+  bundles.tellOfChange();
+  ASSERT_EQ(::chmod(directory.path().c_str(), 0500), 0);
+  EXPECT_TRUE(sandbox->followInstalledBundles());
+  EXPECT_EQ(sandbox->issueReadWriteExtension(otherDocument), std::nullopt) << "a restart could not tell";
+  bundles.put(provider_);
+  bundles.tellOfChange();
+  expectTakenBack(token_, "removed");
+  ASSERT_EQ(::chmod(directory.path().c_str(), 0700), 0);
+  EXPECT_TRUE(opens(issued(document)));
+  sandbox = restarted();
+  expectTakenBack(token_, "removed");
+}
+
 // The registry's way to the container leads through links; a token has none.
 class TakingTokensBackBehindLinks : public TakingTokensBack {
  protected:

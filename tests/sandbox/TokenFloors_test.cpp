@@ -9,7 +9,7 @@
 namespace docuvend::linux_platform {
 namespace {
 
-constexpr const char* kHeader = "docuvend-token-floors:1\n";
+constexpr const char* kHeader = "docuvend-token-floors:2\n";
 
 TEST(TokenFloors, LetEveryNumberThatWasGivenOutPassAtFirst) {
   const TokenFloors floors;
@@ -107,6 +107,18 @@ TEST(TokenFloors, AreReadBackAsTheyWere) {
   EXPECT_EQ(TokenFloors::parsed(floors.printed()), floors);
 }
 
+TEST(TokenFloors, RememberTheirPlacesWhateverIsCut) {
+  TokenFloors floors;
+  EXPECT_EQ(floors.places(), std::nullopt);
+  TokenFloors::Fingerprint places{};
+  places.front() = 0xab;
+  floors.setPlaces(places);
+  floors.raise("/a/");
+  EXPECT_EQ(floors.places(), places);
+  EXPECT_EQ(floors.printed(), std::string(kHeader) + "number:2\nplaces:ab" + std::string(62, '0') + "\nfloor:2:/a/\n");
+  EXPECT_EQ(TokenFloors::parsed(floors.printed()), floors);
+}
+
 TEST(TokenFloors, KeepADirectoryOutThatNoTokenCanLieBelow) {
   TokenFloors floors;
   floors.raise("/" + std::string(kMaximumTokenPathLength - 1, 'a') + "/");
@@ -128,12 +140,22 @@ TEST(TokenFloors, AreReadStrictly) {
   const std::string header = kHeader;
   std::string tooMany = header + "number:9\n";
   for (std::size_t i = 0; i <= TokenFloors::kMaximumDirectories; ++i) tooMany += "floor:2:/" + std::to_string(100 + i) + "/\n";
+  const std::string places = "places:" + std::string(64, 'a') + "\n";
   const std::vector<std::string> bad = {
+      header + places,
+      header + places + "number:3\n",
+      header + "number:3\n" + places + places,
+      header + "number:3\nplaces:\n",
+      header + "number:3\nplaces:" + std::string(63, 'a') + "\n",
+      header + "number:3\nplaces:" + std::string(65, 'a') + "\n",
+      header + "number:3\nplaces:" + std::string(64, 'A') + "\n",
+      header + "number:3\nplaces:" + std::string(64, 'a'),
+      header + "number:3\nfloor:2:/a/\n" + places,
       "",
       header,
-      "docuvend-token-floors:2\nnumber:3\n",
-      "docuvend-token-floors:01\nnumber:3\n",
-      "docuvend-token-floors:1\r\nnumber:3\n",
+      "docuvend-token-floors:1\nnumber:3\n",
+      "docuvend-token-floors:02\nnumber:3\n",
+      "docuvend-token-floors:2\r\nnumber:3\n",
       "\n" + header + "number:3\n",
       "number:3\n",
       header + "number:3",
@@ -169,8 +191,8 @@ TEST(TokenFloors, AreReadStrictly) {
       tooMany,
   };
   for (const std::string& text : bad) EXPECT_EQ(TokenFloors::parsed(text), std::nullopt) << text;
-  for (const std::string& text : {header + "number:3\n", header + "number:3\nfloor:2:/a/\nfloor:3:/b/\n", header + "number:3\nfloor:3:/\n",
-                                  tooMany.substr(0, tooMany.rfind("floor"))}) {
+  for (const std::string& text : {header + "number:3\n", header + "number:3\n" + places, header + "number:3\nfloor:2:/a/\nfloor:3:/b/\n",
+                                  header + "number:3\nfloor:3:/\n", tooMany.substr(0, tooMany.rfind("floor"))}) {
     EXPECT_TRUE(TokenFloors::parsed(text)) << text;
   }
 }

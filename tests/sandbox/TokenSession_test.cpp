@@ -103,6 +103,33 @@ TEST_F(TokenSessionTest, RemembersCutsOverRestarts) {
   EXPECT_TRUE(log.entries().empty());
 }
 
+TEST_F(TokenSessionTest, KnowsAfterARestartWhetherThePlacesAreTheSame) {
+  EXPECT_FALSE(loaded()->hadOtherPlaces("a")) << "nobody has said";
+  const auto session = loaded();
+  EXPECT_EQ(session->changePlaces("a", {}), std::nullopt);
+  const std::string token = issued(*session, "/a/b");
+  const auto next = loaded();
+  EXPECT_FALSE(next->hadOtherPlaces("a"));
+  EXPECT_TRUE(next->hadOtherPlaces("b"));
+  EXPECT_TRUE(isGood(*next, token));
+  EXPECT_EQ(next->changePlaces("b", {"/a/"}), std::nullopt);
+  expectTakenBack(*next, token);
+  EXPECT_TRUE(loaded()->hadOtherPlaces("a"));
+  EXPECT_FALSE(loaded()->hadOtherPlaces("b"));
+  expectTakenBack(*loaded(), token);
+  EXPECT_TRUE(log.entries().empty());
+}
+
+TEST_F(TokenSessionTest, IssuesNothingUntilItsPlacesAreWrittenDown) {
+  const auto session = loaded();
+  lockDirectory();
+  EXPECT_TRUE(session->changePlaces("a", {}));
+  EXPECT_EQ(session->issue("/a/b"), std::nullopt);
+  unlockDirectory();
+  EXPECT_TRUE(session->issue("/a/b"));
+  EXPECT_FALSE(loaded()->hadOtherPlaces("a"));
+}
+
 TEST_F(TokenSessionTest, RefusesAnothersToken) {
   const auto session = loaded();
   const std::string token = SandboxToken{TokenKind::readWrite, 1, "/a/b", {}}.sealed(TokenKey::random());
@@ -142,9 +169,9 @@ TEST_F(TokenSessionTest, ForgetsEveryTokenWhenItsFloorsAreNotWhatTheyShouldBe) {
       {"cut short by a byte", [&] { std::filesystem::resize_file(paths.tokenFloors, size() - 1); }},
       {"cut short by its tag", [&] { cut(read(paths.tokenFloors).rfind("tag:"), std::string::npos, ""); }},
       {"cut short to its number", [&] { cut(read(paths.tokenFloors).find("floor:"), std::string::npos, ""); }},
-      {"without its floor", [&] { keepingTag("docuvend-token-floors:1\nnumber:2\n"); }},
-      {"with a lower floor", [&] { keepingTag("docuvend-token-floors:1\nnumber:2\nfloor:1:/a/\n"); }},
-      {"of another version", [&] { keepingTag("docuvend-token-floors:2\nnumber:2\nfloor:2:/a/\n"); }},
+      {"without its floor", [&] { keepingTag("docuvend-token-floors:2\nnumber:2\n"); }},
+      {"with a lower floor", [&] { keepingTag("docuvend-token-floors:2\nnumber:2\nfloor:1:/a/\n"); }},
+      {"of another version", [&] { keepingTag("docuvend-token-floors:1\nnumber:2\nfloor:2:/a/\n"); }},
       {"with a byte more", [&] { cut(size(), 0, "\n"); }},
       {"with a changed tag", [&] { cut(size() - 2, 1, read(paths.tokenFloors)[size() - 2] == '0' ? "1" : "0"); }},
       {"in capitals", [&] { cut(read(paths.tokenFloors).rfind("tag:"), 3, "TAG"); }},

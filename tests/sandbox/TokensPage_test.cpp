@@ -56,7 +56,7 @@ TEST_F(TokensPageTest, ShowsTheTokenOfTheWorkedExample) {
 }
 
 TEST_F(TokensPageTest, ShowsAFloorsFileThatASessionGoesOnFrom) {
-  const std::string shown = shownFrom("docuvend-token-floors:1");
+  const std::string shown = shownFrom("docuvend-token-floors:2");
   put(paths.tokenFloors, shown);
   fake_platform::FakeLog log;
   auto loaded = TokenSession::load(paths, log.defaultLog());

@@ -53,21 +53,23 @@ std::variant<std::unique_ptr<LinuxSandbox>, QXError> LinuxSandbox::create(const 
 LinuxSandbox::LinuxSandbox(std::unique_ptr<TokenSession> session, BundleRegistry& registry, PeerDirectory& peers)
     : session_(std::move(session)),
       peers_(peers),
+      places_(registry, *session_, containers_, ledger_),
       containers_(registry),
       redeemer_(*session_, containers_),
-      query_(registry, peers, ledger_) {}
+      query_(registry, peers, ledger_) {
+  places_.followChanges();
+}
 
 std::optional<std::string> LinuxSandbox::issueReadWriteExtension(const std::string& path) {
   const auto place = containers_.place(path);
-  if (const auto* item = std::get_if<PlacedItem>(&place)) return session_->issue(item->path);
-  return std::nullopt;
+  const auto* item = std::get_if<PlacedItem>(&place);
+  if (item == nullptr) return std::nullopt;
+  places_.followChanges();
+  return session_->issue(item->path);
 }
 
 std::optional<QXError> LinuxSandbox::invalidateReadWriteExtensions(const std::optional<std::string>& directory) {
-  auto error = session_->takeBack(containers_.spellingsOf(directory.value_or("/")));
-  // Nobody is in the middle of entering what he redeemed with an old token: the cut has waited for that.
-  ledger_.forgetAll();
-  return error;
+  return places_.takeBack(directory);
 }
 
 int LinuxSandbox::checkWithoutReport(const QXAuditToken& token, std::string_view operation, const std::string& path) {

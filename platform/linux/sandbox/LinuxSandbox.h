@@ -16,6 +16,7 @@
 #include "platform/linux/sandbox/DiskWork.h"
 #include "platform/linux/sandbox/GroupContainers.h"
 #include "platform/linux/sandbox/RedemptionLedger.h"
+#include "platform/linux/sandbox/TokenPlaces.h"
 #include "platform/linux/sandbox/TokenRedeemer.h"
 #include "platform/linux/sandbox/TokenSession.h"
 #include "platform/sandbox.h"
@@ -34,6 +35,9 @@ class LinuxSandbox final : public QXSandbox {
   std::optional<std::string> issueReadWriteExtension(const std::string& path) override;
   std::optional<QXError> invalidateReadWriteExtensions(const std::optional<std::string>& directory) override;
   int checkWithoutReport(const QXAuditToken& token, std::string_view operation, const std::string& path) override;
+
+  // What is installed has changed: what was issued for a container that a bundle has left is taken back. Contract as above.
+  [[nodiscard]] std::optional<QXError> followInstalledBundles() { return places_.follow(); }
 
   // The same, with the reason.
   [[nodiscard]] AccessVerdict ask(const QXAuditToken& token, std::string_view operation, const std::string& path) const;
@@ -56,6 +60,7 @@ class LinuxSandbox final : public QXSandbox {
 
   const std::unique_ptr<TokenSession> session_;
   PeerDirectory& peers_;
+  TokenPlaces places_;  // before the containers: TokenPlaces.cpp says why
   GroupContainers containers_;
   RedemptionLedger ledger_;
   const TokenRedeemer redeemer_;

@@ -5,8 +5,9 @@
 namespace docuvend::linux_platform {
 namespace {
 
-constexpr std::string_view kHeader = "docuvend-token-floors:1\n";
+constexpr std::string_view kHeader = "docuvend-token-floors:2\n";
 constexpr std::string_view kNumber = "number:";
+constexpr std::string_view kPlaces = "places:";
 constexpr std::string_view kFloor = "floor:";
 
 bool skip(std::string_view& text, std::string_view expected) {
@@ -48,6 +49,11 @@ void TokenFloors::raise(const std::string& directory) {
 std::string TokenFloors::printed() const {
   std::string text(kHeader);
   text.append(kNumber).append(std::to_string(number_)).append("\n");
+  if (places_) {
+    text.append(kPlaces);
+    appendHex(text, *places_);
+    text += '\n';
+  }
   for (const auto& [directory, floor] : floors_) {
     text.append(kFloor).append(std::to_string(floor)).append(":").append(escapedPath(directory)).append("\n");
   }
@@ -61,6 +67,11 @@ std::optional<TokenFloors> TokenFloors::parsed(std::string_view text) {
   const auto number = numberUntil(text, '\n');
   if (!number) return std::nullopt;
   result.number_ = *number;
+  if (skip(text, kPlaces)) {
+    const auto end = text.find('\n');
+    if (end == std::string_view::npos || !readHex(text.substr(0, end), result.places_.emplace())) return std::nullopt;
+    text.remove_prefix(end + 1);
+  }
   while (!text.empty()) {
     if (!skip(text, kFloor)) return std::nullopt;
     const auto floor = numberUntil(text, ':');

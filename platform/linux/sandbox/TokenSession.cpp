@@ -3,7 +3,8 @@
 //
 // The number of new tokens follows the file, not the memory: it is raised when the floors that belong to it are on disk. So the file's
 // number is never less than that of any token, and a cut that got lost with a crash or on a full disk leaves no token behind
-// whose number a later cut would give out again. Until the file is written, nothing is issued below the directories that were cut.
+// whose number a later cut would give out again. Until the file is written, nothing is issued below the directories that were cut, and
+// nothing at all as long as it does not say what places tokens may be for.
 //
 // Floors are only as good as their memory. A file that is missing, damaged, cut short, another's or of another version would bring
 // tokens back that had been taken, so its body is authenticated with the session's key, and where it does not hold the key goes with it.
@@ -12,7 +13,7 @@
 
 #include <cerrno>
 
-#include "platform/linux/sandbox/PrivateFile.h"
+#include "platform/linux/files/PrivateFile.h"
 
 namespace docuvend::linux_platform {
 namespace {
@@ -72,14 +73,14 @@ std::variant<std::unique_ptr<TokenSession>, QXError> TokenSession::load(const Pa
 }
 
 TokenSession::TokenSession(std::string floorsFile, const TokenKey& key, TokenFloors floors)
-    : floorsFile_(std::move(floorsFile)), key_(key), floors_(std::move(floors)), numberOnDisk_(floors_.number()) {}
+    : floorsFile_(std::move(floorsFile)), key_(key), floors_(std::move(floors)), onDisk_(floors_) {}
 
 // The number that a new token for the path may have: a good one that is on disk.
 std::optional<TokenNumber> TokenSession::issuableNumber(const std::string& path) {
   for (int attempt = 0; attempt < kIssueTries; ++attempt) {
     {
       const std::lock_guard lock(mutex_);
-      if (floors_.isGood(path, numberOnDisk_)) return numberOnDisk_;
+      if (floors_.places() == onDisk_.places() && floors_.isGood(path, onDisk_.number())) return onDisk_.number();
     }
     if (save()) break;
   }
@@ -114,17 +115,32 @@ std::optional<QXError> TokenSession::takeBack(const std::vector<std::string>& di
   return save();
 }
 
+bool TokenSession::hadOtherPlaces(std::string_view places) const {
+  const std::lock_guard lock(mutex_);
+  return floors_.places() && *floors_.places() != key_.authenticate(places);
+}
+
+std::optional<QXError> TokenSession::changePlaces(std::string_view places, const std::vector<std::string>& left) {
+  {
+    const std::lock_guard lock(mutex_);
+    for (const std::string& directory : left) floors_.raise(directory);
+    floors_.setPlaces(key_.authenticate(places));
+  }
+  if (!left.empty()) uses_.waitForEarlier();
+  return save();
+}
+
 std::optional<QXError> TokenSession::save() {
   const std::lock_guard oneAtATime(fileMutex_);
   TokenFloors floors;
   {
     const std::lock_guard lock(mutex_);
-    if (floors_.number() == numberOnDisk_) return std::nullopt;
+    if (floors_ == onDisk_) return std::nullopt;
     floors = floors_;
   }
   if (auto error = saveFloors(floorsFile_, floors, key_)) return error;
   const std::lock_guard lock(mutex_);
-  numberOnDisk_ = floors.number();
+  onDisk_ = std::move(floors);
   return std::nullopt;
 }
 

@@ -43,6 +43,12 @@ class TokenSession {
   // nobody acts on one; also when the error says that a restart may make them good again.
   [[nodiscard]] std::optional<QXError> takeBack(const std::vector<std::string>& directories);
 
+  // Whether tokens may have been issued when the places that they may be for were others than this text describes.
+  [[nodiscard]] bool hadOtherPlaces(std::string_view places) const;
+  // From now on the places are these, and some directories are none any more: what was issued below them is taken back. Until that is
+  // on disk nothing is issued.
+  [[nodiscard]] std::optional<QXError> changePlaces(std::string_view places, const std::vector<std::string>& left);
+
  private:
   [[nodiscard]] std::optional<TokenNumber> issuableNumber(const std::string& path);
   // Makes the file say what the floors are, unless it does.
@@ -55,7 +61,7 @@ class TokenSession {
   mutable std::mutex mutex_;
   // Guarded by mutex_.
   TokenFloors floors_;
-  TokenNumber numberOnDisk_;  // what new tokens get
+  TokenFloors onDisk_;  // new tokens get its number
 };
 
 }  // namespace docuvend::linux_platform
