@@ -141,6 +141,7 @@ struct LinuxPlatform::Services {
   void publish() {
     // Nothing of this goes before the process does.
     bundles.onChange([this] { fileCoordinator.installedStoragesChanged(); });
+    bundles.onChange([this] { followInstalledBundles(); });
     sandboxDelegate = std::make_shared<SandboxListenerDelegate>(*sandbox, log.defaultLog());
     coordinationDelegate = std::make_shared<FileCoordinationListenerDelegate>(
         FileCoordinationServicer::Surroundings{fileCoordinator, fileAccesses, *sandbox, peers});
@@ -153,6 +154,12 @@ struct LinuxPlatform::Services {
   }
 
  private:
+  void followInstalledBundles() {
+    const auto error = sandbox->followInstalledBundles();
+    if (!error) return;
+    log.defaultLog().write(QXLogType::fault, "[ERROR] The tokens for a container that a bundle has left may be good again after a restart: " +
+                                                 error->description());
+  }
   std::shared_ptr<QXRpcListener> listen(const char* name, const std::shared_ptr<QXRpcListenerDelegate>& delegate) {
     auto listener = rpc.listenerForService(name);
     listener->setDelegate(delegate);
