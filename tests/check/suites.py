@@ -19,6 +19,7 @@ OUTPUT_BYTES = 64 << 20
 KEPT_OUTPUT_BYTES = 1 << 20
 SECONDS_OF_A_TEST = 900
 SECONDS_OF_A_LISTING = 60
+SECONDS_TO_END = 5
 
 # What tests print, a line for each share of it, and the check sums up.
 FIGURES = ("messages asserted {} of {}", "sequences tried {}")
@@ -44,11 +45,15 @@ def run_limited(command, seconds):
             failure = None if status == 0 else f"signal {-status}" if status < 0 else f"status {status}"
         except subprocess.TimeoutExpired:
             failure = f"still running after {seconds} s"
-        try:
-            os.killpg(process.pid, signal.SIGKILL)
-        except ProcessLookupError:
-            pass
-        process.wait()
+        finally:
+            # Also when this program itself is being ended. A build ends its own children when it is asked to, and only then.
+            for number in (signal.SIGTERM, signal.SIGKILL):
+                try:
+                    os.killpg(process.pid, number)
+                    process.wait(SECONDS_TO_END)
+                except (ProcessLookupError, subprocess.TimeoutExpired):
+                    pass
+            process.wait()
         output.seek(0)
         return failure, output.read(KEPT_OUTPUT_BYTES).decode(errors="replace")
 

@@ -21,6 +21,7 @@ import pathlib
 import random
 import re
 import shutil
+import signal
 import sys
 import time
 
@@ -257,6 +258,9 @@ def main():
 
 
 if __name__ == "__main__":
+    # What is being tried is put back, and what was started is ended, before this program ends.
+    for number in (signal.SIGINT, signal.SIGTERM):
+        signal.signal(number, lambda *_: sys.exit("mutate: stopped; what is known so far is kept"))
     try:
         sys.exit(main())
     except (RuntimeError, ValueError) as error:
