@@ -44,6 +44,18 @@ class StandardErrorLog final : public QXLogHandle {
   void write(QXLogType, const std::string& message) override { std::cerr << message << std::endl; }
 };
 
+// Tells for whom each line is written.
+class SubjectLog final : public QXLogHandle {
+ public:
+  [[nodiscard]] bool isEnabled(QXLogType) const override { return true; }
+  void write(QXLogType, const std::string&) override {
+    const auto subject = LogSubject::current();
+    subjects.put(subject ? *subject : "nobody in particular");
+  }
+
+  Mailbox<std::string> subjects;
+};
+
 // Serves the test protocol to everybody, and hands over the connections.
 class Delegate final : public QXRpcListenerDelegate {
  public:
@@ -221,6 +233,29 @@ TEST_F(LinuxRpcServiceTest, AMalformedFrameClosesThatConnectionWithOneLogLineAnd
   // The line is written by another thread than the one that closes the socket.
   for (int i = 0; i < 1000 && driver.log.texts().empty(); ++i) EXPECT_TRUE(roundTrip(driver.connect()));
   EXPECT_THAT(driver.log.texts(QXLogType::defaultType), testing::ElementsAre(line));
+}
+
+TEST_F(LinuxRpcServiceTest, LinesAboutAPeerAreOnItsOwnAccountUnlessItIsTrusted) {
+  SubjectLog log;
+  Reactor reactor(2);  // ends before the log does
+  LinuxRpcService service(reactor, driver.peers, log, {{kServiceName, {driver.socketPath}}});
+  listener = service.listenerForService(kServiceName);
+  listener->setDelegate(delegate);
+  listener->resume();
+  const auto subjectOfGarbage = [this, &log] {
+    const auto raw = connectRaw();
+    raw.write(std::vector<std::uint8_t>(64, 0xff));
+    return log.subjects.take();
+  };
+  EXPECT_EQ(subjectOfGarbage(), "com.example.App");
+  driver.peers.setNextPeer(Standing::unconfined, std::nullopt, {});
+  EXPECT_EQ(subjectOfGarbage(), "nobody in particular");
+  driver.peers.setNextPeer(Standing::nobody, std::nullopt, {});
+  EXPECT_EQ(subjectOfGarbage(), "processes without an identity");
+  std::vector<RawPeer> crowd;
+  for (std::size_t i = 0; i < 2 * kMaximumConnectionsOfNobody; ++i) crowd.push_back(connectRaw());
+  EXPECT_EQ(log.subjects.take(), "processes without an identity") << "of a refused connection, too";
+  listener.reset();
 }
 
 TEST_F(LinuxRpcServiceTest, TheEndThatAPeerAnnouncesIsNotLogged) {
