@@ -36,11 +36,25 @@ class BundleAttacks : public AttackTest {
     EXPECT_EQ(ending.status, 0) << ending.errors;
     return {ending.output};
   }
+  // A bundle that claims the cellar's group, and to say who its members are.
+  void claimGroup(const std::string& identifier) const {
+    claim(identifier, identifier,
+          groupEntries_ + "<key>QXGroupMembers</key><dict><key>" + kGroup + "</key><array><string>" + kCellar + "</string></array></dict>",
+          {});
+  }
+  // The daemon and the launcher agree that the bundle has nothing of the group.
+  void expectNothingOfTheGroup(const std::string& identifier) {
+    EXPECT_TRUE(
+        house_.awaitLog("[ERROR] The bundle " + identifier + " may not belong to the group " + kGroup + ", which is " + kCellar + "'s."));
+    EXPECT_EQ(says(identifier, {"put", house_.storage(kCellar) + "/stolen", "x"}), Lines{"ENOENT\n"});
+    EXPECT_FALSE(fs::exists(house_.storage(kCellar) + "/stolen"));
+  }
   void expectIgnored(const std::string& directory, const std::string& other) const {
     EXPECT_EQ(house_.logged("[ERROR] Ignoring the bundle at " + directory + ": " + other + " has the same identifier."), 1);
   }
 
   std::string letter_;
+  const std::string groupEntries_ = "<key>QXGroups</key><array><string>" + kGroup + "</string></array>";
 };
 
 TEST_F(BundleAttacks, OfTwoBundlesThatClaimOneIdentifierTheSecondGainsNothing) {
@@ -82,8 +96,10 @@ TEST_F(BundleAttacks, ABundleThatClaimsAGroupOfAnotherSeesNothingOfItsContainer)
   claim("zz.friend", "zz.friend", own, {});
   claim("zz.stranger", "zz.stranger", own, {});
   house_.startDaemon();
-  EXPECT_EQ(house_.logged("[ERROR] The bundle zz.thief may not belong to the group " + kGroup + "."), 1);
-  EXPECT_EQ(house_.logged("[ERROR] The bundle zz.stranger may not belong to the group " + kAttacker + ".shared."), 1);
+  EXPECT_EQ(house_.logged("[ERROR] The bundle zz.thief may not belong to the group " + kGroup + ", which is " + kCellar + "'s."), 1);
+  EXPECT_EQ(
+      house_.logged("[ERROR] The bundle zz.stranger may not belong to the group " + kAttacker + ".shared, which is " + kAttacker + "'s."),
+      1);
   ASSERT_TRUE(fs::exists(house_.storage(kCellar)));
   EXPECT_EQ(says("zz.thief", {"put", house_.storage(kCellar) + "/stolen", "x"}), Lines{"ENOENT\n"});
   EXPECT_FALSE(fs::exists(house_.storage(kCellar) + "/stolen"));
@@ -94,6 +110,72 @@ TEST_F(BundleAttacks, ABundleThatClaimsAGroupOfAnotherSeesNothingOfItsContainer)
   EXPECT_EQ(contentsOf(shared + "/note"), "x");
   EXPECT_EQ(says("zz.friend", {"put", shared + "/note", "z"}), Lines{"ok\n"});
   EXPECT_EQ(contentsOf(shared + "/note"), "z");
+}
+
+TEST_F(BundleAttacks, AGroupIsTakenOverNeitherByItsNameNorByALongerOneNorByWhatComesWhenItsOwnerIsGone) {
+  const std::string inside = kCellar + ".documents";  // the group's whole name
+  house_.startDaemon();
+  ASSERT_TRUE(fs::exists(house_.storage(kCellar)));
+  claimGroup(inside);
+  claimGroup("com.orvane");
+  for (const std::string& thief : {inside, std::string("com.orvane")}) expectNothingOfTheGroup(thief);
+  const Ending uninstalled = house_.ctl({"uninstall", kCellar});
+  ASSERT_EQ(uninstalled.status, 0) << uninstalled.errors;
+  for (const std::string& thief : {inside, std::string("com.orvane")}) expectNothingOfTheGroup(thief);
+  house_.install(kCellar);
+  eventually("the owner has its storage again", [this] { return house_.ctl({"bookmark", letter_}).status == 0; });
+}
+
+TEST_F(BundleAttacks, AnIdentifierOfOneWordIsNone) {
+  claim("com", "com", groupEntries_, {});
+  house_.startDaemon();
+  EXPECT_EQ(house_.logged("[ERROR] Ignoring the bundle at " + house_.bundles() +
+                          "/com: its identifier has a single part and needs two or more, like org.name."),
+            1);
+  EXPECT_EQ(house_.confined("com", {"put", house_.storage(kCellar) + "/stolen", "x"}).status, 127);
+}
+
+TEST_F(BundleAttacks, WhatClaimsAnothersGroupIsNotInstalled) {
+  house_.startDaemon();
+  const std::string thief = kCellar + ".documents";
+  claimGroup(thief);
+  const std::string away = house_.home() + "/thief";
+  fs::rename(house_.bundles() + "/" + thief, away);
+  for (const bool isOwnerThere : {true, false}) {
+    const Ending ending = house_.ctl({"install", away});
+    EXPECT_NE(ending.status, 0) << isOwnerThere;
+    EXPECT_NE(ending.errors.find("may not belong to the group " + kGroup + ", which is " + kCellar + "'s."), std::string::npos)
+        << ending.errors;
+    EXPECT_FALSE(fs::exists(house_.bundles() + "/" + thief));
+    if (isOwnerThere) {
+      EXPECT_EQ(house_.ctl({"uninstall", kCellar}).status, 0);
+    }
+  }
+}
+
+TEST_F(BundleAttacks, WhatOthersCanWriteIsNoBundle) {
+  claim("zz.open", "zz.open", {}, trueEntry(kWrite));
+  fs::permissions(house_.bundles() + "/zz.open/Entitlements.plist", fs::perms::others_write, fs::perm_options::add);
+  house_.startDaemon();
+  EXPECT_EQ(
+      house_.logged("[ERROR] Ignoring the bundle at " + house_.bundles() + "/zz.open: its Entitlements.plist can be written by others."),
+      1);
+  EXPECT_EQ(house_.confined("zz.open", {}).status, 127);
+}
+
+// As above, with the system's directory.
+TEST_F(BundleAttacks, ABundleOfTheUsersDoesNotTakeOverTheGroupOfOneOfTheSystems) {
+  const std::string systems = "/usr/share/docuvend/bundles/" + kCellar;
+  ASSERT_TRUE(enterNamespaces(CLONE_NEWUSER | CLONE_NEWNS));
+  ASSERT_EQ(::mount("tmpfs", "/usr/share", "tmpfs", 0, nullptr), 0);
+  fs::create_directories(fs::path(systems).parent_path());
+  fs::copy(house_.bundles() + "/" + kCellar, systems, fs::copy_options::recursive);
+  fs::remove_all(house_.bundles() + "/" + kCellar);
+  const std::string longer = kCellar + ".documents";
+  claimGroup(longer);
+  house_.startDaemon();
+  ASSERT_TRUE(fs::exists(house_.storage(kCellar)));
+  expectNothingOfTheGroup(longer);
 }
 
 }  // namespace

@@ -35,7 +35,8 @@ class Successors : public FileAttackTest {
     eventually("the provider is registered", [this, &identifier, before] { return registrations(identifier) > before; });
   }
   void awaitThatItIsGone() {
-    eventually("the provider is not known any more", [this] { return grant(url(letter_)).outcome == "DVErrorDomain 5"; });
+    // Without granting: what is granted while the provider is still known stays.
+    eventually("the provider is not known any more", [this] { return house_.ctl({"bookmark", letter_}).status != 0; });
   }
 
   std::string letter_;
@@ -59,15 +60,36 @@ TEST_F(Successors, WhatWasTakenBackWithTheFirstIsNothingToTheSecond) {
 TEST_F(Successors, AGrantIsByIdentifierAndForItsItemsAlone) {
   fs::remove_all(house_.bundles() + "/" + kColluder);
   awaitThatItIsGone();
-  EXPECT_EQ(redeem(tokens_.item).outcome, kGone);
+  EXPECT_EQ(redeem(tokens_.item).outcome, kBadToken);
   fs::remove_all(house_.storage(kColluder));
   install(kColluder);
   (void)put("letter.txt", "A new one");
   (void)put("secret.txt", "The new one's own");
   EXPECT_THAT(attack({"resolve", stringFor("letter.txt"), "open", "read", "contents", "resolve", stringFor("secret.txt")}),
               ElementsAre(url(letter_).absoluteString(), "ok", "A new one", kNotPermitted));
-  // A token is for a path; there is no other one that it opens.
-  EXPECT_EQ(redeem(tokens_.item).contents(), "A new one");
+  // A token ends with the membership under which it was issued.
+  EXPECT_EQ(redeem(tokens_.item).outcome, kBadToken);
+  EXPECT_EQ(redeem(grant(url(letter_)).item).contents(), "A new one");
+}
+
+TEST_F(Successors, ARevocationReachesTheGroupThatHadTheDocumentsBeforeAnUpdate) {
+  const std::string old = kColluder + ".documents";
+  const std::string present = kColluder + ".v2";
+  const int before = registrations(kColluder);
+  const std::string update = house_.bundles() + "/.update";
+  house_.install(".update", "docuvend-colluder",
+                 stringEntry("QXBundleIdentifier", kColluder) + "<key>QXGroups</key><array><string>" + old + "</string><string>" + present +
+                     "</string></array><key>QXExtension</key><dict>" + stringEntry("QXExtensionPointName", "com.orvane.docuvend-nonui") +
+                     stringEntry("QXExtensionDocuvendDocumentGroup", present) + "</dict>",
+                 {});
+  const Ending installed = house_.ctl({"install", update});
+  ASSERT_EQ(installed.status, 0) << installed.errors;
+  eventually("the new version is registered", [this, before] { return registrations(kColluder) > before; });
+  ASSERT_EQ(redeem(tokens_.item).contents(), kLetterText) << "the update alone ends nothing: the bundle has kept the group";
+  const Ending revoked = house_.ctl({"revoke", kColluder, "letter.txt", kAttacker});
+  ASSERT_EQ(revoked.status, 0) << revoked.errors;
+  for (const auto& token : {tokens_.item, tokens_.sibling}) EXPECT_EQ(redeem(token, Access::readWrite).outcome, kBadToken);
+  EXPECT_EQ(contentsOf(letter_), kLetterText);
 }
 
 TEST_F(Successors, AnotherIdentifierInheritsNeitherTheGroupNorTheGrantsNorTheTokens) {
@@ -81,7 +103,7 @@ TEST_F(Successors, AnotherIdentifierInheritsNeitherTheGroupNorTheGrantsNorTheTok
                      stringEntry("QXExtensionDocuvendDocumentGroup", group) + "</dict>",
                  {});
   install(kOrdinary);
-  EXPECT_EQ(redeem(tokens_.item).outcome, kGone);
+  EXPECT_EQ(redeem(tokens_.item).outcome, kBadToken);
   EXPECT_NE(grant(url(letter_), kHeir).outcome, "ok");
   // What is recorded of this one is a grant of its own item of that name.
   EXPECT_EQ(grant(url(letter_), kOrdinary).outcome, "DVErrorDomain 9");

@@ -80,7 +80,10 @@ TEST_F(Bundles, ABundleDoesNotGetAGroupOfAnother) {
                      "<key>QXGroups</key><array><string>com.orvane.cellar.documents</string></array>",
                  {});
   house_.startDaemon();
-  EXPECT_EQ(house_.logged("[ERROR] The bundle com.example.thief may not belong to the group com.orvane.cellar.documents."), 1);
+  EXPECT_EQ(
+      house_.logged(
+          "[ERROR] The bundle com.example.thief may not belong to the group com.orvane.cellar.documents, which is com.orvane.cellar's."),
+      1);
   expectTheWayIsOpen();
 }
 

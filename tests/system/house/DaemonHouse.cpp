@@ -4,6 +4,7 @@
 #include <fcntl.h>
 #include <signal.h>
 #include <sys/prctl.h>
+#include <sys/stat.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
@@ -56,12 +57,17 @@ std::map<pid_t, pid_t> parents() {
   return result;
 }
 
+void closeToOthers(const fs::path& path) {
+  fs::permissions(path, fs::perms::group_write | fs::perms::others_write, fs::perm_options::remove);
+}
+
 }  // namespace
 
 DaemonHouse::DaemonHouse() {
   std::string pattern = (fs::temp_directory_path() / "dvXXXXXX").string();
   if (::mkdtemp(pattern.data()) == nullptr) throw std::runtime_error("no directory for a test");
   root_ = fs::canonical(pattern).string();
+  ::umask(022);  // others may not write bundles, or they are none
   home_ = root_ + "/h";
   for (const std::string& directory : {home_, runtime()}) {
     fs::create_directory(directory);
@@ -93,8 +99,11 @@ void DaemonHouse::expectNothingLeft() const {
 }
 
 void DaemonHouse::install(const std::string& identifier) const {
-  fs::copy(fs::path(DOCUVEND_BUNDLES) / identifier, fs::path(bundles()) / ("." + identifier), fs::copy_options::recursive);
-  fs::rename(fs::path(bundles()) / ("." + identifier), fs::path(bundles()) / identifier);
+  const fs::path copy = fs::path(bundles()) / ("." + identifier);
+  fs::copy(fs::path(DOCUVEND_BUNDLES) / identifier, copy, fs::copy_options::recursive);
+  closeToOthers(copy);  // whatever the build's mask was
+  for (const auto& entry : fs::recursive_directory_iterator(copy)) closeToOthers(entry.path());
+  fs::rename(copy, fs::path(bundles()) / identifier);
 }
 
 void DaemonHouse::install(const std::string& directory, const std::string& programName, const std::string& info,
@@ -102,6 +111,7 @@ void DaemonHouse::install(const std::string& directory, const std::string& progr
   const std::string place = bundles() + "/." + directory;
   fs::create_directory(place);
   fs::copy_file(program(programName), place + "/" + programName);
+  closeToOthers(place + "/" + programName);
   writeFile(place + "/Info.plist", propertyList(stringEntry("QXBundleExecutable", programName) + info));
   writeFile(place + "/Entitlements.plist", propertyList(entitlements));
   fs::rename(place, bundles() + "/" + directory);
