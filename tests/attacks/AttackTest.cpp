@@ -42,6 +42,26 @@ std::vector<std::string> AttackTest::attackAsExtension(const std::vector<std::st
   return lines;
 }
 
+std::unique_ptr<Process> AttackTest::holdingAttacker(std::vector<std::string> acts, const std::string& name) const {
+  acts.insert(acts.begin(), {std::string(DOCUVEND_BIN) + "/docuvend-run", kAttacker});
+  acts.insert(acts.end(), {"hold", name});
+  auto process = std::make_unique<Process>(Command{acts, house_.environment(), {}});
+  eventually("the attacker has what it wants", [this, &name, &process] {
+    return std::filesystem::exists(house_.container(kAttacker) + "/" + name + ".holding") || !process->isRunning();
+  });
+  return process;
+}
+
+std::vector<std::string> AttackTest::letGo(Process& attacker, const std::string& name) const {
+  EXPECT_TRUE(attacker.isRunning());
+  writeFile(house_.container(kAttacker) + "/" + name + ".go", "");
+  const Ending& ending = attacker.wait();
+  EXPECT_EQ(ending.status, 0) << ending.errors;
+  auto lines = linesOf(ending.output);
+  if (!lines.empty() && lines.back() == "ok") lines.pop_back();
+  return lines;
+}
+
 std::vector<std::string> AttackTest::unconfined(const std::vector<std::string>& words) const {
   Command command{{std::string(DOCUVEND_BIN) + "/docuvend-attacker"}, house_.environment(), {}};
   command.words.insert(command.words.end(), words.begin(), words.end());

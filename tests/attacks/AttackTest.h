@@ -1,6 +1,7 @@
 // A house with a confined attacker in it, and an honest application beside it.
 #pragma once
 
+#include <memory>
 #include <string>
 #include <vector>
 
@@ -21,7 +22,11 @@ class AttackTest : public SystemTest {
   [[nodiscard]] std::vector<std::string> attack(const std::vector<std::string>& words) const;
   // The same, started by the running daemon as an extension, a new one each time. It serves nobody.
   [[nodiscard]] std::vector<std::string> attackAsExtension(const std::vector<std::string>& words);
-  // The same, unconfined.
+  // The attacker, confined, that does these acts and keeps what it took until it is let go.
+  [[nodiscard]] std::unique_ptr<Process> holdingAttacker(std::vector<std::string> acts, const std::string& name) const;
+  // What it had to say.
+  [[nodiscard]] std::vector<std::string> letGo(Process& attacker, const std::string& name) const;
+  // The same as at first, unconfined.
   [[nodiscard]] std::vector<std::string> unconfined(const std::vector<std::string>& words) const;
 
  private:

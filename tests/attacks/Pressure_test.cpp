@@ -3,8 +3,6 @@
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
 
-#include <filesystem>
-
 #include "common/DVErrors.h"
 #include "platform/linux/coordination/AccessSession.h"
 #include "platform/linux/coordination/ChangeNotices.h"
@@ -40,27 +38,6 @@ class Pressure : public AttackTest {
     letter_ = house_.putInCloud("letter.txt", "Dear all\n");
     house_.startDaemon();
     letterString_ = house_.granted(letter_, kEditor);
-  }
-
-  // The attacker, confined, that does these acts and keeps what it took until it is let go.
-  [[nodiscard]] std::unique_ptr<Process> holdingAttacker(std::vector<std::string> acts, const std::string& name) const {
-    acts.insert(acts.begin(), {std::string(DOCUVEND_BIN) + "/docuvend-run", kAttacker});
-    acts.insert(acts.end(), {"hold", name});
-    auto process = std::make_unique<Process>(Command{acts, house_.environment(), {}});
-    eventually("the attacker has what it wants", [this, &name, &process] {
-      return std::filesystem::exists(house_.container(kAttacker) + "/" + name + ".holding") || !process->isRunning();
-    });
-    return process;
-  }
-  // What it had to say.
-  [[nodiscard]] std::vector<std::string> letGo(Process& attacker, const std::string& name) const {
-    EXPECT_TRUE(attacker.isRunning());
-    writeFile(house_.container(kAttacker) + "/" + name + ".go", "");
-    const Ending& ending = attacker.wait();
-    EXPECT_EQ(ending.status, 0) << ending.errors;
-    auto lines = linesOf(ending.output);
-    if (!lines.empty() && lines.back() == "ok") lines.pop_back();
-    return lines;
   }
 
   // An application opens a document, and a program takes a turn at it.

@@ -22,6 +22,7 @@
 #include "platform/linux/log/LogAllowance.h"
 #include "platform/linux/log/LogText.h"
 #include "platform/linux/rpc/ConnectionLimiter.h"
+#include "platform/linux/sandbox/DiskWork.h"
 #include "platform/linux/sandbox/RedemptionLedger.h"
 #include "platform/linux/sandbox/SandboxToken.h"
 #include "platform/linux/sandbox/TokenFloors.h"
@@ -78,6 +79,9 @@ std::vector<Limit> limits() {
           {"kLongestIdentifier", kLongestIdentifier},
           {"kMostBundleDirectories", kMostBundleDirectories},
           {"kLongestDescription", kLongestDescription},
+          {"kApplicationProcesses", kApplicationProcesses},
+          {"kApplicationOpenFiles", kApplicationOpenFiles},
+          {"DiskWork::kMostThreads", DiskWork::kMostThreads},
           {"kExtensionProcesses", kExtensionProcesses},
           {"kExtensionOpenFiles", kExtensionOpenFiles},
           {"kExtensionMemory", kExtensionMemory.value_or(kMemoryWithoutSanitizer)},

@@ -189,6 +189,22 @@ TEST_F(SandboxServicerTest, ServesTheNextRequestsWhileAReplacementWaitsForTheDis
   EXPECT_EQ(testing::read(document), "saved");
 }
 
+TEST_F(SandboxServicerTest, MakesAnotherBundlesReplacementWhileOneWaitsForTheDisk) {
+  const std::string another = storage + "/another.txt";
+  testing::write(another, "contents");
+  ASSERT_TRUE(redeem(issued(storage + "/.another.txt"), true).file);
+  ASSERT_EQ(::pwrite(redeem(issued(sibling), true).file->number, "saved", 5, 0), 5);
+  StuckDisk disk;
+  auto replacement = replacing(issued(document), issued(sibling));
+  ASSERT_TRUE(disk.awaitFlush());
+  connectAs(peers.add(confined("com.example.other", "9")));
+  EXPECT_EQ(replace(issued(another), issued(storage + "/.another.txt")), std::nullopt);
+  EXPECT_EQ(testing::read(another), "");
+  EXPECT_EQ(testing::read(document), "contents") << "it has not waited for that";
+  disk.letGo();
+  EXPECT_EQ(replacement.get(), std::nullopt);
+}
+
 TEST_F(SandboxServicerTest, MakesAReplacementThoughItsCallerLeavesMeanwhile) {
   ASSERT_EQ(::pwrite(redeem(issued(sibling), true).file->number, "saved", 5, 0), 5);
   StuckDisk disk;

@@ -12,10 +12,19 @@
 //                           asks for an item again and again, and what the first answer is
 //   start-silently URL PROVIDER CONSUMER COUNT
 //                           the same, and wants no answers; the first failure
+//   fork                    starts processes until it may not; why it may not
+//   pass-around             puts descriptors into sockets and leaves them unread until it may not; why it may not
 //   hold NAME               makes the file NAME.holding and waits until NAME.go is there
+#include <fcntl.h>
+#include <signal.h>
+#include <sys/prctl.h>
+#include <sys/resource.h>
 #include <sys/socket.h>
 #include <sys/time.h>
+#include <unistd.h>
 
+#include <array>
+#include <cerrno>
 #include <chrono>
 #include <cstdint>
 #include <cstring>
@@ -47,11 +56,16 @@ using Bytes = std::vector<std::uint8_t>;
 constexpr const char* kWakeUp = "wakeUpCompletion:";
 constexpr const char* kStart = "startProvidingItemAtURL:fromProviderID:forConsumerID:completionHandler:";
 constexpr std::uint64_t kMostRequests = 2'000'000;
+// More than any limit of a confinement, less than what a machine could not bear.
+constexpr int kMostProcesses = 3'000;
+constexpr int kMostMessages = 2'000;
+constexpr std::size_t kDescriptorsOfAMessage = 250;
 
 // What is kept to the end.
 struct Hoard {
   std::vector<RawPeer> peers;
   std::vector<std::unique_ptr<tests::Client>> clients;
+  std::vector<UniqueDescriptor> sockets;
 };
 Hoard& hoard() {
   static Hoard all;
@@ -215,6 +229,55 @@ std::string startAgainAndAgain(Words& words, Answers answers) {
   return "no answer";
 }
 
+std::string forkUntilRefused(Words& /*words*/) {
+  for (int i = 0; i < kMostProcesses; ++i) {
+    const pid_t child = ::fork();
+    if (child < 0) return outcome(child);
+    if (child > 0) continue;
+    ::prctl(PR_SET_PDEATHSIG, SIGKILL);
+    ::pause();
+    ::_exit(0);
+  }
+  return "never refused";
+}
+
+// Of one socket that nobody reads.
+int sendDescriptors(int socket, int descriptor) {
+  std::array<int, kDescriptorsOfAMessage> descriptors{};
+  descriptors.fill(descriptor);
+  alignas(cmsghdr) std::array<char, CMSG_SPACE(sizeof descriptors)> control{};
+  char byte = 0;
+  iovec bytes{&byte, 1};
+  msghdr message{};
+  message.msg_iov = &bytes;
+  message.msg_iovlen = 1;
+  message.msg_control = control.data();
+  message.msg_controllen = control.size();
+  cmsghdr* const header = CMSG_FIRSTHDR(&message);
+  header->cmsg_level = SOL_SOCKET;
+  header->cmsg_type = SCM_RIGHTS;
+  header->cmsg_len = CMSG_LEN(sizeof descriptors);
+  std::memcpy(CMSG_DATA(header), descriptors.data(), sizeof descriptors);
+  return static_cast<int>(::sendmsg(socket, &message, MSG_DONTWAIT | MSG_NOSIGNAL));
+}
+
+std::string passAround(Words& /*words*/) {
+  rlimit limit{};
+  ::getrlimit(RLIMIT_NOFILE, &limit);
+  limit.rlim_cur = limit.rlim_max;
+  ::setrlimit(RLIMIT_NOFILE, &limit);
+  const UniqueDescriptor descriptor(::open("/dev/null", O_RDONLY | O_CLOEXEC));
+  for (int i = 0; i < kMostMessages; ++i) {
+    if (!hoard().sockets.empty() && sendDescriptors(hoard().sockets.back().get(), descriptor.get()) >= 0) continue;
+    // One that is full is followed by another.
+    if (!hoard().sockets.empty() && errno != EAGAIN) return outcome(-1);
+    std::array<int, 2> ends{};
+    if (::socketpair(AF_UNIX, SOCK_DGRAM | SOCK_CLOEXEC, 0, ends.data()) != 0) return outcome(-1);
+    for (const int end : ends) hoard().sockets.emplace_back(end);
+  }
+  return "never refused";
+}
+
 std::string hold(Words& words) {
   constexpr std::chrono::milliseconds kBetweenLooks{2};
   const std::string name = words.next();
@@ -238,6 +301,8 @@ Acts pressureActs() {
           {"scribble", scribble},
           {"start", [](Words& words) { return startAgainAndAgain(words, Answers::wanted); }},
           {"start-silently", [](Words& words) { return startAgainAndAgain(words, Answers::unwanted); }},
+          {"fork", forkUntilRefused},
+          {"pass-around", passAround},
           {"hold", hold}};
 }
 
