@@ -43,7 +43,7 @@ TEST_F(Doctor, FindsTheDaemonAndEveryProtectionThatThisKernelGives) {
   const JSON findings = JSON::parse(ending.output);
   EXPECT_EQ(findingOf(findings, "daemon").second, "process " + std::to_string(house_.daemon().pid()) + " answers");
   for (const char* protection : {"ordinary user", "run-time directory", "user namespaces", "bubblewrap", "docuvend-confine", "Landlock",
-                                 "confinement", "bundles", "daemon", "daemon's kernel", "daemon's privileges"}) {
+                                 "confinement", "directories", "bundles", "daemon", "daemon's kernel", "daemon's privileges"}) {
     EXPECT_EQ(findingOf(findings, protection).first, "in force") << protection << ": " << findingOf(findings, protection).second;
   }
 }
@@ -75,6 +75,17 @@ TEST_F(Doctor, FindsThatNothingStartsWhereOthersReachTheRunTimeDirectory) {
   EXPECT_EQ(state, "fatal");
   EXPECT_THAT(text, HasSubstr("must have mode 700"));
   ASSERT_EQ(::chmod(house_.runtime().c_str(), 0700), 0);
+}
+
+TEST_F(Doctor, FindsThatNothingStartsFromAHomeThatApplicationsWouldSee) {
+  auto environment = house_.environment();
+  std::erase_if(environment, [](const std::string& variable) { return variable.starts_with("HOME="); });
+  environment.emplace_back("HOME=/usr/local/somebody");
+  const Ending ending = Process({{std::string(DOCUVEND_BIN) + "/docuvendctl", "doctor", "--json"}, environment, {}}).wait();
+  EXPECT_EQ(ending.status, kFatal) << ending.output << ending.errors;
+  const auto [state, text] = findingOf(JSON::parse(ending.output), "directories");
+  EXPECT_EQ(state, "fatal");
+  EXPECT_EQ(text, "/usr/local/somebody lies below /usr, which every application sees");
 }
 
 // In namespaces of bubblewrap's that allow no further ones, but in no confinement.

@@ -51,7 +51,7 @@ void expectOnly(const MachineFacts& facts, const std::string& protection, Verdic
 
 TEST(Findings, OnASoundMachineEverythingIsInForceAndTheStatusIsDone) {
   const auto findings = findingsFrom(soundMachine());
-  EXPECT_EQ(findings.size(), 18U);
+  EXPECT_EQ(findings.size(), 19U);
   for (const Finding& finding : findings) EXPECT_EQ(finding.verdict, Verdict::inForce) << finding.protection;
   EXPECT_EQ(reportOf(findings).status, ExitStatus::done);
 }
@@ -95,6 +95,12 @@ TEST(Findings, NothingStartsWithoutTheProgramsThatConfine) {
   EXPECT_EQ(findingOf(facts, "docuvend-confine").text, "/usr/libexec/docuvend/docuvend-confine");
   facts.helper.clear();
   expectOnly(facts, "docuvend-confine", Verdict::fatal, "libexec");
+}
+
+TEST(Findings, NothingStartsWhereApplicationsWouldSeeTheUsersDirectories) {
+  MachineFacts facts = soundMachine();
+  facts.placesProblem = "/usr/home lies below /usr, which every application sees";
+  expectOnly(facts, "directories", Verdict::fatal, "/usr/home lies below /usr");
 }
 
 TEST(Findings, NothingStartsWhereALaunchFails) {

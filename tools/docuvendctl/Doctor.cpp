@@ -10,6 +10,7 @@
 
 #include "platform/linux/base/Paths.h"
 #include "platform/linux/launch/HostLayout.h"
+#include "platform/linux/launch/PrivatePlaces.h"
 #include "tools/docuvendctl/ConnectionOptions.h"
 #include "tools/docuvendctl/Findings.h"
 #include "tools/docuvendctl/Outcome.h"
@@ -51,14 +52,15 @@ void askDaemon(const Call& call, MachineFacts& facts) {
   facts.daemon = factsFrom(std::get<QXDictionary>(told));
 }
 
-void lookAtPlaces(const Result<Paths>& found, MachineFacts& facts) {
+void lookAtPlaces(const Result<Paths>& found, const HostLayout& host, MachineFacts& facts) {
   if (const auto* error = std::get_if<QXError>(&found)) {
     facts.runtimeProblem = messageOf(*error);
-    facts.bundlesProblem = "not looked at without a run-time directory";
+    facts.placesProblem = facts.bundlesProblem = "not looked at without a run-time directory";
     return;
   }
   const Paths& paths = std::get<Paths>(found);
   facts.runtimeDirectory = paths.runtime.substr(0, paths.runtime.rfind('/'));
+  facts.placesProblem = linux_platform::exposedPlace(host, paths);
   facts.bundlesProblem = writableByOthers(paths.systemBundles);
   if (!facts.bundlesProblem) facts.bundlesProblem = writableByOthers(paths.userBundles);
 }
@@ -79,7 +81,7 @@ Result<Answer> doctor(const Call& call) {
   facts.userNamespaceProblem = tryUserNamespace();
   if (facts.kernel.landlockLevel > 0) facts.landlockProblem = tryLandlock(facts.kernel.landlockLevel);
   facts.launchProblem = tryLaunch();
-  lookAtPlaces(paths, facts);
+  lookAtPlaces(paths, host, facts);
   // Last: it starts threads.
   askDaemon(call, facts);
   return Answer(reportOf(findingsFrom(facts)));

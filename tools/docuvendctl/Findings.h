@@ -31,6 +31,7 @@ struct MachineFacts {
   linux_platform::KernelFacilities kernel;
   Problem landlockProblem;  // restricting a process with it
   Problem launchProblem;    // starting a confined process
+  Problem placesProblem;    // what of the user's every application sees
   Problem bundlesProblem;   // who else can change what lies there
   std::optional<DaemonFacts> daemon;
   std::string daemonProblem;  // why there are no facts about it
