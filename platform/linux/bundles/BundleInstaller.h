@@ -10,8 +10,8 @@
 // writable by the user, and executable if the original is; it has no attributes of the original beside that. Anything else in a bundle is
 // refused, and so is one that is larger than an installer takes (BundleCopy.h).
 //
-// A bundle that claims a group of another's, or to say who its members are, is refused (GroupMembership.h). The user's directory is made for the
-// user alone, and closed to others who can write it.
+// A bundle that claims a group of another's, or to say who its members are, is refused (GroupMembership.h). The user's directory is
+// made for the user alone, and closed to others who can write it.
 //
 // A program that was started from the older copy or from a removed bundle keeps running, but opens no further file of its bundle.
 //
