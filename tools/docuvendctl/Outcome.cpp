@@ -56,7 +56,6 @@ ExitStatus statusOfCoordinationError(FileCoordinationErrorCode code) {
       return ExitStatus::deadlinePassed;
     case FileCoordinationErrorCode::invalidAccessID:
     case FileCoordinationErrorCode::tooManyAccesses:
-    case FileCoordinationErrorCode::tooManyChanges:
       break;
   }
   return ExitStatus::other;
