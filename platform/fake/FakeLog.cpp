@@ -1,5 +1,7 @@
 #include "platform/fake/FakeLog.h"
 
+#include <utility>
+
 #include "platform/fake/AssertedMessages.h"
 
 namespace docuvend::fake_platform {
@@ -25,6 +27,11 @@ FakeLog::FakeLog() : handle_(*this) {}
 void FakeLog::setEnabled(QXLogType type, FakeLogSwitch to) {
   const std::lock_guard lock(mutex_);
   enabled_[indexOf(type)] = to == FakeLogSwitch::on;
+}
+
+void FakeLog::onWrite(std::function<void(const FakeLogEntry&)> callback) {
+  const std::lock_guard lock(mutex_);
+  onWrite_ = std::move(callback);
 }
 
 std::vector<FakeLogEntry> FakeLog::entries() const {
@@ -63,9 +70,16 @@ bool FakeLog::Handle::isEnabled(QXLogType type) const {
 }
 
 void FakeLog::Handle::write(QXLogType type, const std::string& message) {
-  const std::lock_guard lock(log_.mutex_);
-  ++log_.writes_;
-  if (log_.enabled_[indexOf(type)]) log_.entries_.push_back({type, message, /*isWritten=*/true});
+  const FakeLogEntry entry{type, message, /*isWritten=*/true};
+  std::function<void(const FakeLogEntry&)> callback;
+  {
+    const std::lock_guard lock(log_.mutex_);
+    ++log_.writes_;
+    if (!log_.enabled_[indexOf(type)]) return;
+    log_.entries_.push_back(entry);
+    callback = log_.onWrite_;
+  }
+  if (callback) callback(entry);
 }
 
 }  // namespace docuvend::fake_platform

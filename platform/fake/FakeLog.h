@@ -7,6 +7,7 @@
 
 #include <array>
 #include <cstddef>
+#include <functional>
 #include <mutex>
 #include <ostream>
 #include <string>
@@ -37,6 +38,9 @@ class FakeLog final : public QXLogService {
   [[nodiscard]] QXLogHandle& defaultLog() override { return handle_; }
 
   void setEnabled(QXLogType type, FakeLogSwitch to);
+  // Called with each message that is kept, by its writer, when it is among the entries; instead of the callback that was set before. It may
+  // not write itself.
+  void onWrite(std::function<void(const FakeLogEntry&)> callback);
 
   // In the order of writing.
   [[nodiscard]] std::vector<FakeLogEntry> entries() const;
@@ -62,6 +66,7 @@ class FakeLog final : public QXLogService {
   std::array<bool, 4> enabled_{true, true, true, true};
   std::vector<FakeLogEntry> entries_;
   std::size_t writes_ = 0;
+  std::function<void(const FakeLogEntry&)> onWrite_;
 };
 
 }  // namespace docuvend::fake_platform

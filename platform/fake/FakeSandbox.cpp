@@ -19,6 +19,11 @@ void FakeSandbox::setAnswer(const std::string& path, int code) {
   answers_[path] = code;
 }
 
+void FakeSandbox::setZeroTokensAnswer(int code) {
+  const std::lock_guard lock(mutex_);
+  zeroTokensAnswer_ = code;
+}
+
 void FakeSandbox::setInvalidationError(std::optional<QXError> error) {
   const std::lock_guard lock(mutex_);
   invalidationError_ = std::move(error);
@@ -66,7 +71,8 @@ std::optional<QXError> FakeSandbox::invalidateReadWriteExtensions(const std::opt
 int FakeSandbox::checkWithoutReport(const QXAuditToken& token, std::string_view operation, const std::string& path) {
   const std::lock_guard lock(mutex_);
   checks_.push_back({token, std::string(operation), path});
-  if (token == QXAuditToken{} || (operation != kQXSandboxFileReadData && operation != kQXSandboxFileWriteData)) return kRefused;
+  if (token == QXAuditToken{}) return zeroTokensAnswer_;
+  if (operation != kQXSandboxFileReadData && operation != kQXSandboxFileWriteData) return kRefused;
   const auto found = answers_.find(path);
   return found == answers_.end() ? answer_ : found->second;
 }

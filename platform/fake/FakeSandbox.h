@@ -1,8 +1,9 @@
 // The sandbox in memory.
 //
 // Differs from the real one: a token is "token:" and the path, whatever lies at the path; the answer to a check is what the test has
-// set, whatever the operation, except that the zero token and any operation but reading and writing are refused as the platform refuses
-// them. Taking tokens back is recorded and changes nothing: nobody redeems them here. May be used from any thread.
+// set, whatever the operation, except that the zero token (until a test says otherwise) and any operation but reading and writing are
+// refused as the platform refuses them. Taking tokens back is recorded and changes nothing: nobody redeems them here. May be used from any
+// thread.
 #pragma once
 
 #include <functional>
@@ -35,6 +36,8 @@ class FakeSandbox final : public QXSandbox {
   void setAnswer(int code);
   // What a check of that path answers.
   void setAnswer(const std::string& path, int code);
+  // What every check for the zero token answers, instead of kRefused.
+  void setZeroTokensAnswer(int code);
 
   // What taking back answers from now on.
   void setInvalidationError(std::optional<QXError> error);
@@ -58,6 +61,7 @@ class FakeSandbox final : public QXSandbox {
   std::set<std::string> refused_;
   std::map<std::string, int> answers_;
   int answer_ = kRefused;
+  int zeroTokensAnswer_ = kRefused;
   std::vector<std::string> issueCalls_;
   std::vector<Check> checks_;
   std::vector<std::optional<std::string>> invalidations_;

@@ -253,6 +253,17 @@ TEST_F(DVRpcServicerBookmarkGrantsTest, TheCallersIdentifierIsLookedUpBeforeTheF
   EXPECT_EQ(platform_.log.texts().front(), kOpening);
 }
 
+TEST_F(DVRpcServicerBookmarkGrantsTest, TheSandboxIsAskedOnlyWhenTheCallerIsKnownAndTheFirstLineIsLogged) {
+  std::vector<std::pair<int, std::size_t>> askedAtEachLine;
+  platform_.log.onWrite([&](const auto&) {
+    askedAtEachLine.emplace_back(platform_.applicationRegistry.tokenQueryCount(), platform_.sandbox.checks().size());
+  });
+  extend(kReport, kStranger);
+  ASSERT_FALSE(askedAtEachLine.empty());
+  EXPECT_EQ(askedAtEachLine.front(), std::pair(1, std::size_t{0}));
+  EXPECT_EQ(platform_.sandbox.checks().size(), 1U);
+}
+
 // --- Arguments and provider
 
 TEST_F(DVRpcServicerBookmarkGrantsTest, AMissingURLIsNotPermitted) {

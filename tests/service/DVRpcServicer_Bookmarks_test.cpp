@@ -42,6 +42,12 @@ TEST_F(DVRpcServicerBookmarksTest, AnyClientGetsTheStringForAURLThatAProviderOwn
                                                       kReport.absoluteString() + "."}}));
 }
 
+TEST_F(DVRpcServicerBookmarksTest, TheFirstLineIsLoggedBeforeTheProviderIsLookedFor) {
+  toString(kReport);
+  EXPECT_EQ(platform_.log.entries().front(), kGettingString);
+  EXPECT_EQ(platform_.log.texts().at(1), "[INFO] Resolved URL to provider com.orvane.cellar.");
+}
+
 TEST_F(DVRpcServicerBookmarksTest, TheStringIsNoGrantAndAsksNothingOfTheCaller) {
   letConnectionGo();
   toString(kReport);

@@ -139,12 +139,19 @@ TEST_F(DVRpcServicerChecksTest, AClientThatHasGoneIsAskedAboutWithTheZeroToken) 
   EXPECT_EQ(platform_.sandbox.checks()[0].token, QXAuditToken{});
 }
 
+TEST_F(DVRpcServicerChecksTest, AClientThatHasGoneHasTheAccessThatTheSandboxGivesToTheZeroToken) {
+  platform_.sandbox.setZeroTokensAnswer(FakeSandbox::kAllowed);
+  letConnectionGo();
+  EXPECT_TRUE(servicer_->clientHasSandboxAccessToFile(kReport));
+}
+
 // --- Waking up
 
 TEST_F(DVRpcServicerChecksTest, WakingAnswersAnyClientOnTheGlobalQueue) {
   std::vector<std::string> queues;
   servicer_->wakeUpCompletion([&] { queues.push_back(platform_.queues.currentLabel()); });
   EXPECT_TRUE(queues.empty());
+  EXPECT_EQ(submittedAtLastLine_, 0U);
   platform_.queues.runAll();
   EXPECT_EQ(queues, std::vector<std::string>{fake_platform::kFakeGlobalQueueLabel});
   EXPECT_EQ(platform_.log.entries(), (Entries{{QXLogType::debug, "[DEBUG] Serving: wakeUpCompletion:"}}));
@@ -160,8 +167,9 @@ TEST_F(DVRpcServicerChecksTest, WakingChecksNothing) {
   EXPECT_EQ(platform_.applicationRegistry.tokenQueryCount(), 0);
 }
 
-TEST_F(DVRpcServicerChecksTest, WakingWithoutAReplyHandlerIsHarmless) {
+TEST_F(DVRpcServicerChecksTest, WakingWithoutAReplyHandlerIsATaskThatCallsNothing) {
   servicer_->wakeUpCompletion(/*completion=*/{});
+  EXPECT_EQ(platform_.queues.pendingOnGlobalQueue(), 1U);
   platform_.queues.runAll();
 }
 

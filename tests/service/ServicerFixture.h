@@ -53,6 +53,7 @@ class ServicerFixture : public testing::Test {
     connection_->setAuditToken(token_);
     platform_.applicationRegistry.setBundleIdentifier(token_, kEditor.value);
     servicer_ = std::make_shared<DVRpcServicer>(source_, connection_);
+    platform_.log.onWrite([this](const auto&) { submittedAtLastLine_ = platform_.queues.pendingOnGlobalQueue(); });
   }
 
   // Has both providers discovered and registered. What was logged and asked until then is forgotten.
@@ -132,6 +133,7 @@ class ServicerFixture : public testing::Test {
   const Answer& earlyAnswer() {
     EXPECT_TRUE(answers_.empty());
     EXPECT_EQ(platform_.queues.pendingOnGlobalQueue(), 1U);
+    EXPECT_EQ(submittedAtLastLine_, 0U) << "what the operation logs is logged before the task is submitted";
     platform_.queues.runAll();
     EXPECT_EQ(answers_.size(), 1U);
     if (answers_.empty()) answers_.emplace_back();
@@ -170,6 +172,7 @@ class ServicerFixture : public testing::Test {
   std::shared_ptr<fake_platform::FakeRpcConnection> connection_ = fake_platform::FakeRpcConnection::create();
   std::shared_ptr<DVRpcServicer> servicer_;
   std::vector<Answer> answers_;
+  std::size_t submittedAtLastLine_ = 0;  // tasks that waited on the global queue when the latest line was logged
 
  private:
   static constexpr std::string_view kInLinesOfForwardedOperations = " for extension com.orvane.";
