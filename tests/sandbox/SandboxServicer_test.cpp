@@ -197,6 +197,7 @@ TEST_F(SandboxServicerTest, MakesAnotherBundlesReplacementWhileOneWaitsForTheDis
   StuckDisk disk;
   auto replacement = replacing(issued(document), issued(sibling));
   ASSERT_TRUE(disk.awaitFlush());
+  const auto waiting = connection;
   connectAs(peers.add(confined("com.example.other", "9")));
   EXPECT_EQ(replace(issued(another), issued(storage + "/.another.txt")), std::nullopt);
   EXPECT_EQ(testing::read(another), "");
