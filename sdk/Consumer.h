@@ -164,7 +164,8 @@ class Consumer {
   //
   // Failures. `deadlinePassed`: the library has given the turn up. Of QXFileCoordinationErrorDomain: notPermitted (2), this process can
   // reach the file in that way neither by its path nor by the token; wouldDeadlock (5), those who have the file wait for this thread's
-  // accesses: end them and try again; ended (6), the daemon has given the turn up; tooManyAccesses (7), over this Consumer's connection;
+  // accesses: end them and try again; ended (6), the daemon has given the turn up; tooManyAccesses (7), of this Consumer's connection
+  // or of the application; tooManyChanges (9), of a write: the provider has not been told yet of too much that the application has written;
   // noDirectory (8), there is none where the file would be; noProvider (3), only an uninstalled provider could bring the contents. Of
   // DVErrorDomain: the provider could not bring the contents (7), or is not there.
   [[nodiscard]] Result<CoordinatedAccess> coordinateReading(const QXURL& url, const CoordinationOptions& options = {});

@@ -1,5 +1,6 @@
 #include "platform/linux/coordination/FileAccesses.h"
 
+#include <gmock/gmock.h>
 #include <gtest/gtest.h>
 
 #include <functional>
@@ -347,6 +348,67 @@ TEST_F(FileAccessesTest, ForgetsARequestWhoseProcessHasNoTurnAnyMore) {
   read(item, a);
   EXPECT_EQ(news(), Events{"asked for /storage/item"}) << "the turn is another one";
   end(writer);
+}
+
+// ---- limits
+
+TEST_F(FileAccessesTest, LetsOneApplicationHaveALimitedNumberOfAccessesOverAllItsProcesses) {
+  const auto of = [this](const std::string& name, const std::optional<std::string>& application, std::uint8_t process) {
+    FileAccess made = access("/other/" + name, AccessKind::reading, partyOf(process));
+    made.holder.bundleIdentifier = application;
+    return begin(made);
+  };
+  const auto last = [this] { return news().back(); };
+  for (const auto& [application, most] :
+       {std::pair(std::optional<std::string>("com.example.many"), FileAccesses::kMaximumAccessesOfApplication),
+        std::pair(std::optional<std::string>(), FileAccesses::kMaximumUnconfinedAccesses)}) {
+    AccessNumber number = 0;
+    for (std::size_t i = 0; i < most; ++i) {
+      number = of(std::to_string(i), application, static_cast<std::uint8_t>(1 + i % 4));
+      ASSERT_EQ(last(), std::to_string(number) + " begun");
+    }
+    const AccessNumber refused = of("one more", application, 5);
+    EXPECT_THAT(last(), ::testing::StartsWith(std::to_string(refused) + " failed: QXFileCoordinationErrorDomain 7"));
+    EXPECT_EQ(state(refused), "over");
+    EXPECT_EQ(state(begin(access("/other/one more", AccessKind::writing, d))), "holding") << "another application, and nobody before it";
+    end(number);
+    EXPECT_EQ(state(of("one more again", application, 5)), "holding");
+  }
+}
+
+TEST_F(FileAccessesTest, AskALimitedNumberOfFilesAtATimeForOneApplicationThoughReadsAreGivenUp) {
+  constexpr std::size_t kMost = Provisions::kMaximumRequestsUnderWay;
+  const auto file = [](std::size_t number) { return "/storage/" + std::to_string(number); };
+  for (std::size_t i = 0; i < kMost + 100; ++i) end(read(file(i), a));
+  EXPECT_EQ(provider->asked.size(), kMost) << "those that are given up go on, and no more are asked for";
+  const AccessNumber reader = read(file(1000), a);
+  const AccessNumber next = read(file(1001), a);
+  EXPECT_EQ(provider->asked.size(), kMost);
+  EXPECT_EQ(state(reader), "providing");
+  read(file(2000), b);
+  EXPECT_EQ(provider->asked.size(), kMost + 1) << "another application is not concerned";
+  answer(3);
+  ASSERT_EQ(provider->asked.size(), kMost + 2);
+  EXPECT_EQ(provider->asked.back().url.fileSystemPath(), file(1000));
+  EXPECT_EQ(provider->asked.back().reader.substr(0, 11), "reader 101-");
+  answer(4, broken);
+  EXPECT_EQ(provider->asked.size(), kMost + 3);
+  news();
+  answer(kMost + 1);
+  answer(kMost + 2, broken);
+  EXPECT_EQ(news(), (Events{std::to_string(reader) + " begun", std::to_string(next) + brokenText}));
+}
+
+TEST_F(FileAccessesTest, AskWhoeverHasReplacedAProviderForThoseWhoWaitedUntilTheyMightAsk) {
+  for (std::size_t i = 0; i <= Provisions::kMaximumRequestsUnderWay; ++i) read("/storage/" + std::to_string(i), a);
+  const auto next = std::make_shared<RecordingProvider>(QXURL::fileURL("/storage", QXURLKind::directory));
+  coordinator._addDocuvend(next);
+  EXPECT_TRUE(next->asked.empty());
+  coordinator._removeDocuvend(provider);
+  ASSERT_EQ(next->asked.size(), 1U);
+  EXPECT_EQ(next->asked[0].url.fileSystemPath(), "/storage/" + std::to_string(Provisions::kMaximumRequestsUnderWay));
+  for (std::size_t i = 0; i < Provisions::kMaximumRequestsUnderWay; ++i) answer(i);
+  EXPECT_EQ(provider->asked.size(), Provisions::kMaximumRequestsUnderWay);
 }
 
 // ---- writing

@@ -61,6 +61,56 @@ TEST_F(FinishedWriting, IsToldByTheAccessWithinOne) {
   EXPECT_EQ(provider->told.size(), 2U) << "there is no access any more";
 }
 
+// Names need not be files: without a limit an application could have the daemon keep any number of them.
+TEST_F(FinishedWriting, IsRefusedLikeANewWriteWhileTheProviderHasNotHeardOfTooMuchOfTheSameApplication) {
+  provider->isSlow = true;
+  const auto numbered = [this](std::size_t number) { return QXURL::fileURL(storage + "/none" + std::to_string(number), QXURLKind::file); };
+  const auto writer = client(unconfinedAs("com.example.editor"));
+  const QXURL begun = numbered(100000);
+  expectSuccess(*writer.write(begun, accessID(1)));
+  constexpr std::size_t kMost = ChangeNotices::kMaximumNoticesUnderWay + ChangeNotices::kMaximumUntoldFiles;
+  for (std::size_t i = 0; i < kMost; ++i) expectSuccess(*writer.didFinishWriting(numbered(i)));
+  const auto refused = writer.didFinishWriting(numbered(kMost));
+  expectError(*refused, FileCoordinationErrorCode::tooManyChanges);
+  EXPECT_EQ((*refused)[0]->url, numbered(kMost));
+  const auto again = client(unconfinedAs("com.example.editor"));
+  expectError(*again.write(numbered(kMost), accessID(1)), FileCoordinationErrorCode::tooManyChanges);
+  expectSuccess(*again.didFinishWriting(numbered(kMost - 1)));
+  EXPECT_TRUE(again.read(numbered(kMost), accessID(1))->empty()) << "it may read";
+  expectSuccess(*again.write(plain, accessID(2)));
+  expectSuccess(*client(unconfinedAs("com.example.other")).didFinishWriting(numbered(kMost + 1)));
+  EXPECT_EQ(provider->told.back().second, numbered(kMost + 1)) << "others are told of at once";
+  expectSuccess(*writer.end(accessID(1)));
+
+  provider->answer();
+  expectError(*writer.didFinishWriting(numbered(kMost)), FileCoordinationErrorCode::tooManyChanges);
+  provider->answer();
+  expectSuccess(*writer.didFinishWriting(numbered(kMost)));
+  expectError(*writer.didFinishWriting(numbered(kMost + 2)), FileCoordinationErrorCode::tooManyChanges);
+  while (!provider->unanswered.empty()) provider->answer();
+  EXPECT_EQ(provider->told.size(), kMost + 3) << "what had begun is told, and nothing is lost";
+  EXPECT_EQ(provider->told[provider->told.size() - 2].second, begun);
+}
+
+TEST_F(FinishedWriting, IsRefusedOnceTooMuchIsKeptForAProviderThatIsNotRegistered) {
+  const auto numbered = [this](std::size_t number) { return QXURL::fileURL(storage + "/none" + std::to_string(number), QXURLKind::file); };
+  LinuxFileCoordinator waiting(fileSystem, {.installedStorages = [this] {
+                                 return std::vector<InstalledStorage>{{kProvider, QXURL::fileURL(storage, QXURLKind::directory)}};
+                               }});
+  FileAccesses waitingAccesses(waiting);
+  const FileCoordinationServicer::Surroundings around{waiting, waitingAccesses, sandbox, peers};
+  const testing::CoordinationClient writer(around, unconfinedAs("com.example.editor"));
+  for (std::size_t i = 0; i < ChangeNotices::kMaximumUntoldFiles; ++i) expectSuccess(*writer.didFinishWriting(numbered(i)));
+  expectError(*writer.didFinishWriting(item), FileCoordinationErrorCode::tooManyChanges);
+  expectError(*writer.write(item, accessID(1)), FileCoordinationErrorCode::tooManyChanges);
+  expectSuccess(*testing::CoordinationClient(around, unconfinedAs("com.example.other")).didFinishWriting(item));
+  waiting.installedStoragesChanged();
+  expectError(*writer.didFinishWriting(item), FileCoordinationErrorCode::tooManyChanges);
+  waiting._addDocuvend(provider);
+  EXPECT_EQ(provider->told.size(), ChangeNotices::kMaximumUntoldFiles + 1);
+  expectSuccess(*writer.didFinishWriting(item));
+}
+
 TEST_F(FinishedWriting, IsNotToldByAnAccessToAnotherFileOrOfAnotherProcessOrForReading) {
   const auto writer = anybody();
   expectSuccess(*writer.write(plain, accessID(1)));

@@ -13,7 +13,9 @@
 #include "platform/linux/bundles/BundleScan.h"
 #include "platform/linux/coordination/AccessSession.h"
 #include "platform/linux/coordination/ChangeNotices.h"
+#include "platform/linux/coordination/FileAccesses.h"
 #include "platform/linux/coordination/FileCoordinationServicer.h"
+#include "platform/linux/coordination/Provisions.h"
 #include "platform/linux/extension_host/LineAllowance.h"
 #include "platform/linux/extension_host/OutputLines.h"
 #include "platform/linux/files/property_list_scalars.h"
@@ -60,7 +62,14 @@ std::vector<Limit> limits() {
           {"kMaximumCallBytesPerPeer", kMaximumCallBytesPerPeer},
           {"kMaximumUnconfinedCallBytes", kMaximumUnconfinedCallBytes},
           {"kMaximumAccesses", AccessSession::kMaximumAccesses},
+          {"kMaximumAccessesOfApplication", FileAccesses::kMaximumAccessesOfApplication},
+          {"kMaximumUnconfinedAccesses", FileAccesses::kMaximumUnconfinedAccesses},
+          {"Provisions::kMaximumRequestsUnderWay", Provisions::kMaximumRequestsUnderWay},
           {"ChangeNotices::kMaximumNoticesUnderWay", ChangeNotices::kMaximumNoticesUnderWay},
+          {"ChangeNotices::kMaximumUntoldFiles", ChangeNotices::kMaximumUntoldFiles},
+          {"ChangeNotices::kMaximumUntoldBytes", ChangeNotices::kMaximumUntoldBytes},
+          {"ChangeNotices::kMaximumUnconfinedUntoldFiles", ChangeNotices::kMaximumUnconfinedUntoldFiles},
+          {"ChangeNotices::kMaximumUnconfinedUntoldBytes", ChangeNotices::kMaximumUnconfinedUntoldBytes},
           {"kMaximumHoldersNamed", FileCoordinationServicer::kMaximumHoldersNamed},
           {"kDVMaximumGrantsOfPage", kDVMaximumGrantsOfPage},
           {"kDVMaximumTextBytesOfPage", kDVMaximumTextBytesOfPage},

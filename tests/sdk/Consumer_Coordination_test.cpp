@@ -124,7 +124,7 @@ TEST_F(ConsumerCoordinationTest, ErrorsComeThroughAsTheyWereAnsweredAndNothingIs
   for (const QXError& error :
        {coordinationError(FileCoordinationErrorCode::notPermitted), coordinationError(FileCoordinationErrorCode::wouldDeadlock),
         coordinationError(FileCoordinationErrorCode::ended), coordinationError(FileCoordinationErrorCode::tooManyAccesses),
-        coordinationError(FileCoordinationErrorCode::noDirectory), badToken(),
+        coordinationError(FileCoordinationErrorCode::noDirectory), coordinationError(FileCoordinationErrorCode::tooManyChanges), badToken(),
         DVPluginOperationFailedError(QXError::make("Test", 1, "no contents"))}) {
     script_.accessing = [&error](const QXFileCoordination::ErrorReply& reply) { reply(error); };
     EXPECT_EQ(std::get<QXError>(consumer_->coordinateReading(url())), error);

@@ -58,6 +58,7 @@ TEST(Outcome, AKindOfFailureHasAStatusOfItsOwn) {
       {coordination(FileCoordinationErrorCode::ended), ExitStatus::deadlinePassed},
       {coordination(FileCoordinationErrorCode::invalidAccessID), ExitStatus::other},
       {coordination(FileCoordinationErrorCode::tooManyAccesses), ExitStatus::other},
+      {coordination(FileCoordinationErrorCode::tooManyChanges), ExitStatus::other},
       {bundle(BundleErrorCode::noBundle), ExitStatus::invalidInput},
       {bundle(BundleErrorCode::forbidden), ExitStatus::invalidInput},
       {bundle(BundleErrorCode::tooLarge), ExitStatus::invalidInput},

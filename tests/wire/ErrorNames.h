@@ -101,6 +101,8 @@ inline const char* nameOf(linux_platform::FileCoordinationErrorCode code) {
       return "tooManyAccesses";
     case noDirectory:
       return "noDirectory";
+    case tooManyChanges:
+      return "tooManyChanges";
   }
   return nullptr;
 }

@@ -201,7 +201,11 @@ TEST_F(ProtocolPageTest, GivesTheLimits) {
       {"bytes of such requests of all unconfined processes together",
        std::to_string(kMaximumUnconfinedCallBytes) + "; one more fails with error 5"},
       {"accesses of one connection to `com.orvane.FileCoordination`",
-       std::to_string(AccessSession::kMaximumAccesses) + "; one more is refused"}};
+       std::to_string(AccessSession::kMaximumAccesses) + "; one more is refused"},
+      {"accesses of one application, over all its connections",
+       std::to_string(FileAccesses::kMaximumAccessesOfApplication) + "; one more is refused"},
+      {"accesses of all unconfined processes together",
+       std::to_string(FileAccesses::kMaximumUnconfinedAccesses) + "; one more is refused"}};
   for (const auto& limit : limits) EXPECT_EQ(row("Limits", limit.first), (std::vector{limit.first, limit.second}));
   EXPECT_EQ(rows("Limits").size(), limits.size());
   EXPECT_TRUE(tells("Frames", ", at most " + std::to_string(kMaximumFrameBytes) + " |"));

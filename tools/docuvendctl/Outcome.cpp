@@ -56,6 +56,7 @@ ExitStatus statusOfCoordinationError(FileCoordinationErrorCode code) {
       return ExitStatus::deadlinePassed;
     case FileCoordinationErrorCode::invalidAccessID:
     case FileCoordinationErrorCode::tooManyAccesses:
+    case FileCoordinationErrorCode::tooManyChanges:
       break;
   }
   return ExitStatus::other;

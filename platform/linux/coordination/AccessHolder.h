@@ -6,9 +6,12 @@
 
 namespace docuvend::linux_platform {
 
+// By what accesses, changes and requests are counted: a bundle. All processes without one are as one.
+using Application = std::optional<std::string>;
+
 struct AccessHolder {
   int processIdentifier = 0;
-  std::optional<std::string> bundleIdentifier;  // of an application; all processes without one are as one
+  Application bundleIdentifier;  // of an application
 };
 
 }  // namespace docuvend::linux_platform

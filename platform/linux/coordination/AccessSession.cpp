@@ -40,7 +40,7 @@ void AccessSession::begin(const QXUUID& id, FileAccess access, Answer answer) {
   const AccessNumber number = accesses_.newNumber();
   {
     const std::lock_guard lock(mutex_);
-    [[maybe_unused]] const bool isNew = entries_.emplace(id, Shared{number, access.file, access.url}).second;
+    [[maybe_unused]] const bool isNew = entries_.emplace(id, Shared{number}).second;
     assert(isNew);
   }
   accesses_.begin(number, std::move(access),
@@ -84,16 +84,16 @@ void AccessSession::end(const std::optional<QXUUID>& id, Answer answer) {
 }
 
 std::variant<std::optional<BytesPresent>, QXError> AccessSession::progressOf(const std::optional<QXUUID>& id) const {
-  std::optional<Entry> entry;
+  std::optional<AccessNumber> number;
   {
     const std::lock_guard lock(mutex_);
     const auto found = id ? entries_.find(*id) : entries_.end();
     if (found == entries_.end()) return noSuchAccess();
-    entry = found->second;
+    if (const auto* shared = std::get_if<Shared>(&found->second)) number = shared->number;
   }
-  const auto* shared = std::get_if<Shared>(&*entry);
-  if (shared == nullptr || accesses_.stateOf(shared->number) != AccessState::providing) return std::nullopt;
-  return BytesPresent::of(shared->file, shared->url);
+  const auto file = number ? accesses_.beingProvided(*number) : std::nullopt;
+  if (!file) return std::nullopt;
+  return BytesPresent::of(file->key, file->url);
 }
 
 // An access that is ended before it has begun is forgotten with its request's answer, upon which the peer may use its identifier anew, and

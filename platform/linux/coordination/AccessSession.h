@@ -46,8 +46,6 @@ class AccessSession : public std::enable_shared_from_this<AccessSession> {
  private:
   struct Shared {
     AccessNumber number;
-    FileKey file;
-    QXURL url;
     bool isEnding = false;
   };
   struct Exempt {};

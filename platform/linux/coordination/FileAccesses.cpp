@@ -27,11 +27,15 @@ QXError endedBeforeItBegan(const QXURL& url) {
   return makeCoordinationError(FileCoordinationErrorCode::ended, "the access was ended before it had begun", url);
 }
 
+QXError tooManyAccesses(const QXURL& url) {
+  return makeCoordinationError(FileCoordinationErrorCode::tooManyAccesses, "the application has as many accesses as it may have", url);
+}
+
 }  // namespace
 
 FileAccesses::FileAccesses(LinuxFileCoordinator& coordinator) : coordinator_(coordinator) {
   // This outlives every registration.
-  coordinator_.setRegistrationHandler([this] { lookAgainForAwaited(); });
+  coordinator_.setRegistrationHandler([this] { lookAgain(); });
 }
 
 FileAccesses::~FileAccesses() { coordinator_.setRegistrationHandler({}); }
@@ -43,16 +47,25 @@ void FileAccesses::begin(AccessNumber number, FileAccess access, Answer answer) 
   {
     const std::lock_guard lock(mutex_);
     assert(!entries_.contains(number));
-    const AccessTable::Entry entered = table_.enter(number, access.file, access.kind, access.party);
-    Entry entry{std::move(access), Stage::waiting, std::move(answer)};
-    if (entered == AccessTable::Entry::wouldDeadlock) {
-      answerWith(entry, wouldDeadlock(entry.access.url), consequences);
-    } else {
-      entries_.emplace(number, std::move(entry));
-      if (entered == AccessTable::Entry::hasTurn) takeTurn(number, consequences);
-    }
+    enter(number, {std::move(access), Stage::waiting, std::move(answer)}, consequences);
   }
   carryOut(std::move(consequences));
+}
+
+void FileAccesses::enter(AccessNumber number, Entry entry, Consequences& consequences) {
+  const FileAccess& access = entry.access;
+  const Application application = access.holder.bundleIdentifier;
+  if (!hasRoomFor(application)) return answerWith(entry, tooManyAccesses(access.url), consequences);
+  const AccessTable::Entry entered = table_.enter(number, access.file, access.kind, access.party);
+  if (entered == AccessTable::Entry::wouldDeadlock) return answerWith(entry, wouldDeadlock(access.url), consequences);
+  entries_.emplace(number, std::move(entry));
+  ++counts_[application];
+  if (entered == AccessTable::Entry::hasTurn) takeTurn(number, consequences);
+}
+
+bool FileAccesses::hasRoomFor(const Application& application) const {
+  const auto count = counts_.find(application);
+  return count == counts_.end() || count->second < (application ? kMaximumAccessesOfApplication : kMaximumUnconfinedAccesses);
 }
 
 void FileAccesses::end(AccessNumber number, std::function<void()> ended) {
@@ -120,6 +133,8 @@ void FileAccesses::remove(AccessNumber number, Consequences& consequences) {
   const auto found = entries_.find(number);
   const FileAccess access = std::move(found->second.access);
   entries_.erase(found);
+  const auto count = counts_.find(access.holder.bundleIdentifier);
+  if (--count->second == 0) counts_.erase(count);
   provisions_.leave(number);
   awaiting_.erase(number);
   const std::vector<AccessNumber> come = table_.leave(number);
@@ -132,18 +147,23 @@ void FileAccesses::carryOut(Consequences consequences) {
     if (answer) answer();
   }
   for (const Reader& reader : consequences.readers) provide(reader);
+  for (const Question& question : consequences.questions) ask(question);
 }
 
 void FileAccesses::provide(const Reader& reader) {
   const FileOwner owner = coordinator_.ownerOf({reader.file, reader.url}, LinuxFileCoordinator::DirectoryItself::doesNotCount);
-  std::optional<Provisions::Joined> joined;
+  bool waitsForOwner = owner.awaited.has_value();
   Consequences consequences;
   {
     const std::lock_guard lock(mutex_);
     const auto found = entries_.find(reader.number);
     if (found == entries_.end()) return;
     if (owner.provider) {
-      joined = provisions_.join(owner.provider, reader.file, reader.number, reader.process);
+      const auto joined = provisions_.join(owner.provider, reader.file, reader.number, reader.process, reader.holder.bundleIdentifier);
+      waitsForOwner = joined.wait == Provisions::Wait::inLine;
+      if (joined.wait == Provisions::Wait::forNewRequest) {
+        consequences.questions.push_back(question(owner.provider, {joined.request, reader.number}));
+      }
     } else if (owner.awaited) {
       awaiting_.insert(reader.number);
     } else if (owner.failure) {
@@ -154,18 +174,28 @@ void FileAccesses::provide(const Reader& reader) {
     }
   }
   carryOut(std::move(consequences));
-  if (owner.awaited && coordinator_.hasChangedSince(owner)) lookAgainForAwaited();
-  if (!joined || joined->wait == Provisions::Wait::forRunningRequest) return;
-  // This outlives the request.
-  coordinator_.askToProvide(owner.provider, reader.holder.processIdentifier, reader.url,
-                            [this, request = joined->request](const std::optional<QXError>& error) { requestIsAnswered(request, error); });
+  if (waitsForOwner && coordinator_.hasChangedSince(owner)) lookAgain();
 }
 
-void FileAccesses::lookAgainForAwaited() {
+FileAccesses::Question FileAccesses::question(const std::shared_ptr<QXDocuvend>& provider, const Provisions::Question& asked) const {
+  const FileAccess& access = entries_.at(asked.number).access;
+  return {provider, asked.request, access.holder.processIdentifier, access.url};
+}
+
+void FileAccesses::ask(const Question& question) {
+  // This outlives the request.
+  coordinator_.askToProvide(question.provider, question.readerProcess, question.url,
+                            [this, request = question.request](const std::optional<QXError>& error) { requestIsAnswered(request, error); });
+}
+
+// Also for those who wait until they may ask: the object that they would ask may have been replaced.
+void FileAccesses::lookAgain() {
   Consequences consequences;
   {
     const std::lock_guard lock(mutex_);
-    for (const AccessNumber number : std::exchange(awaiting_, {})) consequences.readers.push_back(reader(number, entries_.at(number)));
+    std::set<AccessNumber> numbers = provisions_.leaveLines();
+    numbers.merge(std::exchange(awaiting_, {}));
+    for (const AccessNumber number : numbers) consequences.readers.push_back(reader(number, entries_.at(number)));
   }
   carryOut(std::move(consequences));
 }
@@ -182,6 +212,7 @@ void FileAccesses::requestIsAnswered(ProvideRequest request, const std::optional
     const std::lock_guard lock(mutex_);
     finished = provisions_.finish(request);
     if (!finished) return;
+    if (finished->next) consequences.questions.push_back(question(finished->provider, *finished->next));
     if (!error) {
       for (const QXAuditToken& process : finished->processes) {
         if (table_.hasTurn(process, finished->file)) provisions_.noteProvided(finished->file, process);
@@ -216,6 +247,13 @@ std::optional<AccessState> FileAccesses::stateOf(AccessNumber number) const {
   const auto found = entries_.find(number);
   if (found == entries_.end()) return std::nullopt;
   return stateOf(found->second.stage);
+}
+
+std::optional<KeyedFile> FileAccesses::beingProvided(AccessNumber number) const {
+  const std::lock_guard lock(mutex_);
+  const auto found = entries_.find(number);
+  if (found == entries_.end() || found->second.stage != Stage::providing) return std::nullopt;
+  return KeyedFile{found->second.access.file, found->second.access.url};
 }
 
 AccessState FileAccesses::stateOf(Stage stage) {

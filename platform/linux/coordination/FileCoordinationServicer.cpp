@@ -85,12 +85,16 @@ void FileCoordinationServicer::coordinate(AccessKind kind, const Request& reques
   if (const auto* refusal = std::get_if<QXError>(&admission)) return completionHandler(*refusal);
   const auto& [peer, file] = std::get<Admitted>(admission);
   const PeerIdentity& caller = *peer;
-  if (isExempt(caller, surroundings_.coordinator.ownerOf(file, LinuxFileCoordinator::DirectoryItself::counts))) {
+  const FileOwner owner = surroundings_.coordinator.ownerOf(file, LinuxFileCoordinator::DirectoryItself::counts);
+  if (isExempt(caller, owner)) {
     session_->beginExempt(*request.accessID);
     return completionHandler(/*error=*/{});
   }
-  FileAccess access{file.key, file.url, kind, AccessParty{caller.token, request.party.value_or(0)},
-                    AccessHolder{caller.pid, caller.bundleIdentifier}};
+  const AccessHolder holder{caller.pid, caller.bundleIdentifier};
+  if (kind == AccessKind::writing) {
+    if (auto refusal = surroundings_.coordinator.refusalOfWrite(owner, holder, file)) return completionHandler(std::move(refusal));
+  }
+  FileAccess access{file.key, file.url, kind, AccessParty{caller.token, request.party.value_or(0)}, holder};
   session_->begin(*request.accessID, std::move(access), std::move(completionHandler));
 }
 
@@ -132,7 +136,9 @@ void FileCoordinationServicer::writerDidFinishWritingForURL(std::optional<QXURL>
     return completionHandler(makeCoordinationError(FileCoordinationErrorCode::noProvider, "the file belongs to no provider", url));
   }
   if (isExempt(caller, owner)) return completionHandler(/*error=*/{});
-  surroundings_.coordinator.tellFinishedWriting(owner, {caller.pid, caller.bundleIdentifier}, file,
+  const AccessHolder writer{caller.pid, caller.bundleIdentifier};
+  if (auto refusal = surroundings_.coordinator.refusalOfWrite(owner, writer, file)) return completionHandler(std::move(refusal));
+  surroundings_.coordinator.tellFinishedWriting(owner, writer, file,
                                                 [completionHandler = std::move(completionHandler)] { completionHandler(/*error=*/{}); });
 }
 

@@ -35,6 +35,12 @@ class LinuxFileCoordinator::NoticeUnderWay {
   const FileKey file_;
 };
 
+std::optional<ChangeNotices::Owner> FileOwner::known() const {
+  if (provider) return provider;
+  if (awaited) return *awaited;
+  return std::nullopt;
+}
+
 void LinuxFileCoordinator::_addDocuvend(std::shared_ptr<QXDocuvend> provider) {
   if (!provider) return;
   {
@@ -91,16 +97,27 @@ void LinuxFileCoordinator::callHandler() {
   if (handler) handler();
 }
 
+// What is untold is at every moment noted at the owner that it had or at the one that it has now, so that it is counted and not lost. An
+// owner may be gone when it is noted there: then it is all looked at again.
 void LinuxFileCoordinator::tellUntold() {
-  const auto registered = providers();
-  std::map<FileKey, FileChange> untold;
-  {
-    const std::lock_guard lock(mutex_);
-    for (FileChange& change : notices_.takeFromAllBut(registered)) untold_.insert_or_assign(change.file.key, std::move(change));
-    untold.swap(untold_);
-  }
-  for (const auto& [key, change] : untold) {
-    tellFinishedWriting(ownerOf(change.file, DirectoryItself::counts), change.writer, change.file, /*told=*/{});
+  for (bool isOutdated = true; isOutdated;) {
+    isOutdated = false;
+    const auto registered = providers();
+    std::vector<ChangeNotices::Untold> all;
+    {
+      const std::lock_guard lock(mutex_);
+      all = notices_.untoldOfAllBut(registered);
+    }
+    for (const ChangeNotices::Untold& untold : all) {
+      const FileOwner owner = ownerOf(untold.file, DirectoryItself::counts);
+      std::optional<ChangeNotices::Notice> notice;
+      {
+        const std::lock_guard lock(mutex_);
+        notice = notices_.move(untold, owner.known());
+      }
+      if (notice) begin(*notice, /*told=*/{});
+      isOutdated = isOutdated || (!notice && owner.known() && hasChangedSince(owner));
+    }
   }
 }
 
@@ -168,32 +185,38 @@ void LinuxFileCoordinator::askToProvide(const std::shared_ptr<QXDocuvend>& provi
   });
 }
 
+std::optional<QXError> LinuxFileCoordinator::refusalOfWrite(const FileOwner& owner, const AccessHolder& writer,
+                                                            const KeyedFile& file) const {
+  const auto known = owner.known();
+  if (!known) return std::nullopt;
+  const std::lock_guard lock(mutex_);
+  if (notices_.hasRoomFor(*known, writer.bundleIdentifier, file)) return std::nullopt;
+  return makeCoordinationError(FileCoordinationErrorCode::tooManyChanges,
+                               "the provider has not been told yet of too much that the caller has written", file.url);
+}
+
 void LinuxFileCoordinator::tellFinishedWriting(const FileOwner& owner, const AccessHolder& writer, const KeyedFile& file,
                                                std::function<void()> told) {
-  const FileChange change{writer, file};
-  bool beginsNow = false;
-  {
+  std::optional<ChangeNotices::Notice> notice;
+  const auto known = owner.known();
+  if (known) {
     const std::lock_guard lock(mutex_);
-    if (owner.provider) {
-      beginsNow = notices_.add(owner.provider, change);
-    } else if (owner.awaited) {
-      untold_.insert_or_assign(file.key, change);
-    }
+    notice = notices_.add(*known, {file, {{writer.bundleIdentifier, writer.processIdentifier}}});
   }
-  if (beginsNow) {
-    begin({owner.provider, change}, std::move(told));
+  if (notice) {
+    begin(*notice, std::move(told));
     return;
   }
-  if ((owner.provider || owner.awaited) && hasChangedSince(owner)) tellUntold();
+  if (known && hasChangedSince(owner)) tellUntold();
   if (told) told();
 }
 
 void LinuxFileCoordinator::begin(const ChangeNotices::Notice& notice, std::function<void()> told) {
-  const auto& [provider, change] = notice;
-  auto untilTold = std::make_shared<const NoticeUnderWay>(*this, provider, change.file.key);
-  onItsQueue(*provider, [provider = provider, name = nameFor("writer", change.writer.processIdentifier), untilTold = std::move(untilTold),
-                         file = change.file.url, told = std::move(told)]() mutable {
-    provider->_writerWithID({std::move(name), std::move(untilTold)}, file);
+  const auto& [provider, file, writer] = notice;
+  auto untilTold = std::make_shared<const NoticeUnderWay>(*this, provider, file.key);
+  onItsQueue(*provider, [provider = provider, name = nameFor("writer", writer.processIdentifier), untilTold = std::move(untilTold),
+                         url = file.url, told = std::move(told)]() mutable {
+    provider->_writerWithID({std::move(name), std::move(untilTold)}, url);
     if (told) told();
   });
 }

@@ -16,7 +16,6 @@
 #include <cstddef>
 #include <cstdint>
 #include <functional>
-#include <map>
 #include <memory>
 #include <mutex>
 #include <optional>
@@ -38,6 +37,9 @@ struct FileOwner {
   std::optional<std::string> awaited;  // the bundle of a provider that is installed and not registered
   std::optional<QXError> failure;      // it cannot be known; or it is nobody's, and its contents are not there
   std::uint64_t changes = 0;           // of registrations and installed providers, up to when the look began
+
+  // None for a file of nobody's, or of one that cannot be known.
+  [[nodiscard]] std::optional<ChangeNotices::Owner> known() const;
 };
 
 // Where the provider of an installed bundle keeps its items, whether or not it is registered or the directory is there.
@@ -85,6 +87,8 @@ class LinuxFileCoordinator final : public QXFileCoordinator {
   // `completion` comes as the object has it: on any thread, also inside the call, and perhaps twice.
   void askToProvide(const std::shared_ptr<QXDocuvend>& provider, int readerProcess, const QXURL& file,
                     QXDocuvend::ProvideCompletion completion);
+  // Why nobody of that application may write the file now: its owner is still to be told of as much as one application may have written.
+  [[nodiscard]] std::optional<QXError> refusalOfWrite(const FileOwner& owner, const AccessHolder& writer, const KeyedFile& file) const;
   // Tells the file's owner that a writer has finished with it, under an identifier that no other writer has; `told` runs after that, and
   // at once when there is no owner, or when it will be told later: one that is awaited or is being told already. It hears of several writes
   // to one file once then.
@@ -114,7 +118,6 @@ class LinuxFileCoordinator final : public QXFileCoordinator {
   // Guarded by mutex_.
   std::vector<Registration> registrations_;  // in the order of the first additions
   ChangeNotices notices_;
-  std::map<FileKey, FileChange> untold_;  // of providers that are not registered
   std::function<void()> registrationHandler_;
 };
 

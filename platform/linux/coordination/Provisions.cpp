@@ -1,37 +1,75 @@
 #include "platform/linux/coordination/Provisions.h"
 
 #include <algorithm>
+#include <cassert>
 
 namespace docuvend::linux_platform {
 
-Provisions::Joined Provisions::join(const std::shared_ptr<QXDocuvend>& provider, const FileKey& file, AccessNumber number,
-                                    const QXAuditToken& process) {
-  auto found = std::find_if(running_.begin(), running_.end(), [&provider, &file](const auto& running) {
-    return running.second.provider == provider && running.second.file == file;
-  });
-  const Wait wait = found == running_.end() ? Wait::forNewRequest : Wait::forRunningRequest;
-  if (wait == Wait::forNewRequest) found = running_.emplace(++last_, Finished{provider, file, /*waiting=*/{}, /*processes=*/{}}).first;
-  Finished& state = found->second;
-  state.waiting.push_back(number);
-  state.processes.insert(process);
-  waiting_.emplace(number, found->first);
-  return {found->first, wait};
+Provisions::Joined Provisions::join(const Provider& provider, const FileKey& file, AccessNumber number, const QXAuditToken& process,
+                                    const Application& application) {
+  const auto [place, isNew] = numbers_.try_emplace({provider, file}, last_ + 1);
+  if (isNew) requests_.emplace(++last_, Request{{provider, file, /*waiting=*/{}, /*processes=*/{}, /*next=*/{}}, /*underWay=*/{}});
+  const ProvideRequest wanted = place->second;
+  Request& request = requests_.at(wanted);
+  request.state.waiting.push_back(number);
+  request.state.processes.insert(process);
+  waiting_.emplace(number, Waiting{wanted, application});
+  if (request.underWay) return {wanted, Wait::forRunningRequest};
+  lines_.enter(provider, application, file);
+  // Only a line that was empty gives what has come last.
+  return {wanted, begin(provider, application) ? Wait::forNewRequest : Wait::inLine};
 }
 
 void Provisions::leave(AccessNumber number) {
-  const auto found = waiting_.find(number);
-  if (found == waiting_.end()) return;
-  std::erase(running_.at(found->second).waiting, number);
-  waiting_.erase(found);
+  const auto left = waiting_.extract(number);
+  if (left.empty()) return;
+  const auto& [wanted, application] = left.mapped();
+  const auto found = requests_.find(wanted);
+  Request& request = found->second;
+  std::erase(request.state.waiting, number);
+  if (request.underWay) return;
+  const bool isLast = std::none_of(request.state.waiting.begin(), request.state.waiting.end(),
+                                   [this, &application](AccessNumber other) { return waiting_.at(other).application == application; });
+  if (isLast) lines_.leave(request.state.provider, application, request.state.file);
+  if (!request.state.waiting.empty()) return;
+  numbers_.erase({request.state.provider, request.state.file});
+  requests_.erase(found);
+}
+
+std::set<AccessNumber> Provisions::leaveLines() {
+  std::set<AccessNumber> numbers;
+  for (const auto& [number, waiting] : waiting_) {
+    if (!requests_.at(waiting.request).underWay) numbers.insert(number);
+  }
+  for (const AccessNumber number : numbers) leave(number);
+  return numbers;
 }
 
 std::optional<Provisions::Finished> Provisions::finish(ProvideRequest request) {
-  const auto found = running_.find(request);
-  if (found == running_.end()) return std::nullopt;
-  Finished finished = std::move(found->second);
-  running_.erase(found);
+  const auto found = requests_.find(request);
+  if (found == requests_.end()) return std::nullopt;
+  Finished finished = std::move(found->second.state);
+  const std::optional<Application> underWay = std::move(found->second.underWay);
+  requests_.erase(found);
+  numbers_.erase({finished.provider, finished.file});
   for (const AccessNumber number : finished.waiting) waiting_.erase(number);
+  assert(underWay);
+  lines_.end(finished.provider, *underWay);
+  finished.next = begin(finished.provider, *underWay);
   return finished;
+}
+
+std::optional<Provisions::Question> Provisions::begin(const Provider& provider, const Application& application) {
+  const auto file = lines_.begin(provider, application);
+  if (!file) return std::nullopt;
+  const ProvideRequest number = numbers_.at({provider, *file});
+  Request& request = requests_.at(number);
+  request.underWay = application;
+  const auto& waiting = request.state.waiting;
+  const auto asker = std::find_if(waiting.begin(), waiting.end(),
+                                  [this, &application](AccessNumber access) { return waiting_.at(access).application == application; });
+  assert(asker != waiting.end());
+  return Question{number, *asker};
 }
 
 }  // namespace docuvend::linux_platform

@@ -34,8 +34,9 @@ enum class FileCoordinationErrorCode : std::int64_t {
   invalidAccessID = 4,  // absent, in use by this connection already, or not of an access of this connection
   wouldDeadlock = 5,    // the wait would have no end: those who are waited for wait for the caller
   ended = 6,            // the access was ended before it had begun
-  tooManyAccesses = 7,  // this connection has as many as it may have
+  tooManyAccesses = 7,  // this connection or application has as many as it may have
   noDirectory = 8,      // there is no directory where the file would be
+  tooManyChanges = 9,   // too much of what this application has written its provider has not been told yet; later it may write again
 };
 
 class QXFileCoordination {
