@@ -241,6 +241,17 @@ TEST_F(DVAccessControlStoreTest, WhatCannotBeKeptBesideIsNotReplaced) {
   EXPECT_EQ(platform_.log.entries().back(), (FakeLogEntry{QXLogType::fault, "[ERROR] Could not write to " + std::string(kFile)}));
 }
 
+TEST_F(DVAccessControlStoreTest, AFileOfAnotherShapeThatHasBeenMendedIsReplacedWithoutACopy) {
+  platform_.propertyLists.setValue(kFile, QXArray{"a"});
+  (void)store();
+  platform_.propertyLists.setValue(kFile, listOf(kCellar, kEditor, {"report"}));
+  store().rereadAccessControl();
+  platform_.queues.runAll();
+  grant(kLetter);
+  EXPECT_EQ(platform_.propertyLists.value(kFile), QXValue(listOf(kCellar, kEditor, {"report", "letter"})));
+  EXPECT_FALSE(platform_.fileSystem.isFile(std::string(kFile) + ".unreadable-1"));
+}
+
 TEST_F(DVAccessControlStoreTest, AFileThatIsNoDictionaryIsRejectedAtStart) {
   platform_.propertyLists.setValue(kFile, QXArray{"a"});
   EXPECT_FALSE(isGranted(kReport));
@@ -307,6 +318,54 @@ TEST_F(DVAccessControlStoreTest, AGrantThatCouldNotBeWrittenIsNotWrittenByRepeat
   grant(kReport);
   grant(kReport);
   EXPECT_EQ(platform_.propertyLists.writes().size(), 1U);
+}
+
+TEST_F(DVAccessControlStoreTest, AChangeAndItsWritingAreOneStepOfItsQueue) {
+  (void)store();
+  std::vector<std::optional<QXValue>> seen;
+  platform_.log.onWrite([&](const FakeLogEntry& entry) {
+    const bool isOfAChange = entry.text.starts_with("[INFO] Allowing") || entry.text.starts_with("[INFO] No longer allowing");
+    if (isOfAChange) store().syncQueue()->async([&] { seen.push_back(platform_.propertyLists.value(kFile)); });
+  });
+  grant(kReport);
+  platform_.queues.runAll();
+  store().disallowProviderWithIdentifier(kCellar, kReport, kEditor);
+  platform_.queues.runAll();
+  EXPECT_EQ(seen, (std::vector<std::optional<QXValue>>{QXValue(listOf(kCellar, kEditor, {"report"})), QXValue(QXDictionary())}));
+}
+
+TEST_F(DVAccessControlStoreTest, EveryLineOfASharedStoreIsLoggedOnItsQueue) {
+  platform_.propertyLists.failWrite(3, FakeWriteFailure::once);
+  (void)store();
+  std::vector<std::string> elsewhere;
+  std::size_t lines = 0;
+  platform_.log.onWrite([&](const FakeLogEntry& entry) {
+    ++lines;
+    if (!store().syncQueue()->isCurrent()) elsewhere.push_back(entry.text);
+  });
+  grant(kReport);
+  grant(kReport);
+  store().disallowProviderWithIdentifier(kCellar, kReport, kEditor);
+  grant(kLetter);
+  store().writeUnwrittenChanges();
+  EXPECT_TRUE(store().allowWhereThereIsRoom({kAttic, kEditor, kReport}, DVGranter::writer));
+  for (int i = 0; i < 2; ++i) {
+    store().rereadAccessControl();
+    platform_.queues.runAll();
+    platform_.propertyLists.setCorrupt(kFile);
+  }
+  EXPECT_EQ(lines, 13U);
+  EXPECT_EQ(elsewhere, std::vector<std::string>{});
+}
+
+TEST_F(DVAccessControlStoreTest, ACommitIsLoggedBeforeItIsWritten) {
+  std::vector<std::size_t> writesAtCommits;
+  platform_.log.onWrite([&](const FakeLogEntry& entry) {
+    if (entry.text == "[INFO] Committing access control list") writesAtCommits.push_back(platform_.propertyLists.writeCount());
+  });
+  grant(kReport);
+  store().disallowProviderWithIdentifier(kCellar, kReport, kEditor);
+  EXPECT_EQ(writesAtCommits, (std::vector<std::size_t>{0, 1}));
 }
 
 // --- Revoking
@@ -414,6 +473,17 @@ TEST_F(DVAccessControlStoreTest, ARereadOfAMissingFileLeavesTheChangesUnwritten)
   EXPECT_TRUE(store().hasUnwrittenChanges());
 }
 
+TEST_F(DVAccessControlStoreTest, ARereadOfAFileThatCannotBeReadLeavesNothingToBeWrittenOverIt) {
+  platform_.propertyLists.failWrite(1, FakeWriteFailure::once);
+  grant(kReport);
+  platform_.propertyLists.setCorrupt(kFile);
+  store().rereadAccessControl();
+  platform_.queues.runAll();
+  EXPECT_FALSE(store().hasUnwrittenChanges());
+  store().writeUnwrittenChanges();
+  EXPECT_EQ(platform_.propertyLists.writeCount(), 1U);
+}
+
 // --- Asking
 
 TEST_F(DVAccessControlStoreTest, AQueryLogsNothingAndTouchesNoFile) {
@@ -485,6 +555,32 @@ TEST_F(DVAccessControlStoreTest, AQueryAfterARereadSeesWhatWasRead) {
   platform_.propertyLists.setValue(kFile, listOf(kCellar, kEditor, {"report"}));
   store().rereadAccessControl();
   EXPECT_TRUE(isGranted(kReport));
+}
+
+TEST_F(DVAccessControlStoreTest, TheListAfterARereadIsTheOneThatWasRead) {
+  (void)store();
+  platform_.propertyLists.setValue(kFile, listOf(kCellar, kEditor, {"report"}));
+  store().rereadAccessControl();
+  EXPECT_EQ(store().grants(), (std::vector<DVGrant>{{kCellar, kEditor, kReport}}));
+}
+
+TEST_F(DVAccessControlStoreTest, WhetherAChangeIsUnwrittenAfterARereadIsSaidOfWhatWasRead) {
+  grant(kReport);
+  platform_.propertyLists.failWrite(2, FakeWriteFailure::once);
+  grant(kLetter);
+  store().rereadAccessControl();
+  EXPECT_FALSE(store().hasUnwrittenChanges());
+}
+
+TEST_F(DVAccessControlStoreTest, WhateverStoreObservesTheFirstUnlockTheSharedOneRereads) {
+  (void)store();
+  const auto other = std::make_shared<DVAccessControlStore>();
+  ASSERT_EQ(platform_.notificationCenter.observers().size(), 2U);
+  platform_.propertyLists.setValue(kFile, listOf(kCellar, kEditor, {"report"}));
+  platform_.notificationCenter.post(kQXFirstUnlockNotification);
+  platform_.queues.runAll();
+  EXPECT_TRUE(isGranted(kReport));
+  EXPECT_FALSE(other->isProviderWithIdentifier(kCellar, kReport, kEditor));
 }
 
 TEST_F(DVAccessControlStoreTest, ObservesTheFirstUnlockWithImmediateDelivery) {
@@ -581,18 +677,20 @@ class WatchingFileSystem final : public fake_platform::FakeFileSystem {
   bool exists(const std::string& path) override {
     if (!observersAtFirstLook) observersAtFirstLook = notificationCenter_.observers().size();
     if (!queuesAtFirstLook) queuesAtFirstLook = queues_.createdLabels().size();
+    if (!queueOfFirstLook) queueOfFirstLook = queues_.currentLabel();
     return FakeFileSystem::exists(path);
   }
 
   std::optional<std::size_t> observersAtFirstLook;
   std::optional<std::size_t> queuesAtFirstLook;
+  std::optional<std::string> queueOfFirstLook;
 
  private:
   fake_platform::FakeNotificationCenter& notificationCenter_;
   fake_platform::FakeQueues& queues_;
 };
 
-TEST(DVAccessControlStore, HasItsQueueAndObservesTheFirstUnlockBeforeItReads) {
+TEST(DVAccessControlStore, HasItsQueueAndObservesTheFirstUnlockBeforeItReadsWithoutAnyQueue) {
   fake_platform::FakeQueues queues;
   fake_platform::FakeLog log;
   fake_platform::FakeRpcService rpc;
@@ -610,6 +708,7 @@ TEST(DVAccessControlStore, HasItsQueueAndObservesTheFirstUnlockBeforeItReads) {
   (void)DVAccessControlStore::sharedStore();
   EXPECT_EQ(fileSystem.observersAtFirstLook, 1U);
   EXPECT_EQ(fileSystem.queuesAtFirstLook, 1U);
+  EXPECT_EQ(fileSystem.queueOfFirstLook, "");
 }
 
 }  // namespace
