@@ -4,6 +4,7 @@
 #pragma once
 
 #include <atomic>
+#include <functional>
 
 #include "platform/device_lock.h"
 
@@ -13,6 +14,7 @@ class FakeDeviceLock : public QXDeviceLock {
  public:
   int lockState() override {
     ++lockStateQuestions;
+    if (onLockStateQuestion) onLockStateQuestion();
     return state;
   }
   bool unlockedSinceBoot() override {
@@ -24,6 +26,7 @@ class FakeDeviceLock : public QXDeviceLock {
   std::atomic<bool> unlocked = false;
   std::atomic<int> lockStateQuestions = 0;
   std::atomic<int> unlockedSinceBootQuestions = 0;
+  std::function<void()> onLockStateQuestion;  // called inside the question; set before anybody asks
 };
 
 }  // namespace docuvend::fake_platform

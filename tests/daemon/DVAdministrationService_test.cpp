@@ -28,8 +28,8 @@ class DVAdministrationServiceTest : public testing::Test {
   // The daemon's start, as its entry point makes it.
   void start() {
     server_->setAccessControlStore(DVAccessControlStore::sharedStore());
-    server_->startCompletion(/*completion=*/{});
     service_->start();
+    server_->startCompletion(/*completion=*/{});
   }
   std::shared_ptr<FakeRpcConnection> connect() {
     auto connection = FakeRpcConnection::create();
@@ -48,9 +48,9 @@ class DVAdministrationServiceTest : public testing::Test {
   std::shared_ptr<DVAdministrationService> service_ = std::make_shared<DVAdministrationService>();
 };
 
-TEST_F(DVAdministrationServiceTest, ItsListenerIsMadeAfterTheServersOwn) {
+TEST_F(DVAdministrationServiceTest, ItsListenerIsMadeUnderItsNameAndHasItAsDelegate) {
   start();
-  EXPECT_EQ(platform_.rpc.createdNames(), (std::vector<std::string>{"com.orvane.Docuvend", kService}));
+  EXPECT_EQ(platform_.rpc.createdNames(), (std::vector<std::string>{kService, "com.orvane.Docuvend"}));
   EXPECT_EQ(platform_.rpc.listener(kService)->delegate(), service_);
 }
 

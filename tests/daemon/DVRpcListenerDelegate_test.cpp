@@ -78,14 +78,16 @@ TEST_F(DVRpcListenerDelegateTest, ExportsTheDaemonsProtocolInItsOrder) {
                                       "bookmarkableStringFromDocumentURL:completion:", "documentURLFromBookmarkableString:completion:"}));
 }
 
-TEST_F(DVRpcListenerDelegateTest, RestrictsTheListOfProvidersAndNothingElse) {
-  accept(connection_);
-  const auto interface = connection_->exportedInterface();
-  const auto* kinds = interface->acceptedReplyKinds("providersCompletionHandler:", 1);
-  ASSERT_NE(kinds, nullptr);
-  EXPECT_EQ(*kinds, (std::vector<QXValueKind>{QXValueKind::dictionary, QXValueKind::string, QXValueKind::url}));
-  EXPECT_EQ(interface->restrictionCount(), 1U);
-  EXPECT_EQ(interface->acceptedReplyKinds("providersCompletionHandler:", 0), nullptr);
+TEST_F(DVRpcListenerDelegateTest, RestrictsTheListOfProvidersAndNothingElseOnEveryConnection) {
+  for (const auto& connection : {connection_, FakeRpcConnection::create()}) {
+    accept(connection);
+    const auto interface = connection->exportedInterface();
+    const auto* kinds = interface->acceptedReplyKinds("providersCompletionHandler:", 1);
+    ASSERT_NE(kinds, nullptr);
+    EXPECT_EQ(*kinds, (std::vector<QXValueKind>{QXValueKind::dictionary, QXValueKind::string, QXValueKind::url}));
+    EXPECT_EQ(interface->restrictionCount(), 1U);
+    EXPECT_EQ(interface->acceptedReplyKinds("providersCompletionHandler:", 0), nullptr);
+  }
 }
 
 TEST_F(DVRpcListenerDelegateTest, EachConnectionHasAServicerOfItsOwn) {
@@ -170,6 +172,19 @@ TEST_F(DVRpcListenerDelegateClientTest, GetsTheListOfProvidersThroughItsRestrict
   EXPECT_TRUE(failures_.empty());
   ASSERT_TRUE(listed);
   EXPECT_TRUE(listed->contains("com.orvane.cellar"));
+}
+
+TEST_F(DVRpcListenerDelegateClientTest, ARefusedClientGetsItsErrorThroughTheRestriction) {
+  std::optional<QXError> refused;
+  std::optional<QXDictionary> listed;
+  client().call<&DVDaemon::providersCompletionHandler>([&](std::optional<QXError> error, std::optional<QXDictionary> providers) {
+    refused = std::move(error);
+    listed = std::move(providers);
+  });
+  platform_.queues.runAll();
+  EXPECT_TRUE(failures_.empty());
+  EXPECT_EQ(refused, DVClientLacksEntitlement());
+  EXPECT_EQ(listed, std::nullopt);
 }
 
 TEST_F(DVRpcListenerDelegateClientTest, AProviderThatAnswersTwiceIsHeardOnce) {

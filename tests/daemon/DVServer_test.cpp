@@ -24,6 +24,7 @@ using fake_platform::FakeRpcListener;
 constexpr const char* kService = "com.orvane.Docuvend";
 constexpr const char* kCellar = "com.orvane.cellar";
 constexpr int kLocked = 1;
+constexpr std::size_t kObserversOfTheStore = 1;
 
 class DVServerTest : public testing::Test {
  protected:
@@ -33,7 +34,9 @@ class DVServerTest : public testing::Test {
     std::vector<std::string> logged;
     std::size_t observers;
     std::size_t matches;
+    std::size_t submitted;  // to the global queue
     int lockQuestions;
+    bool hasDelegate;
     bool delegateKnowsServer;
   };
 
@@ -72,9 +75,11 @@ class DVServerTest : public testing::Test {
 
  private:
   void noteMoment(const std::string& call) {
-    const bool known = server_ && server_->listenerDelegate() && server_->listenerDelegate()->server() == server_;
+    const bool hasDelegate = server_ && server_->listenerDelegate();
+    const bool known = hasDelegate && server_->listenerDelegate()->server() == server_;
     moments_.push_back({call, platform_.log.texts(), platform_.notificationCenter.observers().size(),
-                        platform_.extensionHost.begun().size(), platform_.deviceLock.lockStateQuestions, known});
+                        platform_.extensionHost.begun().size(), platform_.queues.pendingOnGlobalQueue(),
+                        platform_.deviceLock.lockStateQuestions, hasDelegate, known});
   }
 };
 
@@ -103,16 +108,48 @@ TEST_F(DVServerTest, ItsDelegateKnowsTheServerBeforeTheListenerKnowsTheDelegate)
   EXPECT_EQ(listener()->delegate(), server_->listenerDelegate());
 }
 
+TEST_F(DVServerTest, ItsListenerIsMadeBeforeItsDelegate) {
+  start();
+  ASSERT_FALSE(moments_.empty());
+  EXPECT_EQ(moments_[0].call, std::string("listenerForService:") + kService);
+  EXPECT_FALSE(moments_[0].hasDelegate);
+}
+
+TEST_F(DVServerTest, AnotherStartReplacesItsListener) {
+  lockDevice();
+  start();
+  const auto first = server_->listener();
+  start();
+  EXPECT_NE(server_->listener(), first);
+  EXPECT_EQ(server_->listener(), listener());
+  EXPECT_EQ(listener()->delegate(), server_->listenerDelegate());
+  EXPECT_TRUE(listener()->isResumed());
+}
+
 TEST_F(DVServerTest, ObservesTheFirstUnlockOnceTheDelegateIsSetAndBeforeItListens) {
   lockDevice();
   start();
   EXPECT_EQ(calls(), (std::vector<std::string>{std::string("listenerForService:") + kService, "setDelegate", "resume"}));
-  const std::size_t ofTheStore = 1;
-  EXPECT_EQ(moments_[1].observers, ofTheStore);
-  EXPECT_EQ(moments_[2].observers, ofTheStore + 1);
+  EXPECT_EQ(moments_[1].observers, kObserversOfTheStore);
+  EXPECT_EQ(moments_[2].observers, kObserversOfTheStore + 1);
   const auto observer = platform_.notificationCenter.observers().back();
   EXPECT_EQ(observer.notification, "com.orvane.mobile.gatewardd.first_unlock");
   EXPECT_EQ(observer.behavior, QXSuspensionBehavior::deliverImmediately);
+}
+
+TEST_F(DVServerTest, ObservesTheFirstUnlockBeforeItAsksForTheLockState) {
+  std::vector<std::size_t> observersWhenAsked;
+  platform_.deviceLock.onLockStateQuestion = [&] { observersWhenAsked.push_back(platform_.notificationCenter.observers().size()); };
+  start();
+  EXPECT_EQ(observersWhenAsked, std::vector<std::size_t>{kObserversOfTheStore + 1});
+}
+
+TEST_F(DVServerTest, ObservesTheFirstUnlockAlsoWhenItNeedNotWaitForIt) {
+  start();
+  EXPECT_EQ(platform_.notificationCenter.observers().size(), kObserversOfTheStore + 1);
+  lockDeviceUnlockedSinceBoot();
+  start();
+  EXPECT_EQ(platform_.notificationCenter.observers().size(), kObserversOfTheStore + 2);
 }
 
 TEST_F(DVServerTest, AsksForTheLockStateOnlyWhenTheDelegateIsSet) {
@@ -258,6 +295,15 @@ TEST_F(DVServerTest, ALaterFirstUnlockBeginsDiscoveryNoSecondTime) {
   EXPECT_EQ(completions_.size(), 1U);
 }
 
+TEST_F(DVServerTest, ALaterFirstUnlockHasNoCompletion) {
+  start();
+  announceExtensions();
+  platform_.queues.runAll();
+  platform_.notificationCenter.post(kQXFirstUnlockNotification);
+  while (platform_.queues.runOne(fake_platform::kFakeMainRunLoopLabel)) continue;
+  EXPECT_EQ(platform_.queues.pendingOnGlobalQueue(), 0U);
+}
+
 // --- A device that has not been unlocked since boot
 
 TEST_F(DVServerTest, ALockedDeviceListensAtOnceWithoutProviders) {
@@ -276,6 +322,14 @@ TEST_F(DVServerTest, ALockedDeviceLogsBeforeItListens) {
   start();
   EXPECT_EQ(moments_[2].call, "resume");
   EXPECT_EQ(moments_[2].logged.back(), "[INFO] Not instantiating docuvends until first unlock.");
+}
+
+TEST_F(DVServerTest, ALockedDeviceListensBeforeItsCompletionIsSubmitted) {
+  lockDevice();
+  start();
+  EXPECT_EQ(moments_[2].call, "resume");
+  EXPECT_EQ(moments_[2].submitted, 0U);
+  EXPECT_EQ(platform_.queues.pendingOnGlobalQueue(), 1U);
 }
 
 TEST_F(DVServerTest, ALockedDeviceCompletesOnTheGlobalQueue) {
