@@ -1,5 +1,6 @@
 // Passing a document on to another application, by one that may write it.
 #include "acl/DVGrantLimits.h"
+#include "tests/service/AskedConnection.h"
 #include "tests/service/ServicerFixture.h"
 
 namespace docuvend {
@@ -89,6 +90,22 @@ TEST_F(DVRpcServicerBookmarkGrantsTest, TheProviderThatOwnsTheURLIsAskedForTheIt
   EXPECT_EQ(attic_->vendor().messages().back().operation.name, kIdentifierMessage);
   EXPECT_EQ(attic_->vendor().messages().back().arguments, QXArray{box});
   EXPECT_EQ(askedOfCellar(), 0U);
+}
+
+// A provider is registered under one identifier and may say that it has another.
+TEST_F(DVRpcServicerBookmarkGrantsTest, TheGrantAndTheStringNameTheProviderAsItNamesItself) {
+  rename(kCellar, kAttic);
+  extend(kReport, kStranger);
+  EXPECT_EQ(lateAnswer().string, "docuvend:com.orvane.attic/item 7");
+  EXPECT_TRUE(store().isProviderWithIdentifier(kAttic, kItem, kStranger));
+  EXPECT_FALSE(isGranted(kStranger));
+}
+
+TEST_F(DVRpcServicerBookmarkGrantsTest, TheGrantStandsInTheListOfTheServersOwnStore) {
+  const auto own = giveServerItsOwnStore();
+  extend(kReport, kStranger);
+  EXPECT_TRUE(own->isProviderWithIdentifier(kCellar, kItem, kStranger));
+  EXPECT_FALSE(isGranted(kStranger));
 }
 
 TEST_F(DVRpcServicerBookmarkGrantsTest, NothingIsGrantedBeforeTheProviderHasAnswered) {
@@ -196,6 +213,14 @@ TEST_F(DVRpcServicerBookmarkGrantsTest, NoEntitlementIsAskedForAndNoneHelps) {
   entitle(kDVWriteEntitlement);
   extend(kReport, kStranger);
   expectRefused(kReportText, kEditor.value, kStranger.value, DVNotPermittedError());
+}
+
+TEST_F(DVRpcServicerBookmarkGrantsTest, NoEntitlementIsLookedAt) {
+  const auto connection = std::make_shared<AskedConnection>(std::string(kDVWriteEntitlement), token_);
+  const auto servicer = std::make_shared<DVRpcServicer>(source_, connection);
+  servicer->extendBookmarkForFileURL(kReport, kStranger, stringReply());
+  EXPECT_EQ(lateAnswer().string, kString);
+  EXPECT_TRUE(connection->asked.empty());
 }
 
 TEST_F(DVRpcServicerBookmarkGrantsTest, AnUnknownCallerIsNotPermittedAndLoggedAsAbsent) {
@@ -367,6 +392,7 @@ TEST_F(DVRpcServicerBookmarkGrantsTest, WithoutAReplyHandlerTheGrantIsRecordedAl
 
 TEST_F(DVRpcServicerBookmarkGrantsTest, WithoutAReplyHandlerFailuresAreLoggedAndHarmless) {
   servicer_->extendBookmarkForFileURL(kElsewhere, kStranger, /*completionHandler=*/{});
+  EXPECT_EQ(platform_.queues.pendingOnGlobalQueue(), 1U);
   platform_.queues.runAll();
   EXPECT_EQ(logged().back().text, failure(kElsewhere.absoluteString(), kEditor.value, kStranger.value, DVNotPermittedError()));
   answerItemID(*cellar_, kExtensionError, /*item=*/std::nullopt);

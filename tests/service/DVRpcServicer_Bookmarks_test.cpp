@@ -48,6 +48,13 @@ TEST_F(DVRpcServicerBookmarksTest, TheFirstLineIsLoggedBeforeTheProviderIsLooked
   EXPECT_EQ(platform_.log.texts().at(1), "[INFO] Resolved URL to provider com.orvane.cellar.");
 }
 
+// A provider is registered under one identifier and may say that it has another.
+TEST_F(DVRpcServicerBookmarksTest, TheStringNamesTheProviderAsItNamesItself) {
+  rename(kCellar, kAttic);
+  toString(kReport);
+  EXPECT_EQ(lateAnswer().string, "docuvend:com.orvane.attic/item/7");
+}
+
 TEST_F(DVRpcServicerBookmarksTest, TheStringIsNoGrantAndAsksNothingOfTheCaller) {
   letConnectionGo();
   toString(kReport);
@@ -223,6 +230,47 @@ TEST_F(DVRpcServicerBookmarksTest, TheSharedStoreIsAskedNotTheServers) {
   EXPECT_EQ(lateAnswer().error, std::nullopt);
 }
 
+TEST_F(DVRpcServicerBookmarksTest, WithoutAGrantTheCallerIsNotPermittedWhetherTheProviderIsRegisteredOrNot) {
+  toURL("docuvend:com.orvane.nobody/x");
+  EXPECT_EQ(earlyAnswer().error, DVNotPermittedError());
+  EXPECT_EQ(logged().back(), (fake_platform::FakeLogEntry{QXLogType::fault,
+                                                          "[ERROR] Provider ID com.orvane.nobody is not allowed to provide item ID “x” to "
+                                                          "consumer ID com.example.editor"}));
+}
+
+TEST_F(DVRpcServicerBookmarksTest, TheLinesNameTheProviderAsTheStringDoes) {
+  grantToEditor();
+  rename(kCellar, kAttic);
+  toURL(kString);
+  EXPECT_EQ(lateAnswer().url, kReport);
+  EXPECT_EQ(logged().back().text, "[INFO] Successfully extended sandbox of URL " + kReport.absoluteString() +
+                                      " from provider ID com.orvane.cellar to consumer ID com.example.editor.");
+  answers_.clear();
+  answerURL(*cellar_, /*error=*/std::nullopt, kElsewhere);
+  toURL(kString);
+  EXPECT_EQ(lateAnswer().error, DVNotPermittedError());
+  EXPECT_EQ(logged().back().text,
+            "[ERROR] Failed to extend sandbox of URL " + kElsewhere.absoluteString() +
+                " from provider ID com.orvane.cellar to consumer ID com.example.editor. Error: " + DVNotPermittedError().description());
+}
+
+TEST_F(DVRpcServicerBookmarksTest, AProviderThatIsRemovedWhileItFindsTheItemIsNotTakenForOneThatIsRegistered) {
+  grantToEditor();
+  cellar_->vendor().respond("_URLForItemIdentifier:completion:", [](const QXArray&) { return std::nullopt; });
+  toURL(kString);
+  const std::size_t question = cellar_->vendor().messages().size() - 1;
+  removeCellar();
+  cellar_->vendor().answer(question, {QXValue(), kReport});
+  const Answer& answer = lateAnswer();
+  EXPECT_EQ(answer.error, DVNotPermittedError());
+  EXPECT_TRUE(answer.hasNoValue());
+  EXPECT_EQ(logged().back(), (fake_platform::FakeLogEntry{
+                                 QXLogType::fault, "[ERROR] Failed to extend sandbox of URL " + kReport.absoluteString() +
+                                                       " from provider ID com.orvane.cellar to consumer ID com.example.editor. Error: " +
+                                                       DVNotPermittedError().description()}));
+  EXPECT_TRUE(platform_.sandbox.issueCalls().empty());
+}
+
 TEST_F(DVRpcServicerBookmarksTest, AProviderThatIsNotRegisteredNeverAnswers) {
   grant(kNobody, kItem, kEditor);
   platform_.log.clear();
@@ -305,6 +353,17 @@ TEST_F(DVRpcServicerBookmarksTest, ARefusedTokenIsNoFailure) {
   EXPECT_EQ(answer.error, std::nullopt);
   EXPECT_EQ(answer.url, kReport);
   EXPECT_EQ(answer.itemToken, std::nullopt);
+  EXPECT_EQ(answer.siblingURL, kSibling);
+  EXPECT_EQ(answer.siblingToken, std::nullopt);
+}
+
+TEST_F(DVRpcServicerBookmarksTest, ARefusedSiblingTokenIsTheOnlyOneThatIsAbsent) {
+  grantToEditor();
+  platform_.sandbox.refuseIssuing(kSiblingPath);
+  toURL(kString);
+  const Answer& answer = lateAnswer();
+  EXPECT_EQ(answer.url, kReport);
+  EXPECT_TRUE(answer.itemToken);
   EXPECT_EQ(answer.siblingURL, kSibling);
   EXPECT_EQ(answer.siblingToken, std::nullopt);
 }

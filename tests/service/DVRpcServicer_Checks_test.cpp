@@ -1,6 +1,7 @@
 #include <array>
 #include <utility>
 
+#include "tests/service/AskedConnection.h"
 #include "tests/service/ServicerFixture.h"
 
 namespace docuvend {
@@ -78,28 +79,6 @@ TEST_F(DVRpcServicerChecksTest, AClientThatHasGoneHoldsNothingAndHasNoPid) {
                                 "[ERROR] Rejecting request from PID 0 because it does not have any of these entitlements: "
                                 "(\"com.orvane.docuvend.acl-write\")"}}));
 }
-
-// Notes which entitlements it is asked for; holds one.
-class AskedConnection final : public QXRpcConnection {
- public:
-  explicit AskedConnection(std::string held) : held_(std::move(held)) {}
-
-  void setExportedInterface(QXRpcInterface) override {}
-  void setExportedObject(std::shared_ptr<QXRpcExportedObject>) override {}
-  void resume() override {}
-  [[nodiscard]] int processIdentifier() const override { return 1; }
-  [[nodiscard]] QXAuditToken auditToken() const override { return {}; }
-  [[nodiscard]] std::optional<QXValue> valueForEntitlement(const std::string& name) const override {
-    asked.push_back(name);
-    return name == held_ ? std::optional<QXValue>(true) : std::nullopt;
-  }
-  [[nodiscard]] std::shared_ptr<QXRpcProxy> remoteObjectProxy(QXErrorHandler) override { return nullptr; }
-
-  mutable std::vector<std::string> asked;
-
- private:
-  std::string held_;
-};
 
 TEST_F(DVRpcServicerChecksTest, AsksInTheListsOrderAndNotBeyondTheFirstThatIsHeld) {
   static constexpr std::array<std::string_view, 3> kList = {"a", "b", "c"};

@@ -116,6 +116,26 @@ TEST_P(DVRpcServicerGrantedItemsTest, WithoutAServerNobodyIsPermitted) {
   EXPECT_FALSE(wasForwarded());
 }
 
+TEST_P(DVRpcServicerGrantedItemsTest, TheListIsThatOfTheServersOwnStore) {
+  const auto own = giveServerItsOwnStore();
+  own->allowProviderWithIdentifier(kCellar, kItem, kEditor);
+  ASSERT_FALSE(store().isProviderWithIdentifier(kCellar, kItem, kEditor));
+  ask(kReport, kCellar, kEditor);
+  EXPECT_EQ(lateAnswer().error, std::nullopt);
+  EXPECT_TRUE(wasForwarded());
+}
+
+TEST_P(DVRpcServicerGrantedItemsTest, AProviderThatIsUpdatedWhileItNamesTheItemIsTheOneThatIsAsked) {
+  hold(kIdentifierMessage);
+  grantAndAsk();
+  const std::size_t question = cellar_->vendor().messages().size() - 1;
+  const auto updated = updateCellar();
+  cellar_->vendor().answer(question, {QXValue(), kItem.value});
+  EXPECT_EQ(lateAnswer().error, std::nullopt);
+  EXPECT_TRUE(wasForwarded());
+  EXPECT_EQ(updated->vendor().messages().size(), 1U);  // its initial setup
+}
+
 // --- Once too often, too late, or for nobody
 
 TEST_P(DVRpcServicerGrantedItemsTest, AFailureAfterTheAnswerIsTolerated) {

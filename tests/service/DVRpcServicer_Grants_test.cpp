@@ -100,7 +100,41 @@ TEST_F(DVRpcServicerGrantsTest, AGrantThatCannotBeWrittenStillAnswersWithTokens)
   EXPECT_TRUE(isGranted(kCellar));
 }
 
+TEST_F(DVRpcServicerGrantsTest, TheGrantStandsInTheListOfTheServersOwnStore) {
+  const auto own = giveServerItsOwnStore();
+  extend(kReport, kCellar, kEditor);
+  EXPECT_TRUE(own->isProviderWithIdentifier(kCellar, kItem, kEditor));
+  EXPECT_FALSE(isGranted(kCellar));
+}
+
+// A provider is registered under one identifier and may say that it has another.
+TEST_F(DVRpcServicerGrantsTest, TheGrantAndTheLinesNameTheProviderAsTheRequestDoes) {
+  rename(kCellar, kAttic);
+  extend(kReport, kCellar, kEditor);
+  EXPECT_EQ(lateAnswer().error, std::nullopt);
+  EXPECT_TRUE(isGranted(kCellar));
+  EXPECT_FALSE(isGranted(kAttic));
+  EXPECT_EQ(logged().back(), (fake_platform::FakeLogEntry{QXLogType::info, kSuccess}));
+}
+
+TEST_F(DVRpcServicerGrantsTest, TheOwnerOfTheURLIsHeldAgainstTheIdentifierThatTheProviderSaysItHas) {
+  answerItemID(*attic_, /*error=*/std::nullopt, kItem.value);
+  rename(kAttic, kCellar);
+  extend(kReport, kAttic, kEditor);
+  const Answer& answer = lateAnswer();
+  EXPECT_EQ(answer.error, std::nullopt);
+  EXPECT_EQ(answer.itemToken, QXData::fromText("token:" + kReportPath));
+  EXPECT_TRUE(isGranted(kAttic));
+}
+
 // --- The caller
+
+TEST_F(DVRpcServicerGrantsTest, NothingIsAskedOfTheCallerButItsEntitlement) {
+  extend(kReport, kCellar, kStranger);
+  EXPECT_EQ(lateAnswer().error, std::nullopt);
+  EXPECT_EQ(platform_.applicationRegistry.tokenQueryCount(), 0);
+  EXPECT_TRUE(platform_.sandbox.checks().empty());
+}
 
 TEST_F(DVRpcServicerGrantsTest, AClientWithoutTheEntitlementIsRefusedAndOnlyTheCheckLogs) {
   connection_->setEntitlement("com.orvane.docuvend.acl-write", false);
@@ -166,6 +200,11 @@ TEST_F(DVRpcServicerGrantsTest, TheFirstMissingArgumentIsNamed) {
   EXPECT_EQ(cellar_->vendor().messages().size(), 1U);  // its initial setup
 }
 
+TEST_F(DVRpcServicerGrantsTest, TheArgumentsAreCheckedBeforeTheProvider) {
+  extend(kReport, kNobody, std::nullopt);
+  EXPECT_EQ(earlyAnswer().error, DVInvalidParameterError("consumerID", /*value=*/std::nullopt));
+}
+
 TEST_F(DVRpcServicerGrantsTest, AnUnknownProviderIsNotFound) {
   extend(kReport, kNobody, kEditor);
   const QXError error = DVNotFoundError(kNobody);
@@ -178,9 +217,10 @@ TEST_F(DVRpcServicerGrantsTest, AnUnknownProviderIsNotFound) {
                                                       error.description()}}));
 }
 
-TEST_F(DVRpcServicerGrantsTest, AnEarlyFailureWithoutAReplyHandlerIsLoggedAndHarmless) {
+TEST_F(DVRpcServicerGrantsTest, AnEarlyFailureWithoutAReplyHandlerIsLoggedAndATaskThatCallsNothing) {
   servicer_->extendSandboxForFileURL(kReport, kNobody, kEditor, /*completionHandler=*/{});
   EXPECT_EQ(platform_.log.texts(QXLogType::fault).size(), 1U);
+  EXPECT_EQ(platform_.queues.pendingOnGlobalQueue(), 1U);
   platform_.queues.runAll();
 }
 
@@ -234,6 +274,21 @@ TEST_F(DVRpcServicerGrantsTest, AURLOfNobodyLeavesTheGrantAndFails) {
   EXPECT_TRUE(isGranted(kCellar));
 }
 
+TEST_F(DVRpcServicerGrantsTest, AProviderThatIsRemovedWhileItNamesTheItemLeavesTheGrantAndFails) {
+  cellar_->vendor().respond("_identifierForItemAtURL:completion:", [](const QXArray&) { return std::nullopt; });
+  extend(kReport, kCellar, kEditor);
+  const std::size_t question = cellar_->vendor().messages().size() - 1;
+  removeCellar();
+  cellar_->vendor().answer(question, {QXValue(), kItem.value});
+  const Answer& answer = lateAnswer();
+  EXPECT_EQ(answer.error, DVSandboxExtensionFailedError(kReport));
+  EXPECT_TRUE(answer.hasNoValue());
+  EXPECT_TRUE(isGranted(kCellar));
+  EXPECT_EQ(logged().back(),
+            (fake_platform::FakeLogEntry{QXLogType::fault, "[ERROR] Failed to extend sandbox for URL " + kReport.absoluteString() +
+                                                               " from provider ID com.orvane.cellar to consumer ID com.example.editor."}));
+}
+
 TEST_F(DVRpcServicerGrantsTest, TheProvidersDirectoryItselfIsNoItem) {
   extend(FakePlatform::storageURL(kCellar.value), kCellar, kEditor);
   EXPECT_EQ(lateAnswer().error, DVSandboxExtensionFailedError(FakePlatform::storageURL(kCellar.value)));
@@ -253,7 +308,7 @@ TEST_F(DVRpcServicerGrantsTest, ARefusedItemTokenIsNoFailure) {
   EXPECT_EQ(answer.itemToken, std::nullopt);
   EXPECT_EQ(answer.siblingURL, kSibling);
   EXPECT_TRUE(answer.siblingToken);
-  EXPECT_EQ(logged().back(), (fake_platform::FakeLogEntry{QXLogType::info, kSuccess}));
+  EXPECT_EQ(logged(), (Entries{{QXLogType::debug, kServing}, {QXLogType::info, kSuccess}}));
 }
 
 TEST_F(DVRpcServicerGrantsTest, ARefusedSiblingTokenIsNoFailure) {
@@ -264,6 +319,18 @@ TEST_F(DVRpcServicerGrantsTest, ARefusedSiblingTokenIsNoFailure) {
   EXPECT_TRUE(answer.itemToken);
   EXPECT_EQ(answer.siblingURL, kSibling);
   EXPECT_EQ(answer.siblingToken, std::nullopt);
+  EXPECT_EQ(logged(), (Entries{{QXLogType::debug, kServing}, {QXLogType::info, kSuccess}}));
+}
+
+TEST_F(DVRpcServicerGrantsTest, ASiblingThatWouldNotLieBesideTheItemIsReturnedWithoutAToken) {
+  const std::string storage = FakePlatform::storageURL(kCellar.value).absoluteString();
+  extend(QXURL::fromString(storage + "sub%2Ffile"), kCellar, kEditor);
+  const Answer& answer = lateAnswer();
+  EXPECT_EQ(answer.error, std::nullopt);
+  EXPECT_TRUE(answer.itemToken);
+  EXPECT_EQ(answer.siblingURL, QXURL::fromString(storage + ".sub%2Ffile"));
+  EXPECT_EQ(answer.siblingToken, std::nullopt);
+  EXPECT_EQ(platform_.sandbox.issueCalls().size(), 1U) << "nobody asks for the other file's";
 }
 
 TEST_F(DVRpcServicerGrantsTest, TokensAreIssuedAnewEachTime) {

@@ -53,6 +53,21 @@ TEST_F(DVRpcServicerPlaceholderTest, AURLOfAnotherProviderGoesToTheNamedOne) {
   EXPECT_TRUE(asked().empty());
 }
 
+// A provider is registered under one identifier and may say that it has another.
+TEST_F(DVRpcServicerPlaceholderTest, TheListIsAskedAboutTheProviderAsTheRequestNamesIt) {
+  rename(kCellar, kAttic);
+  grant(kAttic, kItem, kEditor);
+  ask(kReport, kCellar, kEditor);
+  EXPECT_EQ(lateAnswer().error, DVNotPermittedError());
+  EXPECT_EQ(logged().back(), (fake_platform::FakeLogEntry{QXLogType::fault,
+                                                          "[ERROR] Consumer ID com.example.editor is not allowed to access item ID “item "
+                                                          "7” from provider ID com.orvane.cellar."}));
+  EXPECT_FALSE(wasForwarded());
+  answers_.clear();
+  grantAndAsk();
+  EXPECT_EQ(lateAnswer().error, std::nullopt);
+}
+
 TEST_F(DVRpcServicerPlaceholderTest, NoDirectoryIsLookedAt) {
   grantAndAsk();
   EXPECT_TRUE(std::ranges::none_of(platform_.log.texts(), [](const auto& text) { return text.starts_with("[INFO] Resolved URL"); }));
@@ -98,6 +113,19 @@ TEST_P(DVRpcServicerItemsByURLTest, IdentifiersAreComparedToTheCharacter) {
     EXPECT_EQ(error->underlying->code, static_cast<std::int64_t>(DVErrorCode::invalidParameter)) << similar;
   }
   EXPECT_TRUE(asked().empty());
+}
+
+TEST_P(DVRpcServicerItemsByURLTest, TheIdentifierIsHeldAgainstTheOneThatTheProviderSaysItHas) {
+  rename(kCellar, kAttic);
+  grant(kAttic, kItem, kEditor);
+  ask(kReport, kAttic, kEditor);
+  EXPECT_EQ(answers_.size(), 1U);
+  EXPECT_TRUE(wasForwarded());
+  answers_.clear();
+  ask(kReport, kCellar, kEditor);
+  const auto& error = earlyAnswer().error;
+  ASSERT_TRUE(error && error->underlying);
+  EXPECT_EQ(error->underlying->code, static_cast<std::int64_t>(DVErrorCode::invalidParameter));
 }
 
 TEST_F(DVRpcServicerStartTest, AURLOfAnotherProviderThanTheNamedOneIsAnInvalidParameterWithThatIdentifierBeneathNotFound) {

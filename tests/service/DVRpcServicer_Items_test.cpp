@@ -174,9 +174,10 @@ TEST_P(DVRpcServicerItemsTest, AURLAndAProviderOfNobodyAreNotFound) {
   EXPECT_EQ(logged(), refusalLines(requestText(kElsewhere, kNobody), error));
 }
 
-TEST_P(DVRpcServicerItemsTest, AnEarlyFailureWithoutAReplyHandlerIsLoggedAndHarmless) {
+TEST_P(DVRpcServicerItemsTest, AnEarlyFailureWithoutAReplyHandlerIsLoggedAndATaskThatCallsNothing) {
   askFor(/*url=*/std::nullopt, kCellar, kEditor, /*reply=*/{});
   EXPECT_EQ(platform_.log.texts(QXLogType::fault).size(), 1U);
+  EXPECT_EQ(platform_.queues.pendingOnGlobalQueue(), 1U);
   platform_.queues.runAll();
 }
 

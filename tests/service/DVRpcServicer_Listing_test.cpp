@@ -59,7 +59,10 @@ TEST_F(DVRpcServicerListingTest, TheListIsTakenWhenItIsAskedFor) {
   EXPECT_EQ(DVExtensionDocuvend::providersInfo()[kCellar.value], QXValue(QXDictionary()));
   platform_.queues.runAll();
   ASSERT_EQ(answers_.size(), 1U);
-  EXPECT_EQ((*answers_[0].providers)[kCellar.value], QXValue(infoOf(kCellar.value)));
+  const QXDictionary taken = {{kCellar.value, infoOf(kCellar.value)}, {kAttic.value, infoOf(kAttic.value)}};
+  EXPECT_EQ(answers_[0].providers, taken);
+  EXPECT_EQ(logged().back(), (fake_platform::FakeLogEntry{QXLogType::debug, "[DEBUG] providersCompletionHandler:: returning providers " +
+                                                                                QXValue(taken).description()}));
 }
 
 TEST_F(DVRpcServicerListingTest, AProviderWithoutADirectoryIsListedWithoutInformation) {

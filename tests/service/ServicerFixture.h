@@ -66,6 +66,30 @@ class ServicerFixture : public testing::Test {
     platform_.log.clear();
   }
 
+  // One is updated: its registered object is another from then on. Its extension answers nothing but its setup.
+  std::shared_ptr<fake_platform::FakeExtension> updateCellar() {
+    auto updated = platform_.installProvider(kCellar.value, /*version=*/2);
+    platform_.extensionHost.setExtensions({updated, attic_});
+    platform_.queues.runAll();
+    return updated;
+  }
+  // One is uninstalled.
+  void removeCellar() {
+    platform_.extensionHost.setExtensions({attic_});
+    platform_.queues.runAll();
+    ASSERT_EQ(DVExtensionDocuvend::providerWithIdentifier(kCellar), nullptr);
+  }
+  // Has the object that is registered under the one identifier say that it has the other.
+  static void rename(const ProviderID& registered, const ProviderID& own) {
+    DVExtensionDocuvend::providerWithIdentifier(registered)->setIdentifier(own);
+  }
+  // A store of the server's own, which is not the shared one.
+  std::shared_ptr<DVAccessControlStore> giveServerItsOwnStore() {
+    auto own = std::make_shared<DVAccessControlStore>();
+    source_->store = own;
+    return own;
+  }
+
   void entitle(std::string_view entitlement) { connection_->setEntitlement(std::string(entitlement), true); }
   void letConnectionGo() { connection_.reset(); }
 
