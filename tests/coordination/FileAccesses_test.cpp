@@ -411,6 +411,17 @@ TEST_F(FileAccessesTest, AskWhoeverHasReplacedAProviderForThoseWhoWaitedUntilThe
   EXPECT_EQ(provider->asked.size(), Provisions::kMaximumRequestsUnderWay);
 }
 
+TEST_F(FileAccessesTest, AskWhoeverHasReplacedAProviderAlsoWhenThatWasBetweenTheLookAndTheWait) {
+  for (std::size_t i = 0; i < Provisions::kMaximumRequestsUnderWay; ++i) read("/storage/" + std::to_string(i), a);
+  const auto next = std::make_shared<RecordingProvider>(QXURL::fileURL("/storage", QXURLKind::directory));
+  fileSystem.onNextLook = [this, &next] {
+    coordinator._removeDocuvend(provider);
+    coordinator._addDocuvend(next);
+  };
+  read(item, a);
+  EXPECT_EQ(next->asked.size(), 1U);
+}
+
 // ---- writing
 
 TEST_F(FileAccessesTest, TellsTheProviderOnceThenPassesTheTurnOnThenAnswers) {

@@ -1,6 +1,7 @@
 // What a provider hears of writes while it is slow to answer, is replaced, or goes.
 #include <gtest/gtest.h>
 
+#include <functional>
 #include <memory>
 #include <optional>
 #include <string>
@@ -46,7 +47,14 @@ struct SlowProviderTest : ::testing::Test {
 
   std::vector<InstalledStorage> installed = {{"com.example.provider", QXURL::fileURL("/storage", QXURLKind::directory)}};
   fake_platform::FakeFileSystem fileSystem;
-  LinuxFileCoordinator coordinator{fileSystem, {.installedStorages = [this] { return installed; }}};
+  std::function<void()> onLook;  // when a file's owner is known
+  LinuxFileCoordinator coordinator{fileSystem,
+                                   {.installedStorages = [this] { return installed; },
+                                    .isInPlace =
+                                        [this](const KeyedFile&) {
+                                          if (onLook) onLook();
+                                          return true;
+                                        }}};
   FileAccesses accesses{coordinator};
   const std::shared_ptr<RecordingProvider> provider = std::make_shared<RecordingProvider>(QXURL::fileURL("/storage", QXURLKind::directory));
   const std::shared_ptr<RecordingProvider> next = std::make_shared<RecordingProvider>(QXURL::fileURL("/storage", QXURLKind::directory));
@@ -136,6 +144,20 @@ TEST_F(SlowProviderTest, ThatIsRemovedBetweenTheLookAndTheNoteLeavesItTheSame) {
   coordinator.tellFinishedWriting(before, {2, {}}, file, [&isAnswered] { isAnswered = true; });
   EXPECT_TRUE(isAnswered);
   EXPECT_EQ(next->told.size(), 1U);
+}
+
+TEST_F(SlowProviderTest, ThatIsReplacedWhileItIsToldWhatWasWrittenBeforeItCameLeavesTheRestToTheNextOne) {
+  coordinator._removeDocuvend(provider);
+  writeMany(kMost + 1);
+  std::size_t looks = 0;
+  onLook = [this, &looks] {
+    if (++looks != kMost + 1) return;
+    coordinator._removeDocuvend(provider);
+    coordinator._addDocuvend(next);
+  };
+  coordinator._addDocuvend(provider);
+  EXPECT_EQ(provider->told.size(), kMost);
+  EXPECT_EQ(next->told.size(), 1U) << "it was noted at one that was gone by then";
 }
 
 TEST_F(SlowProviderTest, ThatIsUninstalledIsToldNothingMore) {
