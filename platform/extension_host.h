@@ -26,7 +26,7 @@ class QXExtensionContext {
   QXExtensionContext& operator=(const QXExtensionContext&) = delete;
   virtual ~QXExtensionContext() = default;
 
-  // The connection to the extension's process.
+  // The connection to the extension's process. URLs in its replies come under their straight names.
   [[nodiscard]] virtual std::shared_ptr<QXRpcConnection> auxiliaryConnection() = 0;
 };
 
@@ -81,7 +81,8 @@ class QXExtensionHost {
   virtual ~QXExtensionHost() = default;
 
   // Calls the handler with all installed extensions that have every attribute: once with the present set, then again each time the set
-  // changes. Never inside this call; one call at a time.
+  // changes. Changes that come while a call runs may be reported as one, or not at all when they cancel out. Never inside this call; one
+  // call at a time.
   [[nodiscard]] virtual std::unique_ptr<QXExtensionMatch> beginMatching(Attributes attributes, QXExtensionContextClass contextClass,
                                                                         MatchHandler handler) = 0;
 };

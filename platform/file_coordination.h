@@ -41,7 +41,7 @@ class QXDocuvend {
                                  ProvideCompletion completionHandler) = 0;
   // The same for nobody in particular. Deprecated: a service that can say who reads calls the other one.
   virtual void _provideItemAtURL(const QXURL& url, ProvideCompletion completionHandler) = 0;
-  // A writer has finished with a file in the directory.
+  // A writer has finished with a file in the directory. One call may stand for several writes.
   virtual void _writerWithID(const QXCoordinationID& writer, const QXURL& didFinishWritingForURL) = 0;
 };
 

@@ -8,8 +8,8 @@
 //
 // Instance side: identity and storage directory of one extension, the requests that reach its process, its registration with file
 // coordination, and the item operations that are forwarded to it. Shared by the registry, by file coordination, and by every
-// conversation that is under way; all members may be called from any thread. Nothing here is bounded in time: an extension that never
-// answers leaves the completion uncalled and its request open.
+// conversation that is under way; all members may be called from any thread. What is awaited is bounded by the extension host at most: an
+// extension that never answers, and whom the host lets be, leaves the completion uncalled and its request open.
 //
 // Completions run on the thread that delivered the extension's answer unless a member says otherwise. When the message to the extension
 // cannot be delivered after its proxy was handed out, a request handler and what stands behind it, completions included, may run a
@@ -46,7 +46,7 @@ class DVExtensionDocuvend final : public QXDocuvend, public std::enable_shared_f
   using URLCompletion = std::function<void(std::optional<QXError> error, std::optional<QXURL> url)>;
 
   using VendorProxy = QXRemote<_QXDocuvendVendor>;
-  // Ends the request at the extension host. May be called from any thread, and be kept.
+  // Ends the request at the extension host; does nothing for a request that never began. May be called from any thread, and be kept.
   using FinishHandler = std::function<void()>;
   // Of the error and the proxy one is present. Whether and when the request ends is the handler's affair.
   using RequestHandler = std::function<void(std::optional<QXError> error, std::optional<VendorProxy> proxy, FinishHandler finish)>;
@@ -57,8 +57,8 @@ class DVExtensionDocuvend final : public QXDocuvend, public std::enable_shared_f
   // every provider. Every later call only submits its completion to the global queue, even while the first pass is under way.
   static void createInstancesCompletion(Completion completion);
 
-  // Registers one after another, in order, with three tries each; a failure is logged and the next one's turn comes. The completion then
-  // runs once, on the global queue.
+  // Registers one after another, in order, with three tries each; a failure is logged and the next one's turn comes. A registration that
+  // reports again is logged again if it failed, and nothing else comes of it. The completion then runs once, on the global queue.
   static void refreshOperationsQueueRegisterProviders(Providers providers, Completion completion);
 
   // Null when no provider is registered under the identifier.
@@ -98,8 +98,8 @@ class DVExtensionDocuvend final : public QXDocuvend, public std::enable_shared_f
 
   // Starts or reaches the extension's process. The request handler runs on a thread of the extension host, or inside the call.
   void performExtensionRequest(RequestHandler handler);
-  // None, without a call of the error handler, when the request has no context. The error handler hears of every message that could not
-  // be delivered.
+  // None, without a call of the error handler, when the request has no context, or that no connection. The error handler hears of every
+  // message that could not be delivered.
   [[nodiscard]] std::optional<VendorProxy> proxyForIdentifier(const QXUUID& request, QXErrorHandler errorHandler);
 
   // --- Registration with file coordination
@@ -111,7 +111,7 @@ class DVExtensionDocuvend final : public QXDocuvend, public std::enable_shared_f
   void retryRegisterWithFileCoordinatorRetryCount(std::int32_t retryCount, QXError lastError, ErrorCompletion completion);
   // A single try.
   void registerWithFileCoordinatorCompletion(ErrorCompletion completion);
-  // On the operation queue, in no promised order with registrations.
+  // Takes back one registration, on the operation queue, in no promised order with registrations.
   void unregisterFromFileCoordinator();
 
   // --- Item operations. Every failure is DVPluginOperationFailedError with its cause beneath it.

@@ -43,7 +43,8 @@ class DVProviderRegistry {
     return started;
   }
 
-  // Set while discovery is started, so before there is a pass; the first pass that ends takes it. Every later one takes an empty one.
+  // Set while discovery is started, so before there is a pass; the first pass that ends takes it, and every later one takes an empty one.
+  // Two passes may take at once, because a pass resumes the queue before it takes and the next one may then run to its end.
   void setPendingStartUpCompletion(DVExtensionDocuvend::Completion completion) { pendingStartUpCompletion_ = std::move(completion); }
   [[nodiscard]] DVExtensionDocuvend::Completion takePendingStartUpCompletion();
 
@@ -60,7 +61,8 @@ class DVProviderRegistry {
   // Only on concurrentQueue_
   Dictionary concurrentQueueProviders_;
 
-  // Written while discovery is started; the completion is then touched by whoever sets the flag beside it, and by nobody else
+  // Written while discovery is started; the completion is then touched by whoever sets the flag beside it, and by nobody else: the passes
+  // exclude one another only until they resume the queue
   std::once_flag discoveryStarted_;
   std::unique_ptr<QXExtensionMatch> match_;
   DVExtensionDocuvend::Completion pendingStartUpCompletion_;

@@ -1,4 +1,5 @@
 // The two protocols of a conversation with a provider extension. Each interface is built on first use and is the same object from then on.
+// Derives from nothing and is never made: the contexts are the extension host's own, and only the two class operations are used.
 #pragma once
 
 #include "platform/rpc.h"
