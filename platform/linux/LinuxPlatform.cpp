@@ -57,9 +57,12 @@ constexpr mode_t kOwnerOnlyMask = 077;
 // Confined processes see the public directory and nothing beside it. That the administration is not for them does not rest on this.
 NamedServices namedServices(const Paths& paths) {
   NamedServices services;
-  for (const char* name : {kClientServiceName, kSandboxServiceName, kFileCoordinationServiceName}) {
-    services.emplace(name, NamedService{paths.publicSockets + "/" + name, Audience::everyone});
-  }
+  const auto publicService = [&](const char* name, URLNames urls) {
+    services.emplace(name, NamedService{paths.publicSockets + "/" + name, Audience::everyone, urls});
+  };
+  publicService(kClientServiceName, URLNames::straight);
+  publicService(kSandboxServiceName, URLNames::asSent);
+  publicService(kFileCoordinationServiceName, URLNames::asSent);
   services[kClientServiceName].operationsForNobody = {kWakeUp};
   services.emplace(kAdministrationServiceName, NamedService{paths.runtime + "/" + kAdministrationServiceName, Audience::unconfinedPeers});
   return services;
