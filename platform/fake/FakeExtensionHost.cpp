@@ -187,7 +187,9 @@ std::unique_ptr<QXExtensionMatch> FakeExtensionHost::beginMatching(Attributes at
   begun_.push_back({std::move(attributes), &contextClass.hostInterface, &contextClass.vendorInterface});
   auto shared = std::make_shared<MatchHandler>(std::move(handler));
   handlers_.push_back(shared);
-  return std::make_unique<Match>(std::move(shared));
+  auto match = std::make_unique<Match>(std::move(shared));
+  if (onBeginMatching_) onBeginMatching_();
+  return match;
 }
 
 void FakeExtensionHost::setExtensions(Extensions extensions) {

@@ -17,6 +17,7 @@
 #include <set>
 #include <string>
 #include <string_view>
+#include <utility>
 #include <vector>
 
 #include "platform/extension_host.h"
@@ -125,6 +126,9 @@ class FakeExtensionHost : public QXExtensionHost {
   [[nodiscard]] std::unique_ptr<QXExtensionMatch> beginMatching(Attributes attributes, QXExtensionContextClass contextClass,
                                                                 MatchHandler handler) override;
 
+  // Called by every further `beginMatching` at its end: what another thread can do to a match before its beginner has it.
+  void onBeginMatching(std::function<void()> callback) { onBeginMatching_ = std::move(callback); }
+
   // Makes this the present set and calls the handlers of the matches that are alive.
   void setExtensions(Extensions extensions);
   // Calls those handlers with the present set: the first call of a match that was begun after the set was given.
@@ -147,6 +151,7 @@ class FakeExtensionHost : public QXExtensionHost {
   Extensions extensions_;
   std::vector<Begun> begun_;
   std::vector<std::weak_ptr<MatchHandler>> handlers_;
+  std::function<void()> onBeginMatching_;
 };
 
 }  // namespace docuvend::fake_platform

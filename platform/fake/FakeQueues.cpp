@@ -142,7 +142,7 @@ class FakeQueues::Core {
     return sum;
   }
 
-  std::vector<std::string> createdLabels;
+  std::vector<FakeCreatedQueue> createdQueues;
   std::size_t runLoopRuns = 0;
 
  private:
@@ -263,12 +263,12 @@ FakeQueues::FakeQueues()
 FakeQueues::~FakeQueues() { core_->close(); }
 
 std::shared_ptr<QXQueue> FakeQueues::serialQueue(std::string label) {
-  core_->createdLabels.push_back(label);
+  core_->createdQueues.push_back({FakeQueueKind::serial, label});
   return std::make_shared<Queue>(core_, core_->add(std::move(label), Kind::serial));
 }
 
 std::shared_ptr<QXQueue> FakeQueues::concurrentQueue(std::string label) {
-  core_->createdLabels.push_back(label);
+  core_->createdQueues.push_back({FakeQueueKind::concurrent, label});
   return std::make_shared<Queue>(core_, core_->add(std::move(label), Kind::concurrent));
 }
 
@@ -315,7 +315,7 @@ std::size_t FakeQueues::suspendedCount(std::string_view label) const {
   return core_->count([label](const State& state) { return state.label == label ? state.suspended : 0; });
 }
 
-std::vector<std::string> FakeQueues::createdLabels() const { return core_->createdLabels; }
+std::vector<FakeCreatedQueue> FakeQueues::createdQueues() const { return core_->createdQueues; }
 
 std::string FakeQueues::currentLabel() const { return core_->currentLabel(); }
 

@@ -16,6 +16,7 @@
 #include <chrono>
 #include <cstddef>
 #include <memory>
+#include <ostream>
 #include <string>
 #include <string_view>
 #include <vector>
@@ -26,6 +27,19 @@ namespace docuvend::fake_platform {
 
 inline constexpr const char* kFakeGlobalQueueLabel = "global queue";
 inline constexpr const char* kFakeMainRunLoopLabel = "main run loop";
+
+enum class FakeQueueKind { serial, concurrent };
+
+// A queue as it was asked for.
+struct FakeCreatedQueue {
+  FakeQueueKind kind;
+  std::string label;
+
+  friend bool operator==(const FakeCreatedQueue&, const FakeCreatedQueue&) = default;
+  friend std::ostream& operator<<(std::ostream& stream, const FakeCreatedQueue& queue) {
+    return stream << (queue.kind == FakeQueueKind::serial ? "serial: " : "concurrent: ") << queue.label;
+  }
+};
 
 class FakeQueues final : public QXQueueService {
  public:
@@ -58,8 +72,8 @@ class FakeQueues final : public QXQueueService {
   // How many `resume` calls the queues with that label wait for.
   [[nodiscard]] std::size_t suspendedCount(std::string_view label) const;
 
-  // Labels of the serial and concurrent queues in the order of their creation, released ones too.
-  [[nodiscard]] std::vector<std::string> createdLabels() const;
+  // The serial and concurrent queues in the order of their creation, released ones too.
+  [[nodiscard]] std::vector<FakeCreatedQueue> createdQueues() const;
   // The label (or operation queue name) of the innermost running task; empty outside of tasks.
   [[nodiscard]] std::string currentLabel() const;
   // How often the main run loop's `run` was called.

@@ -11,9 +11,11 @@
 namespace docuvend {
 namespace {
 
+using fake_platform::FakeCreatedQueue;
 using fake_platform::FakeLogEntry;
 using fake_platform::FakeLogSwitch;
 using fake_platform::FakePlatform;
+using fake_platform::FakeQueueKind;
 using fake_platform::FakeWriteFailure;
 
 constexpr const char* kDirectory = "/home/fake/Library/Docuvend";
@@ -50,7 +52,7 @@ class DVAccessControlStoreTest : public testing::Test {
 TEST_F(DVAccessControlStoreTest, ThereIsOneSharedStore) {
   const DVAccessControlStore* first = &store();
   EXPECT_EQ(&store(), first);
-  EXPECT_EQ(platform_.queues.createdLabels(), std::vector<std::string>{kQueue});
+  EXPECT_EQ(platform_.queues.createdQueues(), (std::vector{FakeCreatedQueue{FakeQueueKind::serial, kQueue}}));
   EXPECT_EQ(platform_.notificationCenter.observers().size(), 1U);
 }
 
@@ -676,7 +678,7 @@ class WatchingFileSystem final : public fake_platform::FakeFileSystem {
 
   bool exists(const std::string& path) override {
     if (!observersAtFirstLook) observersAtFirstLook = notificationCenter_.observers().size();
-    if (!queuesAtFirstLook) queuesAtFirstLook = queues_.createdLabels().size();
+    if (!queuesAtFirstLook) queuesAtFirstLook = queues_.createdQueues().size();
     if (!queueOfFirstLook) queueOfFirstLook = queues_.currentLabel();
     return FakeFileSystem::exists(path);
   }

@@ -72,7 +72,27 @@ TEST_F(RegistrationTest, ASuccessfulSetupIsFollowedByTheRegistrationOnTheOperati
   EXPECT_EQ(completionLabels, Texts{kOperationQueue});
 }
 
+TEST_F(RegistrationTest, TheRequestEndsWhenTheRegistrationHasBeenQueued) {
+  int cancels = 0;
+  extension->onCancel = [this, &cancels] {
+    ++cancels;
+    EXPECT_EQ(platform.queues.pending(kOperationQueue), 1U);
+  };
+  provider->registerWithFileCoordinatorRetryCount(3, recorder());
+  answerSetup(std::nullopt);
+  EXPECT_EQ(cancels, 1);
+}
+
+TEST_F(RegistrationTest, TheRetryIsAnnouncedBeforeThePauseBegins) {
+  extension->failBegins(broken);
+  whenWritten("[NOTICE] Trying to register", [this] { EXPECT_EQ(platform.queues.pendingTimers(), 0U); });
+  provider->registerWithFileCoordinatorRetryCount(2, recorder());
+  EXPECT_EQ(looks, 1);
+  EXPECT_EQ(platform.queues.pendingTimers(), 1U);
+}
+
 TEST_F(RegistrationTest, TheRegistrationPrecedesItsMessageAndTheCompletion) {
+  whenWritten("[INFO] Registered docuvend extension", [this] { EXPECT_EQ(platform.fileCoordinator.providers().size(), 1U); });
   provider->registerWithFileCoordinatorRetryCount(3, [this](std::optional<QXError>) {
     EXPECT_EQ(platform.fileCoordinator.providers().size(), 1U);
     EXPECT_EQ(written().back(), kRegistered);
@@ -81,6 +101,7 @@ TEST_F(RegistrationTest, TheRegistrationPrecedesItsMessageAndTheCompletion) {
   answerSetup(std::nullopt);
   platform.queues.runAll();
   EXPECT_EQ(written(), Lines{"~ completion"});
+  EXPECT_EQ(looks, 1);
 }
 
 TEST_F(RegistrationTest, AProviderWithoutDirectoryIsRegisteredAllTheSame) {
@@ -159,8 +180,14 @@ TEST_F(RegistrationTest, ARetryMaySucceed) {
 TEST_F(RegistrationTest, ASetupThatFailsIsTriedAgainBeforeItsRequestEnds) {
   provider->registerWithFileCoordinatorRetryCount(3, recorder());
   written();
+  int cancels = 0;
+  extension->onCancel = [this, &cancels] {
+    ++cancels;
+    EXPECT_EQ(platform.queues.pendingTimers(), 1U);
+  };
   answerSetup(broken);
   EXPECT_EQ(written(), (Lines{kFailedToInitialize, kTwoTriesLeft, "~ cancel 1"}));
+  EXPECT_EQ(cancels, 1);
   EXPECT_EQ(platform.queues.pendingTimers(), 1U);
   EXPECT_TRUE(completions.empty());
   platform.queues.advance(2s);

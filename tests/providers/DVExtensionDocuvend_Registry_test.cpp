@@ -1,3 +1,5 @@
+#include <gmock/gmock.h>
+
 #include <algorithm>
 #include <chrono>
 
@@ -40,12 +42,11 @@ TEST_F(RegistryTest, BeforeDiscoveryAllLookupsAnswerNone) {
   EXPECT_EQ(written(), Lines{});
 }
 
-TEST_F(RegistryTest, TheQueuesAreLabelledAndMadeOnce) {
+TEST_F(RegistryTest, TheLookupsQueueIsConcurrentThePassesOneSerialAndBothAreLabelledAndMadeOnce) {
   discover({});
   EXPECT_TRUE(DVExtensionDocuvend::providersInfo().empty());
-  Texts created = platform.queues.createdLabels();
-  std::sort(created.begin(), created.end());
-  EXPECT_EQ(created, (Texts{kConcurrentQueue, kRefreshQueue}));
+  EXPECT_THAT(platform.queues.createdQueues(), testing::UnorderedElementsAre(FakeCreatedQueue{FakeQueueKind::concurrent, kConcurrentQueue},
+                                                                             FakeCreatedQueue{FakeQueueKind::serial, kRefreshQueue}));
 }
 
 TEST_F(RegistryTest, TheFirstCallBeginsOneMatchOfTheExtensionPoint) {
@@ -57,6 +58,15 @@ TEST_F(RegistryTest, TheFirstCallBeginsOneMatchOfTheExtensionPoint) {
   EXPECT_EQ(begun.vendorInterface, &_QXDocuvendExtensionHostContext::_extensionAuxiliaryVendorProtocol());
   EXPECT_EQ(platform.queues.runAll(), 0U) << "the completion waits for the first pass";
   EXPECT_TRUE(completions.empty());
+}
+
+TEST_F(RegistryTest, ThePassOfAMatchThatAnswersBeforeItsBeginningIsOverFindsTheFirstCompletion) {
+  platform.extensionHost.onBeginMatching([this] {
+    platform.extensionHost.deliver();
+    platform.queues.runAll();
+  });
+  DVExtensionDocuvend::createInstancesCompletion(recorder("first"));
+  EXPECT_EQ(completions, Texts{"first"});
 }
 
 TEST_F(RegistryTest, TheMatchIsNeverEnded) {
@@ -179,8 +189,11 @@ TEST_F(RegistryTest, OfThreeProvidersWhoseFirstFailsTheOthersAreStillRegisteredI
   const Lines lines = written();
   const auto isFailure = [](const Line& line) { return line.text().find("Could not register") != std::string::npos; };
   EXPECT_EQ(std::count_if(lines.begin(), lines.end(), isFailure), 1);
-  EXPECT_EQ(*std::find_if(lines.begin(), lines.end(), isFailure),
-            "fault: [ERROR] Could not register docuvend com.orvane.cellar. Error: TestDomain 7: broken");
+  const auto failure = std::find_if(lines.begin(), lines.end(), isFailure);
+  ASSERT_LT(failure, lines.end() - 1);
+  EXPECT_EQ(Lines(failure, failure + 2), (Lines{"fault: [ERROR] Could not register docuvend com.orvane.cellar. Error: TestDomain 7: broken",
+                                                "debug: [DEBUG] -[DVExtensionDocuvend registerWithFileCoordinatorRetryCount:completion:]"}))
+      << "the failure is logged, and then the next one's turn comes";
 }
 
 TEST_F(RegistryTest, AProviderThatReportsTwiceDoesNotRegisterTheRestTwice) {

@@ -15,18 +15,20 @@ class DVExtensionDocuvendTest : public ProvidersTest {
 
   std::shared_ptr<TracingExtension> extension;
   const std::string memberQueueLabel = "DVExtensionDocuvend concurrent member queue for " + kCellar;
+  const std::vector<FakeCreatedQueue> memberQueueAlone = {{FakeQueueKind::concurrent, memberQueueLabel}};
 };
 
 TEST_F(DVExtensionDocuvendTest, QueuesAreNamedAfterTheExtension) {
   platform.installProviderBundle(kCellar);
   const auto provider = make();
-  EXPECT_EQ(platform.queues.createdLabels(), Texts{memberQueueLabel});
+  EXPECT_EQ(platform.queues.createdQueues(), memberQueueAlone);
   EXPECT_EQ(provider->_providedItemsOperationQueue()->name(), "Operation queue for com.orvane.cellar");
 }
 
 TEST_F(DVExtensionDocuvendTest, QueuesOfAnExtensionWithoutIdentifierSayThatItIsAbsent) {
   const auto provider = make(std::nullopt);
-  EXPECT_EQ(platform.queues.createdLabels(), Texts{"DVExtensionDocuvend concurrent member queue for (null)"});
+  EXPECT_EQ(platform.queues.createdQueues(),
+            (std::vector{FakeCreatedQueue{FakeQueueKind::concurrent, "DVExtensionDocuvend concurrent member queue for (null)"}}));
   EXPECT_EQ(provider->_providedItemsOperationQueue()->name(), "Operation queue for (null)");
 }
 
@@ -144,7 +146,7 @@ TEST_F(DVExtensionDocuvendTest, QueuesAreNotRenamedByANewIdentifier) {
   const auto provider = make();
   provider->setIdentifier(ProviderID{kAttic});
   EXPECT_EQ(provider->identifier(), ProviderID{kAttic});
-  EXPECT_EQ(platform.queues.createdLabels(), Texts{memberQueueLabel});
+  EXPECT_EQ(platform.queues.createdQueues(), memberQueueAlone);
   EXPECT_EQ(provider->_providedItemsOperationQueue()->name(), "Operation queue for com.orvane.cellar");
 }
 

@@ -58,6 +58,15 @@ TEST_F(RefreshPassTest, APassGoesFromTheRefreshQueueOverABarrierToTheGlobalQueue
   EXPECT_EQ(platform.queues.pending(), 0U);
 }
 
+TEST_F(RefreshPassTest, APassSuspendsItsQueueThenSaysSoAndThenAsksForTheRebuild) {
+  whenWritten("[INFO] Updating provider list.", [this] {
+    EXPECT_TRUE(passIsUnderWay());
+    EXPECT_EQ(platform.queues.pending(kConcurrentQueue), 0U);
+  });
+  refresh({});
+  EXPECT_EQ(looks, 1);
+}
+
 TEST_F(RefreshPassTest, ALookupAfterTheStartOfAPassSeesItsProviders) {
   platform.extensionHost.setExtensions({installReady(kCellar)});
   EXPECT_EQ(provider(kCellar), nullptr);
@@ -139,6 +148,14 @@ TEST_F(RefreshPassTest, TheOldProviderIsUnregisteredInsideTheBarrier) {
   EXPECT_EQ(platform.queues.pendingOperations(), 1U);
   EXPECT_TRUE(platform.queues.runOne("Operation queue for com.orvane.cellar"));
   EXPECT_EQ(platform.fileCoordinator.calls().back().action, Action::remove);
+}
+
+TEST_F(RefreshPassTest, EveryNewProviderIsMadeBeforeAnyOldOneIsUnregistered) {
+  refresh({installReady(kCellar, 1)});
+  platform.applicationRegistry.removeRecord(kCellar);
+  whenWritten("[ERROR] Cannot instantiate a Bundlery proxy", [this] { EXPECT_EQ(platform.queues.pendingOperations(), 0U); });
+  refresh({std::make_shared<TracingExtension>(platform, kCellar, 2)});
+  EXPECT_EQ(looks, 1);
 }
 
 TEST_F(RefreshPassTest, AVanishedExtensionsProviderIsUnregisteredAndForgotten) {

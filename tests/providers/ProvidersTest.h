@@ -18,8 +18,10 @@
 
 namespace docuvend {
 
+using fake_platform::FakeCreatedQueue;
 using fake_platform::FakeExtension;
 using fake_platform::FakePlatform;
+using fake_platform::FakeQueueKind;
 
 inline const std::string kCellar = "com.orvane.cellar";
 inline const std::string kAttic = "com.orvane.attic";
@@ -58,7 +60,8 @@ using Lines = std::vector<Line>;
 using Texts = std::vector<std::string>;
 using Extensions = std::vector<std::shared_ptr<QXExtension>>;
 
-// Writes "~ begin" and "~ cancel N" into the log, and tells `onIdentifier` when it is asked for its identifier.
+// Writes "~ begin" and "~ cancel N" into the log, and tells `onIdentifier` when it is asked for its identifier and `onCancel` when a
+// request is cancelled.
 class TracingExtension : public FakeExtension {
  public:
   TracingExtension(FakePlatform& platform, std::optional<std::string> identifier, int version)
@@ -75,11 +78,13 @@ class TracingExtension : public FakeExtension {
     FakeExtension::beginExtensionRequest(std::move(completion));
   }
   void cancelExtensionRequest(const QXUUID& request) override {
+    if (onCancel) onCancel();
     trace("cancel " + std::to_string(request.bytes.back()));
     FakeExtension::cancelExtensionRequest(request);
   }
 
   std::function<void()> onIdentifier;
+  std::function<void()> onCancel;
 
  private:
   void trace(const std::string& what) { platform_.log.defaultLog().write(QXLogType::defaultType, "~ " + what); }
@@ -97,6 +102,15 @@ class ProvidersTest : public testing::Test {
     return lines;
   }
   void trace(const std::string& what) { platform.log.defaultLog().write(QXLogType::defaultType, "~ " + what); }
+
+  // What holds when a message of that beginning is written: `look` runs inside the write. How often it ran is `looks`.
+  void whenWritten(std::string beginning, std::function<void()> look) {
+    platform.log.onWrite([this, beginning = std::move(beginning), look = std::move(look)](const fake_platform::FakeLogEntry& entry) {
+      if (!entry.text.starts_with(beginning)) return;
+      ++looks;
+      look();
+    });
+  }
 
   // An installed extension; it answers begin requests, and nothing else yet.
   std::shared_ptr<TracingExtension> install(const std::string& identifier, int version = 1) {
@@ -120,6 +134,7 @@ class ProvidersTest : public testing::Test {
   static QXURL directory(const std::string& path) { return QXURL::fileURL(path, QXURLKind::directory); }
 
   FakePlatform platform;
+  int looks = 0;
   const QXError broken = QXError::make("TestDomain", 7, "broken");
   const QXError lost = QXError::make("TestDomain", 8, "lost");
 };

@@ -85,11 +85,12 @@ TEST(FakeQueues, TimePassesByHandAndDueTasksAreSubmittedNotRun) {
   EXPECT_EQ(ran, 1);
 }
 
-TEST(FakeQueues, CreatedQueuesAreRememberedWithTheirLabelsAfterTheirReleaseToo) {
+TEST(FakeQueues, CreatedQueuesAreRememberedWithTheirKindsAndLabelsAfterTheirReleaseToo) {
   FakeQueues queues;
-  (void)queues.serialQueue("serial");
-  const auto held = queues.concurrentQueue("concurrent");
-  EXPECT_THAT(queues.createdLabels(), ElementsAre("serial", "concurrent"));
+  (void)queues.serialQueue("one after another");
+  const auto held = queues.concurrentQueue("side by side");
+  EXPECT_THAT(queues.createdQueues(), ElementsAre(FakeCreatedQueue{FakeQueueKind::serial, "one after another"},
+                                                  FakeCreatedQueue{FakeQueueKind::concurrent, "side by side"}));
 }
 
 TEST(FakeQueues, SuspensionIsCounted) {
