@@ -99,6 +99,9 @@ TEST_F(ApplicationLinesTest, AreLeftByWhoeverGivesUp) {
   lines.end(provider, kEditor);
   lines.end(provider, kOther);
   EXPECT_TRUE(lines.isEmpty());
+  lines.enter(provider, kEditor, f);
+  lines.leave(provider, kEditor, f);
+  EXPECT_TRUE(lines.isEmpty());
 }
 
 }  // namespace

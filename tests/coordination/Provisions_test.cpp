@@ -26,11 +26,11 @@ const Application kEditor = "com.example.editor";
 const Application kOther = "com.example.other";
 
 struct ProvisionsTest : ::testing::Test {
-  // As many of an application as may be under way, of accesses from 1000 on.
-  std::vector<ProvideRequest> fill(const Application& application = kEditor) {
+  // As many of an application as may be under way, of accesses with numbers from there on.
+  std::vector<ProvideRequest> fill(const Application& application = kEditor, AccessNumber from = 1000) {
     std::vector<ProvideRequest> requests;
     for (std::size_t i = 0; i < kMost; ++i) {
-      const auto joined = provisions.join(provider, fileNamed("many" + std::to_string(i)), 1000 + i, a, application);
+      const auto joined = provisions.join(provider, fileNamed("many" + std::to_string(from - 1000 + i)), from + i, a, application);
       EXPECT_EQ(joined.wait, Wait::forNewRequest);
       requests.push_back(joined.request);
     }
@@ -155,12 +155,7 @@ TEST_F(ProvisionsTest, OfOneApplicationHoldUpNoOtherAlsoOfTheSameFile) {
 
 TEST_F(ProvisionsTest, ARequestIsMadeInTheNameOfAReaderOfItsLineWhoHasNotLeft) {
   const auto editors = fill();
-  const auto others = [this] {
-    std::vector<ProvideRequest> requests;
-    for (std::size_t i = 0; i < kMost; ++i)
-      requests.push_back(provisions.join(provider, fileNamed("others" + std::to_string(i)), 2000 + i, b, kOther).request);
-    return requests;
-  }();
+  const auto others = fill(kOther, 2000);
   (void)provisions.join(provider, f, 1, a, kEditor);
   (void)provisions.join(provider, f, 2, b, kOther);
   (void)provisions.join(provider, f, 3, b, kOther);
@@ -170,6 +165,16 @@ TEST_F(ProvisionsTest, ARequestIsMadeInTheNameOfAReaderOfItsLineWhoHasNotLeft) {
   const auto finished = provisions.finish(others[0]);
   ASSERT_TRUE(finished && finished->next);
   EXPECT_EQ(finished->next->number, 3U);
+}
+
+TEST_F(ProvisionsTest, ARequestIsMadeInTheNameOfAReaderOfTheLineThatHasRoom) {
+  (void)fill();
+  const auto others = fill(kOther, 2000);
+  EXPECT_EQ(provisions.join(provider, f, 1, a, kEditor).wait, Wait::inLine);
+  EXPECT_EQ(provisions.join(provider, f, 2, b, kOther).wait, Wait::inLine);
+  const auto finished = provisions.finish(others[0]);
+  ASSERT_TRUE(finished && finished->next);
+  EXPECT_EQ(finished->next->number, 2U) << "who came first is of another line";
 }
 
 TEST_F(ProvisionsTest, AllWhoStandInALineCanBeSentToAnotherObject) {

@@ -1,10 +1,13 @@
 // What a provider hears of writes while it is slow to answer, is replaced, or goes.
 #include <gtest/gtest.h>
 
+#include <chrono>
 #include <functional>
+#include <future>
 #include <memory>
 #include <optional>
 #include <string>
+#include <thread>
 #include <vector>
 
 #include "platform/fake/FakeFileSystem.h"
@@ -146,16 +149,32 @@ TEST_F(SlowProviderTest, ThatIsRemovedBetweenTheLookAndTheNoteLeavesItTheSame) {
   EXPECT_EQ(next->told.size(), 1U);
 }
 
+// One thread has found it to be the owner of the last file; before that is noted another one has replaced it, and found the last file where
+// it was noted before.
 TEST_F(SlowProviderTest, ThatIsReplacedWhileItIsToldWhatWasWrittenBeforeItCameLeavesTheRestToTheNextOne) {
+  static constexpr auto kGenerous = std::chrono::seconds(60);
   coordinator._removeDocuvend(provider);
   writeMany(kMost + 1);
-  std::size_t looks = 0;
-  onLook = [this, &looks] {
-    if (++looks != kMost + 1) return;
-    coordinator._removeDocuvend(provider);
-    coordinator._addDocuvend(next);
+  std::promise<void> isSeenByTheSecond;
+  std::promise<void> isNotedByTheFirst;
+  std::thread second;
+  std::size_t looks = 0;  // the two go on by turns
+  onLook = [this, &looks, &second, &isSeenByTheSecond, &isNotedByTheFirst] {
+    ++looks;
+    if (looks == kMost + 1) {
+      second = std::thread([this] {
+        coordinator._removeDocuvend(provider);
+        coordinator._addDocuvend(next);
+      });
+      EXPECT_EQ(isSeenByTheSecond.get_future().wait_for(kGenerous), std::future_status::ready);
+    } else if (looks == kMost + 3) {
+      isSeenByTheSecond.set_value();
+      EXPECT_EQ(isNotedByTheFirst.get_future().wait_for(kGenerous), std::future_status::ready);
+    }
   };
   coordinator._addDocuvend(provider);
+  isNotedByTheFirst.set_value();
+  second.join();
   EXPECT_EQ(provider->told.size(), kMost);
   EXPECT_EQ(next->told.size(), 1U) << "it was noted at one that was gone by then";
 }

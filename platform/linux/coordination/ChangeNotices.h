@@ -35,7 +35,8 @@ class ChangeNotices {
  public:
   // Of one application to one object.
   static constexpr std::size_t kMaximumNoticesUnderWay = 16;
-  // Of one application's writes of which one provider is not being told yet, and the bytes of their URLs.
+  // Of one application's writes of which one provider is not being told yet, and the bytes of their URLs. What had begun while there was
+  // room comes on top, which the accesses of an application limit.
   static constexpr std::size_t kMaximumUntoldFiles = 1024;
   static constexpr std::size_t kMaximumUntoldBytes = std::size_t{1} << 20U;
   // All unconfined processes are counted as one. They are trusted, and may write whole trees while a provider is not there.
