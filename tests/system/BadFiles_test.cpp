@@ -70,6 +70,18 @@ class BadFiles : public SystemTest {
     EXPECT_TRUE(house_.answers());
   }
 
+  // The token is for the file of that name, under whatever other name it was asked for.
+  void expectTokenFor(const std::string& asked, const std::string& name) {
+    const Granted granted = grant(storage_ + "/" + asked);
+    EXPECT_EQ(granted.error, std::nullopt) << asked;
+    EXPECT_EQ(redeem(granted.token), std::nullopt) << asked;
+    EXPECT_EQ(house_.loggedContaining("for URL " + QXURL::fileURL(storage_ + "/" + asked, QXURLKind::file).absoluteString() + " "), 0)
+        << asked;
+    fs::rename(storage_ + "/" + name, storage_ + "/moved");
+    EXPECT_NE(redeem(granted.token), std::nullopt) << asked;
+    fs::rename(storage_ + "/moved", storage_ + "/" + name);
+  }
+
   // A token for a file that is there, and which then becomes something else.
   QXData tokenFor(const std::string& name) {
     writeFile(storage_ + "/" + name, "contents");
@@ -93,11 +105,11 @@ TEST_F(BadFiles, APathThatLeadsOutWithDotsBelongsToNobody) {
   EXPECT_EQ(granted.token, std::nullopt);
 }
 
-TEST_F(BadFiles, APathWithDotsThatStaysInsideGetsNoToken) {
+TEST_F(BadFiles, APathWithDotsThatStaysInsideIsTheFileThatItLeadsTo) {
   fs::create_directory(storage_ + "/sub");
   writeFile(storage_ + "/file", "");
-  expectNoToken("sub/../file");
-  expectNoToken("./file");
+  expectTokenFor("sub/../file", "file");
+  expectTokenFor("./file", "file");
 }
 
 TEST_F(BadFiles, ALinkToAFileOutsideBelongsToNobody) {
@@ -107,19 +119,21 @@ TEST_F(BadFiles, ALinkToAFileOutsideBelongsToNobody) {
   EXPECT_EQ(granted.error->code, static_cast<std::int64_t>(DVErrorCode::sandboxExtensionFailed));
 }
 
-TEST_F(BadFiles, ALinkInsideGetsNoToken) {
+TEST_F(BadFiles, ALinkInsideIsTheFileThatItLeadsTo) {
   writeFile(storage_ + "/file", "");
   fs::create_symlink("file", storage_ + "/link");
-  expectNoToken("link");
+  expectTokenFor("link", "file");
   fs::create_directory(storage_ + "/sub");
   writeFile(storage_ + "/sub/file", "");
   fs::create_directory_symlink("sub", storage_ + "/way");
-  expectNoToken("way/file");
+  expectTokenFor("way/file", "sub/file");
 }
 
-TEST_F(BadFiles, ADanglingLinkGetsNoToken) {
+TEST_F(BadFiles, ADanglingLinkIsTheFileThatIsMissing) {
   fs::create_symlink("nothing", storage_ + "/link");
-  expectNoToken("link");
+  const Granted granted = grant(storage_ + "/link");
+  EXPECT_EQ(granted.error, std::nullopt);
+  expectRefused(redeem(granted.token), SandboxErrorCode::gone);
 }
 
 TEST_F(BadFiles, ASecondHardLinkGetsNoToken) {
