@@ -5,6 +5,9 @@
 // Queries, grants and revocations block their caller until that task is done, and a change is on disk when the call returns; when it
 // could not be written it is kept in memory, and the next change writes it too. None of them may be called from the store's own queue.
 // Failures are logged here and nowhere else.
+//
+// A file that is a property list but no access control list is kept beside, under another name, before it is overwritten. When it cannot
+// be kept nothing is written, as when writing fails.
 #pragma once
 
 #include <memory>
