@@ -11,17 +11,10 @@
 #include "daemon/DVGrantPage.h"
 #include "platform/QXPlatform.h"
 #include "providers/DVExtensionDocuvend.h"
+#include "service/DVRequests.h"
 
 namespace docuvend {
 namespace {
-
-std::optional<QXError> missingParameter(const std::optional<ItemID>& itemID, const std::optional<ProviderID>& providerID,
-                                        const std::optional<ConsumerID>& consumerID) {
-  if (!itemID) return DVInvalidParameterError("itemID", /*value=*/std::nullopt);
-  if (!providerID) return DVInvalidParameterError("providerID", /*value=*/std::nullopt);
-  if (!consumerID) return DVInvalidParameterError("consumerID", /*value=*/std::nullopt);
-  return std::nullopt;
-}
 
 // The containers of all groups that the provider's bundle belongs to: an update may have changed which of them has its documents, while
 // tokens for a container that it has left have ended with that. None when nothing is known of the provider: then a token may lie anywhere.
@@ -92,7 +85,7 @@ void DVAdministrator::grantsOfProviderID(std::optional<ProviderID> providerID, s
 
 void DVAdministrator::revokeItemID(std::optional<ItemID> itemID, std::optional<ProviderID> fromProviderID,
                                    std::optional<ConsumerID> toConsumerID, ErrorReply completionHandler) {
-  auto error = missingParameter(itemID, fromProviderID, toConsumerID);
+  auto error = dvMissingParameter("itemID", itemID, fromProviderID, toConsumerID);
   if (!error) error = revoke(*fromProviderID, *itemID, *toConsumerID);
   if (completionHandler) completionHandler(std::move(error));
 }

@@ -40,7 +40,9 @@ class DVDaemon {
   // Makes sure that the daemon runs. Needs no right.
   virtual void wakeUpCompletion(Done completion) = 0;
 
-  // Grants the consumer the item and issues tokens for it. Needs "com.orvane.docuvend.acl-write".
+  // Grants the consumer the item and issues tokens for it. Needs "com.orvane.docuvend.acl-write". A provider that has no name for the item
+  // has nothing granted: DVPluginOperationFailedError, with nothing beneath it when the provider gave no error. Nor has a consumer for
+  // which the access control list has no room, or which it cannot hold: DVNotPermittedError.
   virtual void extendSandboxForFileURL(std::optional<QXURL> url, std::optional<ProviderID> fromProviderID,
                                        std::optional<ConsumerID> toConsumerID, SandboxReply completionHandler) = 0;
 
@@ -62,11 +64,13 @@ class DVDaemon {
   virtual void providersCompletionHandler(ProvidersReply completionHandler) = 0;
 
   // Grants the consumer the item and names it in a form that outlives its URL. Needs no entitlement: the caller must be a bundle, and one
-  // that may write the file already.
+  // that may write the file already; an absent URL is refused without asking. An item without a name and a list without room are as
+  // above, and so is a provider without an identifier.
   virtual void extendBookmarkForFileURL(std::optional<QXURL> url, std::optional<ConsumerID> toConsumerID,
                                         StringReply completionHandler) = 0;
 
-  // Names the document in a form that outlives its URL. Needs no right. Neither string nor error: no provider owns the URL.
+  // Names the document in a form that outlives its URL. Needs no right. Neither string nor error: no provider owns the URL, or the one
+  // that does has no name for the document.
   virtual void bookmarkableStringFromDocumentURL(std::optional<QXURL> url, StringReply completion) = 0;
 
   // The way back, with fresh tokens. Needs a grant to the caller itself. Never answered when the provider named in the string is not

@@ -17,10 +17,13 @@ template <auto Operation>
   return rpc_detail::nameOf<Operation, DVDaemon>();
 }
 
-// DVInvalidParameterError for the first of the three that is absent.
-[[nodiscard]] inline std::optional<QXError> dvMissingParameter(const std::optional<QXURL>& url, const std::optional<ProviderID>& providerID,
-                                                               const std::optional<ConsumerID>& consumerID) {
-  if (!url) return DVInvalidParameterError("URL", /*value=*/std::nullopt);
+// DVInvalidParameterError for the first of the three that is absent: what the request is about, under the name that it has there, the
+// provider and the consumer.
+template <class Subject>
+[[nodiscard]] std::optional<QXError> dvMissingParameter(std::string_view name, const std::optional<Subject>& subject,
+                                                        const std::optional<ProviderID>& providerID,
+                                                        const std::optional<ConsumerID>& consumerID) {
+  if (!subject) return DVInvalidParameterError(name, /*value=*/std::nullopt);
   if (!providerID) return DVInvalidParameterError("providerID", /*value=*/std::nullopt);
   if (!consumerID) return DVInvalidParameterError("consumerID", /*value=*/std::nullopt);
   return std::nullopt;

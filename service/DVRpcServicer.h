@@ -8,6 +8,7 @@
 // One source per concern: DVRpcServicer_Checks, _Grants, _Items, _Listing, _Bookmarks.
 #pragma once
 
+#include <array>
 #include <memory>
 #include <optional>
 #include <span>
@@ -26,6 +27,8 @@ class DVExtensionDocuvend;
 // Each counts as held when its value is a number that is not zero, or true.
 inline constexpr std::string_view kDVReadEntitlement = "com.orvane.docuvend.acl-read";
 inline constexpr std::string_view kDVWriteEntitlement = "com.orvane.docuvend.acl-write";
+// Either is enough to ask for items and for the list of providers. They are looked at, and logged, in this order.
+inline constexpr std::array kDVReadersAndGranters = {kDVReadEntitlement, kDVWriteEntitlement};
 
 class DVRpcServicer final : public DVDaemon, public std::enable_shared_from_this<DVRpcServicer> {
  public:

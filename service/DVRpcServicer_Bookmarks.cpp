@@ -54,9 +54,10 @@ void DVRpcServicer::replyWithString(const StringRequest& request, const std::opt
     dvReplyWithError(request.reply, *error);
     return;
   }
+  const auto providerID = request.provider->identifier();
   std::optional<std::string> string;
-  if (itemID) {
-    string = DVBookmarkableString{request.provider->identifier().value_or(ProviderID{}), *itemID}.text();
+  if (providerID && itemID) {
+    string = DVBookmarkableString{*providerID, *itemID}.text();
     dvLog("[DEBUG] Successfully generated bookmarkable string “%@” from URL %@.", *string, request.url);
   } else {
     dvLog("[ERROR] Could not get Item ID for URL %@.", request.url);

@@ -39,7 +39,7 @@ void DVRpcServicer::extendSandboxForFileURL(std::optional<QXURL> url, std::optio
   }
 
   Provider provider;
-  auto error = dvMissingParameter(url, fromProviderID, toConsumerID);
+  auto error = dvMissingParameter("URL", url, fromProviderID, toConsumerID);
   if (!error) {
     provider = DVExtensionDocuvend::providerWithIdentifier(*fromProviderID);
     if (!provider) error = DVNotFoundError(*fromProviderID);
@@ -127,17 +127,17 @@ void DVRpcServicer::extendBookmarkForFileURL(std::optional<QXURL> url, std::opti
 
 void DVRpcServicer::recordGrantAndReplyWithString(const BookmarkRequest& request, const std::optional<QXError>& error,
                                                   const std::optional<ItemID>& itemID) const {
-  // As for a sandbox grant: no item, nothing to grant.
-  if (error || !itemID) {
+  // As for a sandbox grant: no item, nothing to grant. Nor is there anything of a provider that nobody can name.
+  const auto providerID = request.provider->identifier();
+  if (error || !itemID || !providerID) {
     dvReplyWithError(request.reply, DVPluginOperationFailedError(error));
     return;
   }
-  const ProviderID providerID = request.provider->identifier().value_or(ProviderID{});
-  if (!recordGrant({providerID, request.consumerID, *itemID}, DVGranter::writer)) {
+  if (!recordGrant({*providerID, request.consumerID, *itemID}, DVGranter::writer)) {
     dvReplyWithError(request.reply, DVNotPermittedError());
     return;
   }
-  std::string string = DVBookmarkableString{providerID, *itemID}.text();
+  std::string string = DVBookmarkableString{*providerID, *itemID}.text();
   dvLog("[DEBUG] Successfully generated bookmarkable string “%@” from URL %@.", string, request.url);
   if (request.reply) request.reply(std::move(string), /*error=*/std::nullopt);
 }

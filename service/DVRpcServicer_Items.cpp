@@ -1,7 +1,6 @@
 // The three item operations are alike but not the same, and what differs is meant: a placeholder's provider is found by its identifier
 // alone and its early failure is passed on as it is; start and stop find the provider by the URL and wrap an early failure once more; stop
 // asks the access control list nothing, and answers with an error also when it has succeeded.
-#include <array>
 #include <variant>
 
 #include "common/DVErrors.h"
@@ -25,13 +24,11 @@ struct DVRpcServicer::ItemRequest {
 
 namespace {
 
-constexpr std::array kReadersAndGranters = {kDVReadEntitlement, kDVWriteEntitlement};
-
 using FoundProvider = std::variant<std::shared_ptr<DVExtensionDocuvend>, QXError>;
 
 FoundProvider providerNamed(const std::optional<QXURL>& url, const std::optional<ProviderID>& providerID,
                             const std::optional<ConsumerID>& consumerID) {
-  if (auto error = dvMissingParameter(url, providerID, consumerID)) return *std::move(error);
+  if (auto error = dvMissingParameter("URL", url, providerID, consumerID)) return *std::move(error);
   auto provider = DVExtensionDocuvend::providerWithIdentifier(*providerID);
   if (!provider) return DVNotFoundError(*providerID);
   return provider;
@@ -41,7 +38,7 @@ enum class MismatchCarries { thePassedIdentifier, nothing };
 
 FoundProvider providerOwning(const std::optional<QXURL>& url, const std::optional<ProviderID>& providerID,
                              const std::optional<ConsumerID>& consumerID, MismatchCarries value) {
-  if (auto error = dvMissingParameter(url, providerID, consumerID)) return *std::move(error);
+  if (auto error = dvMissingParameter("URL", url, providerID, consumerID)) return *std::move(error);
   auto provider = DVExtensionDocuvend::providerForURL(*url);
   if (!provider) return DVNotFoundError(*providerID);
   if (provider->identifier() == providerID) return provider;
@@ -100,7 +97,7 @@ void DVRpcServicer::stopProvidingItemAtURL(std::optional<QXURL> url, std::option
 }
 
 bool DVRpcServicer::clientMayAskForItems(const ErrorReply& reply) const {
-  if (clientHasOneOfAllowedEntitlements(kReadersAndGranters)) return true;
+  if (clientHasOneOfAllowedEntitlements(kDVReadersAndGranters)) return true;
   if (reply) dvSubmitError(reply, DVClientLacksEntitlement());
   return false;
 }

@@ -1,5 +1,3 @@
-#include <array>
-
 #include "common/DVErrors.h"
 #include "common/DVLog.h"
 #include "providers/DVExtensionDocuvend.h"
@@ -9,15 +7,13 @@
 namespace docuvend {
 namespace {
 
-constexpr std::array kReadersAndGranters = {kDVReadEntitlement, kDVWriteEntitlement};
-
 constexpr std::string_view operationName() { return dvOperationName<&DVDaemon::providersCompletionHandler>(); }
 
 }  // namespace
 
 void DVRpcServicer::providersCompletionHandler(ProvidersReply completionHandler) {
   dvLog("[DEBUG] Serving: %@", operationName());
-  if (!clientHasOneOfAllowedEntitlements(kReadersAndGranters)) {
+  if (!clientHasOneOfAllowedEntitlements(kDVReadersAndGranters)) {
     dvLog("[DEBUG] %@: Client is missing entitlement", operationName());
     if (completionHandler) dvSubmitError(std::move(completionHandler), DVClientLacksEntitlement());
     return;

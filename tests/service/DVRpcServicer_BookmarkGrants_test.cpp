@@ -362,6 +362,13 @@ TEST_F(DVRpcServicerBookmarkGrantsTest, AnAnswerWithNeitherErrorNorItemFailsTheR
   EXPECT_TRUE(platform_.propertyLists.writes().empty());
 }
 
+TEST_F(DVRpcServicerBookmarkGrantsTest, AProviderWithoutAnIdentifierFailsTheRequestAndRecordsNothing) {
+  answerItemID(*loseIdentifier(kCellar), /*error=*/std::nullopt, kItem.value);
+  extend(kReport, kStranger);
+  EXPECT_EQ(lateAnswer().error, DVPluginOperationFailedError(std::nullopt));
+  EXPECT_TRUE(platform_.propertyLists.writes().empty());
+}
+
 TEST_F(DVRpcServicerBookmarkGrantsTest, AProviderThatAnswersTwiceIsHeardTwiceAndTheConnectionTakesTheFirst) {
   cellar_->vendor().respond(kIdentifierMessage, [](const QXArray&) { return std::nullopt; });
   extend(kReport, kStranger);

@@ -107,6 +107,16 @@ TEST_F(DVRpcServicerBookmarksTest, NeitherErrorNorItemIsLoggedAndAnsweredWithNei
             (Entries{kGettingString, {QXLogType::fault, "[ERROR] Could not get Item ID for URL " + kReport.absoluteString() + "."}}));
 }
 
+TEST_F(DVRpcServicerBookmarksTest, AProviderWithoutAnIdentifierHasNoStrings) {
+  answerItemID(*loseIdentifier(kCellar), /*error=*/std::nullopt, "item/7");
+  toString(kReport);
+  const Answer& answer = lateAnswer();
+  EXPECT_EQ(answer.error, std::nullopt);
+  EXPECT_TRUE(answer.hasNoValue());
+  EXPECT_EQ(logged(),
+            (Entries{kGettingString, {QXLogType::fault, "[ERROR] Could not get Item ID for URL " + kReport.absoluteString() + "."}}));
+}
+
 TEST_F(DVRpcServicerBookmarksTest, AnEmptyItemIdentifierMakesAStringAllTheSame) {
   answerItemID(*cellar_, /*error=*/std::nullopt, "");
   toString(kReport);

@@ -5,7 +5,6 @@
 namespace docuvend {
 namespace {
 
-using fake_platform::FakeExtension;
 using fake_platform::FakePlatform;
 
 class DVSandboxTokensTest : public ServicerFixture {
@@ -44,12 +43,7 @@ TEST_F(DVSandboxTokensTest, ProvidersAreComparedByIdentifierNotByObject) {
 }
 
 TEST_F(DVSandboxTokensTest, ProvidersWithoutIdentifierAreNotTakenForEachOther) {
-  const auto owner = provider(kCellar);
-  const auto nameless = std::make_shared<FakeExtension>(std::nullopt);
-  platform_.adopt(*nameless);
-  owner->setExtension(nameless);
-  owner->setIdentifier(std::nullopt);
-  ASSERT_EQ(owner->identifier(), std::nullopt);
+  const auto nameless = loseIdentifier(kCellar);
   expectNotPermitted(dvIssueTokens(*DVExtensionDocuvend::initWithExtension(nameless), kReport));
 }
 

@@ -83,6 +83,16 @@ class ServicerFixture : public testing::Test {
   static void rename(const ProviderID& registered, const ProviderID& own) {
     DVExtensionDocuvend::providerWithIdentifier(registered)->setIdentifier(own);
   }
+  // Has the object that is registered under the identifier say that it has none. Gives the extension that it has from then on.
+  std::shared_ptr<fake_platform::FakeExtension> loseIdentifier(const ProviderID& registered) {
+    auto nameless = std::make_shared<fake_platform::FakeExtension>(std::nullopt);
+    platform_.adopt(*nameless);
+    const auto provider = DVExtensionDocuvend::providerWithIdentifier(registered);
+    provider->setExtension(nameless);
+    provider->setIdentifier(std::nullopt);
+    EXPECT_EQ(provider->identifier(), std::nullopt);
+    return nameless;
+  }
   // A store of the server's own, which is not the shared one.
   std::shared_ptr<DVAccessControlStore> giveServerItsOwnStore() {
     auto own = std::make_shared<DVAccessControlStore>();
