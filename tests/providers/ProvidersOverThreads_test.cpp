@@ -13,6 +13,7 @@
 
 #include "platform/linux/queue/LinuxQueues.h"
 #include "providers/DVExtensionDocuvend.h"
+#include "tests/support/EagerExtension.h"
 #include "tests/support/FakePlatform.h"
 
 namespace docuvend {
@@ -24,57 +25,7 @@ constexpr int kRequests = 200;
 
 using Platform = fake_platform::FakePlatformOver<linux_platform::LinuxQueues>;
 
-QXQueue& globalQueue() { return QXPlatform::current().queues.globalQueue(); }
-
-// Answers every message with nothing but success, from another thread.
-class EagerProxy final : public QXRpcProxy {
- public:
-  void send(const QXRpcOperation& operation, QXArray, QXRpcReply reply) override {
-    globalQueue().async([reply = std::move(reply), count = operation.replies.size()] { reply(QXArray(count)); });
-  }
-};
-
-class EagerConnection final : public QXRpcConnection {
- public:
-  void setExportedInterface(QXRpcInterface) override {}
-  void setExportedObject(std::shared_ptr<QXRpcExportedObject>) override {}
-  void resume() override {}
-  [[nodiscard]] int processIdentifier() const override { return 0; }
-  [[nodiscard]] QXAuditToken auditToken() const override { return {}; }
-  [[nodiscard]] std::optional<QXValue> valueForEntitlement(const std::string&) const override { return std::nullopt; }
-  [[nodiscard]] std::shared_ptr<QXRpcProxy> remoteObjectProxy(QXErrorHandler) override { return std::make_shared<EagerProxy>(); }
-};
-
-class EagerContext final : public QXExtensionContext {
- public:
-  [[nodiscard]] std::shared_ptr<QXRpcConnection> auxiliaryConnection() override { return std::make_shared<EagerConnection>(); }
-};
-
-// Answers begin requests from another thread, and counts what is begun and cancelled.
-class EagerExtension final : public QXExtension {
- public:
-  EagerExtension(std::string identifier, int version) : identifier_(std::move(identifier)), version_(version) {}
-
-  [[nodiscard]] std::optional<std::string> identifier() const override { return identifier_; }
-  [[nodiscard]] std::string description() const override { return identifier_; }
-  [[nodiscard]] bool isEqual(const QXExtension& other) const override {
-    const auto& eager = dynamic_cast<const EagerExtension&>(other);
-    return eager.identifier_ == identifier_ && eager.version_ == version_;
-  }
-  void beginExtensionRequest(BeginCompletion completion) override {
-    globalQueue().async([completion = std::move(completion)] { completion(QXUUID{}, /*error=*/std::nullopt); });
-  }
-  void cancelExtensionRequest(const QXUUID&) override { ++cancelled; }
-  [[nodiscard]] std::shared_ptr<QXExtensionContext> extensionContextForRequest(const QXUUID&) override {
-    return std::make_shared<EagerContext>();
-  }
-
-  std::atomic<int> cancelled = 0;
-
- private:
-  const std::string identifier_;
-  const int version_;
-};
+using tests::EagerExtension;
 
 class ProvidersOverThreadsTest : public testing::Test {
  protected:
