@@ -81,6 +81,17 @@ TEST_F(CallbacksTest, AChangeWhoseMessageIsLostIsLoggedAndEndsTheRequest) {
                    "fault: [ERROR] Cannot tell extension com.orvane.cellar that item at URL " + text + " has changed.", "~ cancel 2"}));
 }
 
+TEST_F(CallbacksTest, AChangeThatWasAnsweredAndThenLostIsLoggedAndItsRequestIsEndedAgain) {
+  provider->itemChangedAtURL(*url);
+  cellar->vendor().answerLast({QXValue()});
+  written();
+  cellar->vendor().failLastDelivery(lost);
+  EXPECT_EQ(written(),
+            (Lines{"fault: [ERROR] Error getting remote proxy object for provider extension. Error: TestDomain 8: lost",
+                   "fault: [ERROR] Cannot tell extension com.orvane.cellar that item at URL " + text + " has changed.", "~ cancel 2"}));
+  EXPECT_EQ(cellar->cancelled(), (std::vector{FakeExtension::uuid(1), FakeExtension::uuid(2), FakeExtension::uuid(2)}));
+}
+
 TEST_F(CallbacksTest, AFinishedWriteIsToldToTheProviderThatOwnsTheURL) {
   provider->_writerWithID(kWriter, *url);
   EXPECT_EQ(written(), (Lines{toldOf(text), "info: [INFO] Resolved URL to provider com.orvane.cellar.",

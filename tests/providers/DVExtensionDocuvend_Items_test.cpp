@@ -207,8 +207,13 @@ TEST_P(ItemsTest, AMissingProxyIsWrappedAndItsRequestIsLeftAlone) {
   extension->setHasContexts(false);
   GetParam().call(*provider, recorder());
   ASSERT_EQ(completed.size(), 1U);
-  EXPECT_EQ(completed[0].error, DVPluginOperationFailedError(DVProxyNotFoundError(ProviderID{kCellar})));
+  const QXError proxyNotFound = DVProxyNotFoundError(ProviderID{kCellar});
+  EXPECT_EQ(completed[0].error, DVPluginOperationFailedError(proxyNotFound));
   EXPECT_EQ(completed[0].result, std::nullopt);
+  std::string requestFailed = "fault: [ERROR] " + GetParam().requestFailed;
+  requestFailed.replace(requestFailed.find(broken.description()), std::string::npos, proxyNotFound.description());
+  EXPECT_EQ(written(), opened({"fault: [ERROR] Could not get extension context for request identifier 00000000-0000-0000-0000-000000000001",
+                               "fault: [ERROR] Could not get proxy object for a request.", requestFailed, "~ completion"}));
   EXPECT_TRUE(extension->cancelled().empty());
 }
 

@@ -149,6 +149,16 @@ TEST_F(ReadsTest, ADeliveryThatFailsAfterTheAnswerReachesTheReadASecondTime) {
   EXPECT_EQ(outcomes, (std::vector<std::optional<QXError>>{std::nullopt, DVPluginOperationFailedError(lost)}));
 }
 
+TEST_F(ReadsTest, AnAnswerThatComesAfterItsMessageWasTakenForLostReachesTheReadASecondTime) {
+  read(kReader);
+  cellar->vendor().failLastDelivery(lost);
+  cellar->vendor().answerLast({QXValue(), QXValue("item-7")});
+  platform.queues.runAll();
+  EXPECT_EQ(asked(), (Texts{kIdentifierOperation, kStartOperation}));
+  cellar->vendor().answerLast({QXValue()});
+  EXPECT_EQ(outcomes, (std::vector<std::optional<QXError>>{DVPluginOperationFailedError(lost), std::nullopt}));
+}
+
 TEST_F(ReadsTest, AReadThatNobodyWaitsForIsTolerated) {
   provider->_provideItemAtURL(*url, kReader, /*completionHandler=*/{});
   cellar->vendor().answerLast({QXValue(), QXValue("item-7")});

@@ -221,8 +221,14 @@ TEST_F(RegistrationTest, ThreeFailingSetupsReportTheThird) {
 TEST_F(RegistrationTest, AMissingProxyIsAFailureLikeAnyOther) {
   extension->setHasContexts(false);
   provider->registerWithFileCoordinatorRetryCount(1, recorder());
-  EXPECT_EQ(completions, std::vector<std::optional<QXError>>{DVProxyNotFoundError(ProviderID{kCellar})});
+  const QXError proxyNotFound = DVProxyNotFoundError(ProviderID{kCellar});
+  EXPECT_EQ(completions, std::vector<std::optional<QXError>>{proxyNotFound});
   EXPECT_TRUE(extension->cancelled().empty());
+  EXPECT_EQ(written(), (Lines{kMethod, "~ begin", kBeginning,
+                              "fault: [ERROR] Could not get extension context for request identifier 00000000-0000-0000-0000-000000000001",
+                              "fault: [ERROR] Could not get proxy object for a request.",
+                              "fault: [ERROR] Error registering docuvend extension com.orvane.cellar: " + proxyNotFound.description() + ".",
+                              "~ completion"}));
 }
 
 TEST_F(RegistrationTest, ACountOfZeroReportsFailureOnTheGlobalQueueAndLogsNothing) {

@@ -88,6 +88,16 @@ TEST_F(RegistryTest, TheFirstCompletionRunsOnceAfterEveryProviderOfTheFirstPassW
   EXPECT_EQ(completions, Texts{"first"});
 }
 
+TEST_F(RegistryTest, TheFirstCompletionIsLetGoWhenItHasRun) {
+  auto held = std::make_shared<int>();
+  const std::weak_ptr<int> watched = held;
+  DVExtensionDocuvend::createInstancesCompletion([held = std::move(held)] {});
+  EXPECT_FALSE(watched.expired());
+  platform.extensionHost.deliver();
+  platform.queues.runAll();
+  EXPECT_TRUE(watched.expired());
+}
+
 TEST_F(RegistryTest, TheFirstCompletionRunsAfterTheRefreshQueueWasResumed) {
   DVExtensionDocuvend::createInstancesCompletion([this] {
     completions.push_back("first");

@@ -7,6 +7,14 @@ namespace {
 const char* const kRequestOneNoContext =
     "fault: [ERROR] Could not get extension context for request identifier 00000000-0000-0000-0000-000000000001";
 
+// Answers a begin request with both a request and an error.
+class UndecidedExtension : public FakeExtension {
+ public:
+  using FakeExtension::FakeExtension;
+
+  void beginExtensionRequest(BeginCompletion completion) override { completion(uuid(1), QXError::make("TestDomain", 7, "broken")); }
+};
+
 class RequestsTest : public ProvidersTest {
  protected:
   struct Call {
@@ -80,6 +88,19 @@ TEST_F(RequestsTest, TheFinishHandlerOfARequestThatCouldNotBeginIsThereAndHasNot
   EXPECT_TRUE(extension->cancelled().empty());
 }
 
+TEST_F(RequestsTest, AnErrorBesideARequestWinsAndTheRequestCanBeFinished) {
+  const auto undecided = std::make_shared<UndecidedExtension>(kCellar);
+  provider->setExtension(undecided);
+  provider->performExtensionRequest(recorder());
+  ASSERT_EQ(calls.size(), 1U);
+  EXPECT_EQ(calls[0].error, broken);
+  EXPECT_FALSE(calls[0].hasProxy);
+  EXPECT_EQ(written(), (Lines{"debug: [DEBUG] Beginning extension request.",
+                              "fault: [ERROR] Extension request failed. Error: TestDomain 7: broken", "~ handler"}));
+  calls[0].finish();
+  EXPECT_EQ(undecided->cancelled(), std::vector{FakeExtension::uuid(1)});
+}
+
 TEST_F(RequestsTest, ARequestWithoutContextCallsTheHandlerOnceWithProxyNotFound) {
   extension->setHasContexts(false);
   provider->performExtensionRequest(recorder());
@@ -131,6 +152,16 @@ TEST_F(RequestsTest, ARequestBeginsAtTheExtensionThatTheProviderHasNow) {
   provider->performExtensionRequest(recorder());
   EXPECT_EQ(extension->beginCount(), 0);
   EXPECT_EQ(updated->beginCount(), 1);
+}
+
+TEST_F(RequestsTest, TheContextIsAskedOfTheExtensionThatTheProviderHasWhenTheRequestIsAnswered) {
+  extension->holdBegins();
+  provider->performExtensionRequest(recorder());
+  provider->setExtension(install(kCellar, 2));
+  extension->answerHeldBegin(FakeExtension::uuid(1));
+  ASSERT_EQ(calls.size(), 1U);
+  EXPECT_EQ(calls[0].error, DVProxyNotFoundError(ProviderID{kCellar})) << "the new extension knows no such request";
+  EXPECT_FALSE(calls[0].hasProxy);
 }
 
 TEST_F(RequestsTest, AMessageThatCannotBeDeliveredCallsTheHandlerASecondTimeWithTheSameFinishHandler) {

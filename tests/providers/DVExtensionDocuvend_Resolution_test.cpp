@@ -180,6 +180,17 @@ TEST_F(ResolutionTest, OfNestedDirectoriesTheFirstInTheSearchDecides) {
   EXPECT_TRUE(answer == "none excluded" || answer == kAttic) << answer;
 }
 
+TEST_F(ResolutionTest, EverySearchLooksAfresh) {
+  platform.applicationRegistry.setProviderRecord(kCellar, "group." + kCellar, FakePlatform::containerPath(kCellar));
+  const auto cellar = std::make_shared<TracingExtension>(platform, kCellar, 1);
+  FakePlatform::succeedSetup(*cellar);
+  have({cellar});
+  const QXURL url = FakePlatform::itemURL(kCellar, "a");
+  EXPECT_EQ(resolve(url), "none");
+  platform.fileSystem.addDirectory(FakePlatform::storagePath(kCellar));
+  EXPECT_EQ(resolve(url), kCellar);
+}
+
 TEST_F(ResolutionTest, TheURLMayNameNothingThatExists) {
   have({installReady(kCellar)});
   EXPECT_EQ(resolve(FakePlatform::itemURL(kCellar, "not yet written")), kCellar);

@@ -40,6 +40,7 @@ TEST_F(ToldTest, TheWriterIsHeldUntilTheExtensionHasAnswered) {
 
 TEST_F(ToldTest, TheWriterIsHeldUntilTheExtensionHasRefused) {
   tell(url);
+  EXPECT_TRUE(isHeld());
   cellar->vendor().answerLast({QXValue(QXError::make("TestDomain", 7, "broken"))});
   letGo();
   EXPECT_FALSE(isHeld());
@@ -47,6 +48,7 @@ TEST_F(ToldTest, TheWriterIsHeldUntilTheExtensionHasRefused) {
 
 TEST_F(ToldTest, TheWriterIsHeldUntilTheMessageIsLost) {
   tell(url);
+  EXPECT_TRUE(isHeld());
   cellar->vendor().failLastDelivery(QXError::make("TestDomain", 8, "lost"));
   letGo();
   EXPECT_FALSE(isHeld());

@@ -210,6 +210,29 @@ TEST_F(DVExtensionDocuvendTest, WritesWaitForTheReadThatIsRunning) {
   extension->onIdentifier = {};
 }
 
+// Tells what is left of a queue when it is destroyed.
+class FarewellExtension : public FakeExtension {
+ public:
+  FarewellExtension(const std::string& identifier, std::optional<bool>& queueWasGone)
+      : FakeExtension(identifier), queueWasGone_(queueWasGone) {}
+  ~FarewellExtension() override { queueWasGone_ = queue.expired(); }
+
+  std::weak_ptr<QXOperationQueue> queue;
+
+ private:
+  std::optional<bool>& queueWasGone_;
+};
+
+TEST_F(DVExtensionDocuvendTest, AProviderLetsGoOfItsExtensionBeforeItsOperationQueue) {
+  std::optional<bool> queueWasGone;
+  auto farewell = std::make_shared<FarewellExtension>(kCellar, queueWasGone);
+  auto provider = DVExtensionDocuvend::initWithExtension(farewell);
+  farewell->queue = provider->_providedItemsOperationQueue();
+  farewell.reset();
+  provider.reset();
+  EXPECT_EQ(queueWasGone, false);
+}
+
 TEST_F(DVExtensionDocuvendTest, AProviderThatIsLetGoIsDestroyed) {
   std::weak_ptr<DVExtensionDocuvend> gone;
   {

@@ -127,6 +127,16 @@ TEST_F(RefreshPassTest, AnUnchangedExtensionKeepsItsProvider) {
   EXPECT_EQ(cellar->beginCount(), 1);
 }
 
+TEST_F(RefreshPassTest, AnExtensionIsComparedWithTheOneThatTheProviderHasNow) {
+  refresh({installReady(kCellar, 1)});
+  const auto before = provider(kCellar);
+  const auto updated = installReady(kCellar, 2);
+  before->setExtension(updated);
+  refresh({updated});
+  EXPECT_EQ(provider(kCellar), before);
+  EXPECT_EQ(platform.fileCoordinator.calls(), (std::vector<Call>{{Action::add, before}}));
+}
+
 TEST_F(RefreshPassTest, AnUpdatedExtensionGetsANewProviderAndTheOldOneIsUnregistered) {
   refresh({installReady(kCellar, 1)});
   const auto before = provider(kCellar);
