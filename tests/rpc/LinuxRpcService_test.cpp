@@ -11,7 +11,9 @@
 
 #include <array>
 #include <fstream>
+#include <functional>
 #include <iostream>
+#include <utility>
 #include <vector>
 
 #include "platform/linux/rpc/BoundSocket.h"
@@ -56,17 +58,37 @@ class SubjectLog final : public QXLogHandle {
   Mailbox<std::string> subjects;
 };
 
+// Answers a ping only when the test says so, and stands still until then.
+class SlowObject final : public TestProtocol {
+ public:
+  void echo(std::optional<std::string>, TextReply) override {}
+  void echoMany(std::optional<bool>, std::optional<std::int64_t>, std::optional<double>, std::optional<QXData>, std::optional<QXURL>,
+                std::optional<QXUUID>, std::optional<QXArray>, std::optional<QXDictionary>, std::optional<QXError>, std::optional<ItemID>,
+                ManyReply) override {}
+  void list(ListReply) override {}
+  void ping(Done completion) override {
+    begun.put(true);
+    (void)mayEnd.take();
+    completion();
+  }
+
+  Mailbox<bool> begun;
+  Mailbox<bool> mayEnd;
+};
+
 // Serves the test protocol to everybody, and hands over the connections.
 class Delegate final : public QXRpcListenerDelegate {
  public:
   bool listener(QXRpcListener&, const std::shared_ptr<QXRpcConnection>& shouldAcceptNewConnection) override {
     shouldAcceptNewConnection->setExportedInterface(qxInterfaceOf<TestProtocol>());
-    shouldAcceptNewConnection->setExportedObject(std::make_shared<QXRpcExport<TestProtocol>>(std::make_shared<TestObject>()));
+    shouldAcceptNewConnection->setExportedObject(std::make_shared<QXRpcExport<TestProtocol>>(makeObject()));
     shouldAcceptNewConnection->resume();
     connections.put(shouldAcceptNewConnection);
     return true;
   }
 
+  // Called for each connection; set before the first.
+  std::function<std::shared_ptr<TestProtocol>()> makeObject = [] { return std::make_shared<TestObject>(); };
   Mailbox<std::shared_ptr<QXRpcConnection>> connections;
 };
 
@@ -630,6 +652,25 @@ TEST(LinuxRpcServicePublishingTest, APassedSocketDoesNotMakeItsNameAService) {
   const tests::TemporaryDirectory directory;
   EXPECT_THAT(publish(directory.path() + "/" + kServiceName, "com.example.Other", PassedSocket::ofThatName),
               EndedWith("no socket is known for it"));
+}
+
+TEST_F(LinuxRpcServiceTest, ARequestThatTakesLongHoldsUpNoOtherConnection) {
+  const auto slow = std::make_shared<SlowObject>();
+  delegate->makeObject = [slow, isFirst = true]() mutable -> std::shared_ptr<TestProtocol> {
+    if (std::exchange(isFirst, false)) return slow;
+    return std::make_shared<TestObject>();
+  };
+  serve();
+  Mailbox<bool> answered;
+  const auto first = driver.connect();
+  QXRemote<TestProtocol>(first.proxy([&answered](const QXError&) { answered.put(false); })).call<&TestProtocol::ping>([&answered] {
+    answered.put(true);
+  });
+  ASSERT_TRUE(slow->begun.take());
+  EXPECT_TRUE(roundTrip(driver.connect()));
+  EXPECT_EQ(answered.count(), 0U);
+  slow->mayEnd.put(true);
+  EXPECT_EQ(answered.take(), true);
 }
 
 TEST_F(LinuxRpcServiceTest, TheListenersEndClosesItsConnections) {
