@@ -57,12 +57,11 @@ constexpr mode_t kOwnerOnlyMask = 077;
 // Confined processes see the public directory and nothing beside it. That the administration is not for them does not rest on this.
 NamedServices namedServices(const Paths& paths) {
   NamedServices services;
-  const auto publicService = [&](const char* name, URLNames urls) {
-    services.emplace(name, NamedService{paths.publicSockets + "/" + name, Audience::everyone, urls});
-  };
-  publicService(kClientServiceName, URLNames::straight);
-  publicService(kSandboxServiceName, URLNames::asSent);
-  publicService(kFileCoordinationServiceName, URLNames::asSent);
+  for (const char* name : {kClientServiceName, kSandboxServiceName, kFileCoordinationServiceName}) {
+    services.emplace(name, NamedService{paths.publicSockets + "/" + name, Audience::everyone});
+  }
+  // Documents lie there and nowhere else.
+  services[kClientServiceName].straightBelow = paths.groupContainers;
   services[kClientServiceName].operationsForNobody = {kWakeUp};
   services.emplace(kAdministrationServiceName, NamedService{paths.runtime + "/" + kAdministrationServiceName, Audience::unconfinedPeers});
   return services;

@@ -69,6 +69,18 @@ TEST_F(Links, DotsAfterALinkPassOnTheDocumentThatTheyLeadTo) {
               ElementsAre(url(letter_).absoluteString(), "ok", stringFor("letter.txt")));
 }
 
+// A link in the attacker's container whose text is the name of a thing that the attacker cannot see.
+TEST_F(Links, TheProviderLearnsNoNamesThatLinksLeadToOutsideOfDocuments) {
+  const std::string secret = house_.home() + "/tax-2026.txt";
+  writeFile(secret, "mine");
+  const std::string link = way_ + "/peek";
+  fs::create_symlink(secret, link);
+  EXPECT_EQ(grant(url(link)).outcome, "DVErrorDomain 9");
+  EXPECT_EQ(house_.loggedContaining("Successfully got item ID “peek”"), 1);
+  EXPECT_EQ(house_.loggedContaining("tax-2026"), 0);
+  EXPECT_EQ(grant(url(letter_)).outcome, "ok");
+}
+
 TEST_F(Links, AnOwnDirectoryExchangedWithALinkToTheProvidersPassesOnNothing) {
   const std::string decoy = way_ + ".decoy";
   fs::create_directory_symlink(house_.storage(kColluder), decoy);

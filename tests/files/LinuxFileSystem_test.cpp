@@ -212,30 +212,50 @@ TEST_F(LinuxFileSystemTest, NamesThatLookRemovedAreNames) {
   EXPECT_EQ(lies("other (deleted)", "other (deleted)"), kSame);
 }
 
-TEST_F(LinuxFileSystemTest, WhatHasBeenRemovedLiesNowhere) {
-  const UniqueDescriptor file(::open(path("items/file").c_str(), O_RDONLY | O_CLOEXEC));
+TEST_F(LinuxFileSystemTest, ADirectoryThatHasBeenRemovedIsNowhere) {
   const UniqueDescriptor sub(::open(path("items/sub").c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC));
-  fs::remove(path("items/file"));
   fs::remove(path("items/sub"));
-  writeText(path("items/file (deleted)"), "a name that looks like the removed file's");
-  const auto opened = [](const UniqueDescriptor& descriptor) {
-    return QXURL::fileURL("/proc/self/fd/" + std::to_string(descriptor.get()), QXURLKind::file);
-  };
+  fs::create_directory(path("items/sub (deleted)"));
   const QXURL items = QXURL::fileURL(path("items"), QXURLKind::directory);
-  EXPECT_EQ(liesAt(items, opened(file)), -EAGAIN);
-  EXPECT_EQ(liesAt(items, opened(sub)), -EAGAIN);
   // Not by the link itself, which would be no directory.
-  const QXURL itself = QXURL::fileURL(opened(sub).fileSystemPath() + "/.", QXURLKind::file);
+  const QXURL itself = QXURL::fileURL("/proc/self/fd/" + std::to_string(sub.get()) + "/.", QXURLKind::file);
   EXPECT_EQ(liesAt(itself, items), -EAGAIN);
 }
 
-TEST_F(LinuxFileSystemTest, AThingWithoutAPlaceIsAnError) {
-  int ends[2] = {-1, -1};
-  ASSERT_EQ(::pipe2(ends, O_CLOEXEC), 0);
-  const UniqueDescriptor reading(ends[0]);
-  const UniqueDescriptor writing(ends[1]);
-  const QXURL pipe = QXURL::fileURL("/proc/self/fd/" + std::to_string(reading.get()), QXURLKind::file);
-  EXPECT_EQ(liesAt(QXURL::fileURL(path("items"), QXURLKind::directory), pipe), -ESTALE);
+TEST_F(LinuxFileSystemTest, WhatAProcessHasOpenIsNoNameOfAnItem) {
+  const UniqueDescriptor file(::open(path("items/file").c_str(), O_RDONLY | O_CLOEXEC));
+  const QXURL opened = QXURL::fileURL("/proc/self/fd/" + std::to_string(file.get()), QXURLKind::file);
+  EXPECT_EQ(liesAt(QXURL::fileURL(path("items"), QXURLKind::directory), opened), -ELOOP);
+  EXPECT_EQ(straightURL(opened), opened);
+  const QXURL current = QXURL::fileURL("/proc/self/cwd/file", QXURLKind::file);
+  EXPECT_EQ(straightURL(current), current);
+}
+
+TEST_F(LinuxFileSystemTest, ALongWayThatIsMissingIsFoundWithFewLookups) {
+  std::string way = "items";
+  for (int i = 0; i < 1500; ++i) way += "/m";
+  EXPECT_EQ(lies(way), kContains);
+  EXPECT_EQ(straight(way), path(way));
+  EXPECT_EQ(lies(way + "/../x"), -ENOENT);
+}
+
+TEST_F(LinuxFileSystemTest, ManyLinksToMissingTargetsAreTooMany) {
+  constexpr int kLinks = 30;
+  for (int i = 0; i < kLinks; ++i) fs::create_symlink(std::to_string(i + 1), path("outside/" + std::to_string(i)));
+  EXPECT_EQ(straight("outside/" + std::to_string(kLinks - 2)), path("outside/" + std::to_string(kLinks)));
+  EXPECT_EQ(lies("outside/0"), -ELOOP);
+  EXPECT_EQ(straight("outside/0"), path("outside/0"));
+}
+
+TEST_F(LinuxFileSystemTest, AStraightNameLeadsBelowADirectoryAlsoWhenThatIsReachedOverALink) {
+  fs::create_directory_symlink("items", path("alias"));
+  const QXURL item = QXURL::fileURL(path("items/file"), QXURLKind::file);
+  EXPECT_TRUE(leadsBelow(item, path("items")));
+  EXPECT_TRUE(leadsBelow(item, path("alias")));
+  EXPECT_FALSE(leadsBelow(item, path("outside")));
+  EXPECT_FALSE(leadsBelow(item, path("items/sub")));
+  EXPECT_FALSE(leadsBelow(item, path("missing")));
+  EXPECT_FALSE(leadsBelow(QXURL::fileURL(path("items"), QXURLKind::directory), path("items")));
 }
 
 TEST_F(LinuxFileSystemTest, EscapedURLsNameTheSameFiles) {

@@ -108,7 +108,7 @@ class LinuxDriver {
       reactor,
       peers,
       log.defaultLog(),
-      {{kServiceName, {socketPath, linux_platform::Audience::everyone, linux_platform::URLNames::asSent, {"ping:", "list:"}}}}};
+      {{kServiceName, {socketPath, linux_platform::Audience::everyone, std::nullopt, {"ping:", "list:"}}}}};
 };
 
 }  // namespace docuvend::tests

@@ -7,30 +7,35 @@
 // A file removed between the opening and the question gets a name with a mark at its end. The mark could be part of a real name, so such a
 // name counts only if it leads back to the same file.
 //
-// What does not exist is split off component by component until something can be opened. The first missing component may be a link whose
-// target is missing; the place is then where the link points, because that is where a file would appear. Everything here can change while
-// it is looked at: a round that meets a change begins again, a bounded number of times.
+// Where something is missing, the longest beginning of the path that exists is searched for by halves. The first missing component may be
+// a link whose target is missing; the place is then where the link points, because that is where a file would appear. Everything here can
+// change while it is looked at: a round that meets a change begins again. The path and the links may be somebody's who wants this to take
+// long, so the number of lookups has a limit. Links of /proc, which lead where the one who follows them is or looks, are not followed.
 
 #include "platform/linux/files/FilePlace.h"
 
 #include <fcntl.h>
+#include <linux/openat2.h>
 #include <sys/stat.h>
+#include <sys/syscall.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <array>
 #include <cerrno>
 #include <climits>
 #include <filesystem>
 #include <optional>
 #include <string_view>
+#include <vector>
 
 #include "platform/linux/base/UniqueDescriptor.h"
 
 namespace docuvend::linux_platform {
 namespace {
 
-constexpr int kRounds = 8;  // beginnings after a change under way
-constexpr int kLinks = 40;  // links to missing targets in one path, as many as the kernel follows
+constexpr int kRounds = 8;    // beginnings after a change under way
+constexpr int kLookups = 48;  // of one question: a path of any length with links to a few missing targets
 constexpr std::string_view kRemovedMark = " (deleted)";
 
 using Text = std::variant<std::string, int>;
@@ -59,13 +64,40 @@ Text kernelName(int file) {
   return text;
 }
 
-// Takes the last component off, with the slashes around it.
-std::string takeLastComponent(std::string& path) {
-  while (path.size() > 1 && path.back() == '/') path.pop_back();
-  const std::size_t slash = path.rfind('/');
-  std::string component = path.substr(slash + 1);
-  path.resize(slash + 1);
-  return component;
+class Lookups {
+ public:
+  // For its location alone. ELOOP when there have been too many.
+  [[nodiscard]] UniqueDescriptor open(const std::string& path) {
+    if (left_ == 0) {
+      errno = ELOOP;
+      return {};
+    }
+    --left_;
+    open_how how{};
+    how.flags = O_PATH | O_CLOEXEC;
+    how.resolve = RESOLVE_NO_MAGICLINKS;
+    return UniqueDescriptor(static_cast<int>(::syscall(SYS_openat2, AT_FDCWD, path.c_str(), &how, sizeof how)));
+  }
+
+ private:
+  int left_ = kLookups;
+};
+
+// The components of an absolute path, each with the end of the path that it is the last of.
+struct Component {
+  std::string_view name;
+  std::size_t end;
+};
+
+std::vector<Component> componentsOf(std::string_view path) {
+  std::vector<Component> components;
+  for (std::size_t end = 0; end < path.size();) {
+    const std::size_t begin = path.find_first_not_of('/', end);
+    if (begin == std::string_view::npos) break;
+    end = std::min(path.find('/', begin), path.size());
+    components.push_back({path.substr(begin, end - begin), end});
+  }
+  return components;
 }
 
 std::string_view firstComponent(std::string_view path) { return path.substr(0, path.find('/')); }
@@ -89,41 +121,63 @@ Step followMissingLink(const UniqueDescriptor& directory, const FilePlace& place
   return {std::nullopt, (text.starts_with('/') ? text : place.existing + "/" + text) + place.missing.substr(name.size())};
 }
 
-Step step(std::string path) {
-  std::string missing;
-  while (true) {
-    const UniqueDescriptor file(::open(path.c_str(), O_PATH | O_CLOEXEC));
+Step placed(const UniqueDescriptor& file, std::string missing) {
+  Text name = kernelName(file.get());
+  if (const int* error = std::get_if<int>(&name)) return finished(*error);
+  FilePlace place{std::get<std::string>(std::move(name)), std::move(missing)};
+  if (place.missing.empty()) return finished(std::move(place));
+  return followMissingLink(file, place);
+}
+
+// The path's whole is missing: where it ends to exist.
+Step placeOfMissing(const std::string& path, Lookups& lookups) {
+  const std::vector<Component> components = componentsOf(path);
+  UniqueDescriptor deepest = lookups.open("/");
+  if (!deepest) return finished(errno);
+  std::size_t existing = 0;
+  std::size_t missing = components.size();
+  while (existing + 1 < missing) {
+    const std::size_t middle = existing + (missing - existing) / 2;
+    UniqueDescriptor file = lookups.open(path.substr(0, components[middle - 1].end));
     if (file) {
-      Text name = kernelName(file.get());
-      if (const int* error = std::get_if<int>(&name)) return finished(*error);
-      FilePlace place{std::get<std::string>(std::move(name)), std::move(missing)};
-      if (place.missing.empty()) return finished(std::move(place));
-      return followMissingLink(file, place);
+      deepest = std::move(file);
+      existing = middle;
+    } else if (errno == ENOENT) {
+      missing = middle;
+    } else {
+      return finished(errno);
     }
-    if (errno != ENOENT || path == "/") return finished(errno);
-    const std::string component = takeLastComponent(path);
-    if (component == "..") return finished(ENOENT);
-    if (component != ".") missing = missing.empty() ? component : component + "/" + missing;
   }
+  std::string rest;
+  for (std::size_t i = existing; i < components.size(); ++i) {
+    const std::string_view name = components[i].name;
+    if (name == "..") return finished(ENOENT);
+    if (name != ".") rest.append(rest.empty() ? "" : "/").append(name);
+  }
+  return placed(deepest, std::move(rest));
+}
+
+Step step(const std::string& path, Lookups& lookups) {
+  const UniqueDescriptor file = lookups.open(path);
+  if (file) return placed(file, {});
+  return errno == ENOENT ? placeOfMissing(path, lookups) : finished(errno);
 }
 
 }  // namespace
 
 FilePlace::Result FilePlace::ofItem(const std::string& path) {
   if (!path.starts_with('/')) return EINVAL;
+  Lookups lookups;
   std::string at = path;
-  int links = 0;
   for (int round = 0; round < kRounds;) {
-    Step taken = step(at);
+    Step taken = step(at, lookups);
     if (!taken.result) {
-      if (++links > kLinks) return ELOOP;
       at = std::move(taken.path);
       continue;
     }
     const int* error = std::get_if<int>(&*taken.result);
     if (error == nullptr || *error != EAGAIN) return *std::move(taken.result);
     at = path;
-    links = 0;
     ++round;
   }
   return EAGAIN;

@@ -17,4 +17,10 @@ QXURL straightURL(const QXURL& url) {
   return QXURL::fileURL(straight, url.hasDirectoryPath() ? QXURLKind::directory : QXURLKind::file);
 }
 
+bool leadsBelow(const QXURL& straight, const std::string& directory) {
+  const auto place = FilePlace::ofDirectory(directory);
+  const auto* above = std::get_if<FilePlace>(&place);
+  return above != nullptr && FilePlace{straight.fileSystemPath(), {}}.isBelow(*above);
+}
+
 }  // namespace docuvend::linux_platform

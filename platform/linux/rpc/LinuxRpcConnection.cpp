@@ -23,9 +23,10 @@ Endpoint::Handlers handlersFor(QXLogHandle& log, int loggedProcess, LogSubject::
 
 std::shared_ptr<LinuxRpcConnection> LinuxRpcConnection::create(Reactor& reactor, PeerDirectory& peers, QXLogHandle& log,
                                                                std::shared_ptr<const PeerIdentity> peer, UniqueDescriptor socket,
-                                                               CallRules rules, URLNames urls, EndHandler onEnd) {
+                                                               CallRules rules, std::optional<std::string> straightBelow,
+                                                               EndHandler onEnd) {
   auto handlers = handlersFor(log, peer->pid, rules.subject, std::move(onEnd));
-  std::shared_ptr<LinuxRpcConnection> connection(new LinuxRpcConnection(std::move(peer), urls));
+  std::shared_ptr<LinuxRpcConnection> connection(new LinuxRpcConnection(std::move(peer), std::move(straightBelow)));
   handlers.onHello = [&peers, weak = std::weak_ptr(connection)](const Hello& hello) -> std::optional<QXError> {
     const auto strongSelf = weak.lock();
     return strongSelf ? strongSelf->peerSaidHello(peers, hello) : std::nullopt;
@@ -54,7 +55,7 @@ std::shared_ptr<const PeerIdentity> LinuxRpcConnection::peer() const {
 void LinuxRpcConnection::setExportedInterface(QXRpcInterface interface) { endpoint_->setExportedInterface(std::move(interface)); }
 
 void LinuxRpcConnection::setExportedObject(std::shared_ptr<QXRpcExportedObject> object) {
-  endpoint_->setExportedObject(urls_ == URLNames::straight ? withStraightArguments(std::move(object)) : std::move(object));
+  endpoint_->setExportedObject(straightBelow_ ? withStraightArguments(std::move(object), *straightBelow_) : std::move(object));
 }
 
 void LinuxRpcConnection::resume() { endpoint_->resume(); }

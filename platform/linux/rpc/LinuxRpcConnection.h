@@ -11,7 +11,6 @@
 
 #include "platform/linux/base/UniqueDescriptor.h"
 #include "platform/linux/identity/PeerIdentity.h"
-#include "platform/linux/rpc/NamedService.h"
 #include "platform/linux/wire/CallRules.h"
 #include "platform/linux/wire/Endpoint.h"
 #include "platform/linux/wire/Reactor.h"
@@ -29,7 +28,8 @@ class LinuxRpcConnection final : public QXRpcConnection, public std::enable_shar
   // the rules' budget until they are answered, also when the connection ends before.
   [[nodiscard]] static std::shared_ptr<LinuxRpcConnection> create(Reactor& reactor, PeerDirectory& peers, QXLogHandle& log,
                                                                   std::shared_ptr<const PeerIdentity> peer, UniqueDescriptor socket,
-                                                                  CallRules rules, URLNames urls, EndHandler onEnd);
+                                                                  CallRules rules, std::optional<std::string> straightBelow,
+                                                                  EndHandler onEnd);
 
   void setExportedInterface(QXRpcInterface interface) override;
   void setExportedObject(std::shared_ptr<QXRpcExportedObject> object) override;
@@ -44,11 +44,12 @@ class LinuxRpcConnection final : public QXRpcConnection, public std::enable_shar
   void close(const QXError& reason);
 
  private:
-  LinuxRpcConnection(std::shared_ptr<const PeerIdentity> peer, URLNames urls) : urls_(urls), peer_(std::move(peer)) {}
+  LinuxRpcConnection(std::shared_ptr<const PeerIdentity> peer, std::optional<std::string> straightBelow)
+      : straightBelow_(std::move(straightBelow)), peer_(std::move(peer)) {}
   [[nodiscard]] std::optional<QXError> peerSaidHello(PeerDirectory& peers, const Hello& hello);
   [[nodiscard]] std::shared_ptr<const PeerIdentity> peer() const;
 
-  const URLNames urls_;
+  const std::optional<std::string> straightBelow_;
   std::shared_ptr<Endpoint> endpoint_;  // constant after creation
 
   mutable std::mutex mutex_;

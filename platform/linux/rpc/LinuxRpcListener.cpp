@@ -146,7 +146,7 @@ void LinuxRpcListener::admit(UniqueDescriptor socket) {
   const std::uint64_t number = nextNumber_++;
   auto connection =
       LinuxRpcConnection::create(surroundings_.reactor, surroundings_.peers, surroundings_.log, std::move(peer), std::move(socket),
-                                 std::move(rules), service_.urls, [weak = weak_from_this(), number](const QXError&) {
+                                 std::move(rules), service_.straightBelow, [weak = weak_from_this(), number](const QXError&) {
                                    if (const auto strongSelf = weak.lock()) strongSelf->forget(number);
                                  });
   {

@@ -8,6 +8,7 @@
 #include <map>
 #include <memory>
 #include <mutex>
+#include <optional>
 #include <string>
 #include <vector>
 
@@ -37,7 +38,7 @@ class LinuxRpcListener final : public QXRpcListener, public std::enable_shared_f
   struct Service {
     std::string name;
     Audience audience;
-    URLNames urls;
+    std::optional<std::string> straightBelow;
     std::vector<std::string> operationsForNobody;
   };
 

@@ -2,6 +2,7 @@
 #pragma once
 
 #include <map>
+#include <optional>
 #include <string>
 #include <vector>
 
@@ -12,16 +13,10 @@ enum class Audience {
   unconfinedPeers,  // processes of this user outside every confinement, whether or not they act for a bundle
 };
 
-// How its requests name files.
-enum class URLNames {
-  straight,  // made so (files/StraightURL.h) before the exported object hears of them
-  asSent,    // the service looks at the way itself
-};
-
 struct NamedService {
   std::string socketPath;  // absolute, in a directory that is there
   Audience audience = Audience::everyone;
-  URLNames urls = URLNames::asSent;
+  std::optional<std::string> straightBelow = {};      // a request's URL that leads into this directory is made straight (StraightURLs.h)
   std::vector<std::string> operationsForNobody = {};  // all that a peer without an identity may ask for
 };
 

@@ -1,5 +1,6 @@
 #include "platform/linux/rpc/StraightURLs.h"
 
+#include <optional>
 #include <utility>
 
 #include "platform/linux/files/StraightURL.h"
@@ -7,23 +8,29 @@
 namespace docuvend::linux_platform {
 namespace {
 
-void straighten(QXArray& values) {
+// Of all URLs, or of those that lead below a directory.
+void straighten(QXArray& values, const std::optional<std::string>& below = std::nullopt) {
   for (QXValue& value : values) {
-    if (auto* url = value.as<QXURL>()) *url = straightURL(*url);
+    auto* url = value.as<QXURL>();
+    if (url == nullptr) continue;
+    QXURL straight = straightURL(*url);
+    if (!below || leadsBelow(straight, *below)) *url = std::move(straight);
   }
 }
 
 class StraightArguments final : public QXRpcExportedObject {
  public:
-  explicit StraightArguments(std::shared_ptr<QXRpcExportedObject> object) : object_(std::move(object)) {}
+  StraightArguments(std::shared_ptr<QXRpcExportedObject> object, std::string below)
+      : object_(std::move(object)), below_(std::move(below)) {}
 
   void invoke(std::size_t operation, QXArray arguments, QXRpcReply reply) override {
-    straighten(arguments);
+    straighten(arguments, below_);
     object_->invoke(operation, std::move(arguments), std::move(reply));
   }
 
  private:
   const std::shared_ptr<QXRpcExportedObject> object_;
+  const std::string below_;
 };
 
 class StraightReplies final : public QXRpcProxy {
@@ -47,9 +54,9 @@ class StraightReplies final : public QXRpcProxy {
 
 }  // namespace
 
-std::shared_ptr<QXRpcExportedObject> withStraightArguments(std::shared_ptr<QXRpcExportedObject> object) {
+std::shared_ptr<QXRpcExportedObject> withStraightArguments(std::shared_ptr<QXRpcExportedObject> object, std::string below) {
   if (!object) return nullptr;
-  return std::make_shared<StraightArguments>(std::move(object));
+  return std::make_shared<StraightArguments>(std::move(object), std::move(below));
 }
 
 std::shared_ptr<QXRpcProxy> withStraightReplies(std::shared_ptr<QXRpcProxy> proxy) {
