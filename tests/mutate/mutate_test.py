@@ -99,6 +99,22 @@ class TheMutants(unittest.TestCase):
         self.assertEqual(changes(body("if (a) b(); else c();"), "statement"), [body("if (a) ; else c();"), body("if (a) b(); else ;")])
         self.assertEqual(changes("class C { void a() const; T b; };", "statement"), [])
 
+    def test_neighbouring_statements_are_exchanged_when_each_is_whole_and_calls_something(self):
+        self.assertEqual(changes(body("a(); b = c();  return;"), "order"), [body("b = c(); a();  return;")])
+        self.assertEqual(changes(body("a(); if (b) c(); d();"), "order"),
+                         [body("if (b) c(); a(); d();"), body("a(); d(); if (b) c();")])
+        self.assertEqual(changes(body("a([] { b(); }); c();"), "order"), [body("c(); a([] { b(); });")])
+        for statements in ("a(); int b = c(); d();", "a(); if (b) c(); else d();", "if (a) b(); else c(); d();", "a(); for (;;) b();",
+                           "a(); if (b) { c(); } d();", "a(); { b(); } c();", "a(); a();", "assert(a); b();", "a(); b = std::move(c);",
+                           "a(); if (b) return; c();", "switch (a) { case 1: b(); break; case 2: c(); }"):
+            self.assertEqual(changes(body(statements), "order"), [], statements)
+
+    def test_a_queue_becomes_one_of_the_other_kind(self):
+        self.assertEqual(changes("a(b.serialQueue(c), d->concurrentQueue(e))", "concurrency"),
+                         ["a(b.concurrentQueue(c), d->concurrentQueue(e))", "a(b.serialQueue(c), d->serialQueue(e))"])
+        self.assertEqual(changes("class C { T serialQueue(int a); };", "concurrency"), [])
+        self.assertEqual(changes("a(b.concurrentQueue(), b.serialQueue)", "concurrency"), [])
+
     def test_locks_barriers_and_queues_are_removed(self):
         self.assertEqual(changes(body("const std::lock_guard lock(mutex_);"), "statement"), [body(";")])
         self.assertEqual(changes(body("q->barrierAsync([a] { b(); });"), "queue"),
@@ -200,7 +216,7 @@ class TheResults(unittest.TestCase):
     def test_a_key_is_of_the_place_the_change_and_the_whole_file(self):
         texts = [body("a(); b();"), body("a(); b(); c();")]
         keys = {mutant.key(text) for text in texts for mutant in mutations.mutants_of("room/file.cpp", text, NAMES)}
-        self.assertEqual(len(keys), 5)
+        self.assertEqual(len(keys), 8)
 
     def test_an_equivalent_mutant_is_written_as_it_is_printed_with_its_reason(self):
         entries = mutate.read_equivalent("# why\n\nroom/a.cpp: statement\n- a();\n+ ;\n  a does nothing\n")

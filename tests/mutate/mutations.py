@@ -10,6 +10,8 @@ _ARITHMETIC = {"+": "-", "-": "+", "*": "/", "/": "*", "%": "*", "+=": "-=", "-=
 _DIVIDING = {"&&", "||", "?"} | set(_COMPARISONS)
 _LEVELS = {"[ERROR]": "[INFO]", "[INFO]": "[DEBUG]", "[DEBUG]": "[NOTICE]", "[NOTICE]": "[ERROR]"}
 _CALLS_TO_A_QUEUE = {"async", "barrierAsync", "sync", "after", "addOperation"}
+_KINDS_OF_QUEUE = {"serialQueue": "concurrentQueue", "concurrentQueue": "serialQueue"}
+_NO_CALLS = {"if", "move"}
 _LOCKS = {"lock_guard", "unique_lock", "scoped_lock", "shared_lock"}
 _NO_STATEMENT_OF_ITS_OWN = {
     "return", "using", "typedef", "const", "constexpr", "auto", "static", "if", "for", "while", "switch", "do", "case", "default", "throw",
@@ -177,6 +179,43 @@ def removed_statements(source, _):
             yield token.start, source.tokens[last].end, ";"
 
 
+def _can_stand_elsewhere(source, first, last):
+    """Whether a statement does something and is whole: no branch of another one, and none with an else or a body."""
+    token, parent = source.tokens[first], source.parent[first]
+    if source.tokens[first - 1].text not in ("{", "}", ";") or source.tokens[last + 1].text == "else":
+        return False
+    if token.text == "if":
+        return not any(body in source.bodies and source.parent[body] == parent for body in range(first, last))
+    if token.text in _NO_STATEMENT_OF_ITS_OWN | {"break", "continue", "assert"} or _DECLARATION.match(source.slice(first, last)):
+        return False
+    return token.kind == "word" or token.text in ("*", "(", "++", "--")
+
+
+def _calls_something(source, first, last):
+    return any(source.tokens[index].kind == "word" and source.tokens[index].text not in _NO_CALLS and source.tokens[index + 1].text == "("
+               for index in range(first, last))
+
+
+def exchanged_statements(source, _):
+    """Two neighbours that each call something; in what order values are stored is mostly nobody's affair."""
+    statements = [statement for statement in _statements(source)
+                  if _can_stand_elsewhere(source, *statement) and _calls_something(source, *statement)]
+    following = {first: (first, last) for first, last in statements}
+    for first, last in statements:
+        if last + 1 in following:
+            second, end = following[last + 1]
+            between = source.text[source.tokens[last].end:source.tokens[second].start]
+            yield source.tokens[first].start, source.tokens[end].end, source.slice(second, end) + between + source.slice(first, last)
+
+
+def other_queues(source, _):
+    for index, token in enumerate(source.tokens):
+        is_called = token.text in _KINDS_OF_QUEUE and index > 0 and source.tokens[index - 1].text in (".", "->")
+        # With a label; without one it is a queue that is there.
+        if is_called and source.tokens[index + 1].text == "(" and source.elements(index + 1):
+            yield token.start, token.end, _KINDS_OF_QUEUE[token.text]
+
+
 def removed_queues(source, _):
     """A barrier becomes an ordinary task, and what is to run on a queue runs in its place."""
     for index, token in enumerate(source.tokens[:-1]):
@@ -278,7 +317,9 @@ KINDS = {
     "constant": changed_constants,
     "text": changed_texts,
     "statement": removed_statements,
+    "order": exchanged_statements,
     "queue": removed_queues,
+    "concurrency": other_queues,
     "arguments": swapped_arguments,
     "value": other_values,
 }
