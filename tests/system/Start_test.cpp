@@ -39,6 +39,14 @@ TEST_F(Start, SaysSoWithItsProgramsPath) {
   EXPECT_EQ(house_.logged("[INFO] Server starting."), 1);
 }
 
+TEST_F(Start, EveryArgumentIsIgnoredAndItsPathIsTheOneThatItWasStartedBy) {
+  const std::string path = std::string(DOCUVEND_BIN) + "/./docuvendd";
+  house_.setDaemonWords({path, "--help", "foo"});
+  house_.startDaemon();
+  EXPECT_EQ(house_.log().at(0), "[NOTICE] " + path + " starting.");
+  EXPECT_TRUE(house_.answers());
+}
+
 TEST_F(Start, ItsFirstLinesAreTheStartThenTheListThenTheServer) {
   const std::string directory = house_.home() + "/Library/Docuvend";
   std::filesystem::create_directories(directory);

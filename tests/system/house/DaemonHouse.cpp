@@ -63,7 +63,7 @@ void closeToOthers(const fs::path& path) {
 
 }  // namespace
 
-DaemonHouse::DaemonHouse() {
+DaemonHouse::DaemonHouse() : daemonWords_{program("docuvendd")} {
   std::string pattern = (fs::temp_directory_path() / "dvXXXXXX").string();
   if (::mkdtemp(pattern.data()) == nullptr) throw std::runtime_error("no directory for a test");
   root_ = fs::canonical(pattern).string();
@@ -144,7 +144,7 @@ std::vector<std::string> DaemonHouse::environment() const {
 }
 
 UniqueDescriptor DaemonHouse::launchDaemon(const std::string& logSetting, const std::string& socketPath) {
-  Command command{{program("docuvendd")}, environment(), {}, logDescriptor_.get()};
+  Command command{daemonWords_, environment(), {}, logDescriptor_.get()};
   command.environment.push_back("DOCUVEND_LOG=" + logSetting);
   daemon_ = std::make_unique<Process>(command);
   UniqueDescriptor socket;

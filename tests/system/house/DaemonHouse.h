@@ -64,6 +64,8 @@ class DaemonHouse {
   void startDaemon(const std::string& logSetting = "debug");
   // The same, but waits only until its administration can be reached: clients may still wait for the providers then.
   void startDaemonWithoutWaiting(const std::string& logSetting = "debug");
+  // The program and the arguments of every daemon that is started from now on.
+  void setDaemonWords(std::vector<std::string> words) { daemonWords_ = std::move(words); }
   // Starts another one, for its failure.
   [[nodiscard]] Ending runDaemon(const std::vector<std::string>& environment) const;
   void killDaemon();
@@ -110,6 +112,7 @@ class DaemonHouse {
   std::string root_;
   std::string home_;
   std::vector<std::string> additions_;  // to the environment
+  std::vector<std::string> daemonWords_;
   linux_platform::UniqueDescriptor logDescriptor_;
   std::unique_ptr<Process> daemon_;
   std::unique_ptr<Client> companion_;
