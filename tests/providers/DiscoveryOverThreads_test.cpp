@@ -16,7 +16,7 @@ namespace {
 
 constexpr int kCallers = 8;
 constexpr int kPasses = 50;
-constexpr int kTurnsForASecondMatch = 2000;
+constexpr int kTurnsForASecondMatch = 200;
 
 using Platform = fake_platform::FakePlatformOver<linux_platform::LinuxQueues>;
 
