@@ -307,6 +307,7 @@ TEST_F(DVAdministratorTest, ARevocationThatCouldNotBeWrittenIsWrittenWhenItIsAsk
 TEST_F(DVAdministratorTest, TheFirstUnlockIsPostedAndThenAnswered) {
   connection_->setProcessIdentifier(4711);
   platform_.log.clear();
+  platform_.log.onWrite([this](const FakeLogEntry&) { EXPECT_EQ(platform_.queues.pendingOnMainRunLoop(), 0U) << "not posted yet"; });
   std::vector<std::size_t> posted;
   administrator_.announceFirstUnlockCompletionHandler([&](const std::optional<QXError>& error) {
     EXPECT_EQ(error, std::nullopt);

@@ -82,6 +82,16 @@ TEST(DVGrantPage, CountsTheTextOfAllThreeIdentifiers) {
   EXPECT_EQ(DVGrantPage::of(list, {}, 0).grants.size(), 5U);
 }
 
+TEST(DVGrantPage, CountsNoTextOfWhatTheFilterLeavesOut) {
+  auto list = ofLength(2, kDVMaximumTextBytesOfPage / 2);
+  list.push_back({kCellar, kEditor, ItemID{"7"}});
+  DVGrantFilter filter;
+  filter.provider = kCellar;
+  const auto page = DVGrantPage::of(list, filter, 0);
+  EXPECT_EQ(page.grants, QXArray{entry(kCellar, kEditor, "7")});
+  EXPECT_EQ(page.next, std::nullopt);
+}
+
 TEST(DVGrantPage, FitsIntoAMessageWhateverItHolds) {
   EXPECT_TRUE(fitsIntoAMessage(DVGrantPage::of(numbered(2 * kDVMaximumGrantsOfPage), {}, 0)));
   const std::string text(kDVLongestIdentifier, 'x');
