@@ -54,6 +54,13 @@ TEST_F(DVAdministrationServiceTest, ItsListenerIsMadeUnderItsNameAndHasItAsDeleg
   EXPECT_EQ(platform_.rpc.listener(kService)->delegate(), service_);
 }
 
+TEST_F(DVAdministrationServiceTest, ListensWhenItIsTheDelegate) {
+  std::vector<std::string> calls;
+  platform_.rpc.setRecorder([&calls](const std::string& call) { calls.push_back(call); });
+  service_->start();
+  EXPECT_EQ(calls, (std::vector<std::string>{std::string("listenerForService:") + kService, "setDelegate", "resume"}));
+}
+
 TEST_F(DVAdministrationServiceTest, ServesWhileTheProvidersAreBeingRegistered) {
   const auto cellar = std::make_shared<fake_platform::FakeExtension>("com.orvane.cellar", 1);
   platform_.installProviderBundle("com.orvane.cellar");
