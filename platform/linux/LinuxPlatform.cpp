@@ -49,6 +49,7 @@ constexpr const char* kClientServiceName = "com.orvane.Docuvend";
 constexpr const char* kAdministrationServiceName = "com.orvane.Administration";
 // What anybody may ask the client service for.
 constexpr const char* kWakeUp = "wakeUpCompletion:";
+constexpr const char* kEndAccess = "endAccess:completionHandler:";
 // A thread that serves a request may wait for a disk; one more at least is left for the others.
 constexpr unsigned kFewestReactorThreads = 4;
 // What this process and the extensions make is the user's alone, whatever a login leaves to others.
@@ -63,6 +64,8 @@ NamedServices namedServices(const Paths& paths) {
   // Documents lie there and nowhere else.
   services[kClientServiceName].straightBelow = paths.groupContainers;
   services[kClientServiceName].operationsForNobody = {kWakeUp};
+  // Those who wait for its turn may be all that a bundle may have waiting.
+  services[kFileCoordinationServiceName].releasing = {kEndAccess};
   services.emplace(kAdministrationServiceName, NamedService{paths.runtime + "/" + kAdministrationServiceName, Audience::unconfinedPeers});
   return services;
 }

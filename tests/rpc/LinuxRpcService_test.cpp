@@ -415,6 +415,29 @@ TEST_P(LinuxRpcServiceBudgetTest, OnePeersUnansweredRequestsAreLimitedOverAllIts
   EXPECT_TRUE(roundTrip(driver.connect()));
 }
 
+TEST_F(LinuxRpcServiceTest, WhatGivesSomethingBackIsServedAlsoAtTheLimit) {
+  constexpr std::size_t kReleases = 100;
+  serve();
+  driver.peers.setNextPeer(Standing::confined, "com.example.App", {});
+  const auto refusals = std::make_shared<Mailbox<QXError>>();  // the client fills it once more when it goes
+  const auto client = driver.connect();
+  const auto ask = [&client, refusals](const std::string& operation, std::size_t times) {
+    const auto proxy = client.proxy([refusals](const QXError& error) { refusals->put(error); });
+    const QXRpcInterface interface = qxInterfaceOf<TestProtocol>();
+    const QXRpcOperation& asked = interface.operations().at(interface.indexOf(operation).value());
+    for (std::size_t i = 0; i < times; ++i) {
+      proxy->send(asked, QXArray(asked.arguments.size()), [](const QXArray&) {});
+    }
+  };
+  ask(tests::kGivesSomethingBack, kReleases);
+  ask("list:", kMaximumCallsPerPeer);
+  ask(tests::kGivesSomethingBack, kReleases);
+  // One connection's requests run one after another: the first refusal is that of the one too many.
+  ask("list:", 1);
+  EXPECT_THAT(refusals->take(), IsRpcError(QXRpcErrorCode::tooManyCalls));
+  EXPECT_EQ(refusals->count(), 0U);
+}
+
 INSTANTIATE_TEST_SUITE_P(Of, LinuxRpcServiceBudgetTest,
                          testing::Values(std::pair(Standing::confined, kMaximumCallsPerPeer),
                                          std::pair(Standing::nobody, kMaximumCallsOfNobody),

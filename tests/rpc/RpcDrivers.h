@@ -22,6 +22,8 @@
 namespace docuvend::tests {
 
 inline constexpr const char* kServiceName = "com.example.Service";
+// Of its operations.
+inline constexpr const char* kGivesSomethingBack = "echoMany:number:real:data:url:uuid:array:dictionary:error:item:completion:";
 
 class TemporaryDirectory {
  public:
@@ -108,7 +110,7 @@ class LinuxDriver {
       reactor,
       peers,
       log.defaultLog(),
-      {{kServiceName, {socketPath, linux_platform::Audience::everyone, std::nullopt, {"ping:", "list:"}}}}};
+      {{kServiceName, {socketPath, linux_platform::Audience::everyone, std::nullopt, {"ping:", "list:"}, {kGivesSomethingBack}}}}};
 };
 
 }  // namespace docuvend::tests

@@ -162,7 +162,7 @@ bool LinuxRpcListener::isFor(const PeerIdentity& peer) const {
 }
 
 CallRules LinuxRpcListener::rulesFor(const PeerIdentity& peer, std::shared_ptr<CallBudget> budget) const {
-  CallRules rules{std::move(budget), /*operations=*/{}, LogSubject::current()};
+  CallRules rules{std::move(budget), /*operations=*/{}, service_.releasing, LogSubject::current()};
   if (peer.standing == Standing::nobody) rules.operations = service_.operationsForNobody;
   return rules;
 }

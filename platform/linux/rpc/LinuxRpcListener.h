@@ -40,6 +40,7 @@ class LinuxRpcListener final : public QXRpcListener, public std::enable_shared_f
     Audience audience;
     std::optional<std::string> straightBelow;
     std::vector<std::string> operationsForNobody;
+    std::vector<std::string> releasing;
   };
 
   // A socket of our own, or one that was passed to us; both listen already.

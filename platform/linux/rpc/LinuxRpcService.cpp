@@ -36,9 +36,9 @@ void LinuxRpcService::giveUp(const std::string& name, const QXError& error) cons
 std::shared_ptr<QXRpcListener> LinuxRpcService::listenerForService(const std::string& name) {
   const auto found = services_.find(name);
   if (found == services_.end()) giveUp(name, QXError::system(ENOENT, "no socket is known for it"));
-  const auto& [socketPath, audience, straightBelow, operationsForNobody] = found->second;
+  const auto& [socketPath, audience, straightBelow, operationsForNobody, releasing] = found->second;
   LinuxRpcListener::Surroundings surroundings{reactor_, peers_, log_, limiter_};
-  LinuxRpcListener::Service service{name, audience, straightBelow, operationsForNobody};
+  LinuxRpcListener::Service service{name, audience, straightBelow, operationsForNobody, releasing};
   if (auto passed = takePassedSocket(name)) {
     const int flags = ::fcntl(passed.get(), F_GETFL);
     if (flags < 0 || ::fcntl(passed.get(), F_SETFL, flags | O_NONBLOCK) != 0) giveUp(name, QXError::system(errno, "the passed socket"));

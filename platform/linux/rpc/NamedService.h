@@ -18,6 +18,7 @@ struct NamedService {
   Audience audience = Audience::everyone;
   std::optional<std::string> straightBelow = {};      // a request's URL that leads into this directory is made straight (StraightURLs.h)
   std::vector<std::string> operationsForNobody = {};  // all that a peer without an identity may ask for
+  std::vector<std::string> releasing = {};            // operations that take nothing of a peer's limits (CallRules.h)
 };
 
 // By name.

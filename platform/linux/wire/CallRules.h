@@ -16,6 +16,8 @@ struct CallRules {
   std::shared_ptr<CallBudget> budget;
   // The operations that it may ask for, when these are not all: every other request fails.
   std::optional<std::vector<std::string>> operations;
+  // Those that give something back: they take nothing of any limit, or who has reached one could not get away from it.
+  std::vector<std::string> releasing;
   // For whom its requests are run.
   LogSubject::Name subject;
 };

@@ -22,6 +22,10 @@ std::string quote(const std::string& operation) {
   return operation.size() > kMaximumQuotedName ? "of " + std::to_string(operation.size()) + " bytes" : operation;
 }
 
+bool contains(const std::vector<std::string>& operations, const std::string& operation) {
+  return std::find(operations.begin(), operations.end(), operation) != operations.end();
+}
+
 }  // namespace
 
 // One request's right to be answered once.
@@ -47,7 +51,7 @@ struct IncomingCalls::Answer {
   const std::shared_ptr<const QXRpcInterface> interface;
   const std::size_t operation;
   std::atomic<bool> given = false;
-  std::unique_ptr<CallBudget::Share> share;  // of whoever gives the answer, and of the destructor
+  std::unique_ptr<CallBudget::Share> share;  // none of a releasing one; of whoever gives the answer, and of the destructor
 };
 
 IncomingCalls::IncomingCalls(CallRules rules)
@@ -65,9 +69,9 @@ void IncomingCalls::setObject(std::shared_ptr<QXRpcExportedObject> object) {
 
 void IncomingCalls::release() { setObject(nullptr); }
 
-bool IncomingCalls::mayAskFor(const std::string& operation) const {
-  return !rules_.operations || std::find(rules_.operations->begin(), rules_.operations->end(), operation) != rules_.operations->end();
-}
+bool IncomingCalls::mayAskFor(const std::string& operation) const { return !rules_.operations || contains(*rules_.operations, operation); }
+
+bool IncomingCalls::isReleasing(const std::string& operation) const { return contains(rules_.releasing, operation); }
 
 void IncomingCalls::run(RequestFrame request, std::size_t bytes, const std::shared_ptr<AnswerSink>& sink) {
   if (!mayAskFor(request.operation)) {
@@ -90,8 +94,8 @@ void IncomingCalls::run(RequestFrame request, std::size_t bytes, const std::shar
     sink->sendFailure({request.callID, failure(QXRpcErrorCode::invalidArguments, request.operation + ": " + *mismatch)});
     return;
   }
-  auto share = budget_->take(bytes);
-  if (!share) {
+  auto share = isReleasing(request.operation) ? nullptr : budget_->take(bytes);
+  if (!share && !isReleasing(request.operation)) {
     sink->sendFailure({request.callID, failure(QXRpcErrorCode::tooManyCalls, "too many requests wait for their answers")});
     return;
   }

@@ -40,6 +40,7 @@ class IncomingCalls {
  private:
   struct Answer;
   [[nodiscard]] bool mayAskFor(const std::string& operation) const;
+  [[nodiscard]] bool isReleasing(const std::string& operation) const;
 
   std::mutex mutex_;  // guards the two below
   std::shared_ptr<const QXRpcInterface> interface_;
