@@ -88,8 +88,8 @@ class CoordinatedAccess {
   // False when it has ended, also by the end of the daemon, soon after which this is known: others may have the file then. Asks nobody.
   [[nodiscard]] bool isHeld() const;
 
-  // Gives the turn to others. Of a write, its provider has been told of the change when this returns. Waits no longer than the deadline of
-  // the Consumer for ordinary calls. Not the first time: does nothing and succeeds.
+  // Gives the turn to others. Of a write, its provider is being told of the change when this returns, or sure to be. Waits no longer than
+  // the deadline of the Consumer for ordinary calls. Not the first time: does nothing and succeeds.
   //
   // Failures. `connectionLost`: the daemon ended meanwhile and took the access with it; others may have had the file before this one was
   // done, and of a write the provider may not have been told: finishedWriting tells it. `deadlinePassed`: the access still ends.

@@ -53,6 +53,10 @@ class RecordingProvider final : public QXDocuvend {
     const auto answered = unanswered.at(index);
     unanswered.erase(unanswered.begin() + static_cast<std::ptrdiff_t>(index));
   }
+  // What is unanswered holds this object.
+  void answerAll() {
+    while (!unanswered.empty()) answer();
+  }
 
  private:
   const std::optional<QXURL> directory_;

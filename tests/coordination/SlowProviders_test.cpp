@@ -31,6 +31,10 @@ struct SlowProviderTest : ::testing::Test {
     provider->isSlow = true;
     coordinator._addDocuvend(provider);
   }
+  void TearDown() override {
+    provider->answerAll();
+    next->answerAll();
+  }
 
   static QXURL url(const std::string& name) { return QXURL::fileURL("/storage/" + name, QXURLKind::file); }
   // A whole write of a process of its own; its end is answered inside.
@@ -101,6 +105,7 @@ TEST_F(SlowProviderTest, IsToldAfterTheLastWriteAlsoOfOneThatEndsWhileItsNoticeI
   queued->answer();
   queues.runAll();
   EXPECT_EQ(queued->told.size(), 2U);
+  queued->answerAll();
 }
 
 TEST_F(SlowProviderTest, HasALimitedNumberOfNoticesHoweverManyFilesAreWrittenAndHearsOfAllInTheEnd) {

@@ -70,7 +70,11 @@ class Coordination(ClientTest):
             return file.read()
 
     def assert_saved(self, text):
-        """The provider has saved that. What it is asked after it was told comes after it."""
+        """The provider saves that, and then gives up the contents. It may still be at an earlier change when a write has ended."""
+        deadline = time.monotonic() + PATIENCE
+        while original() != text and time.monotonic() < deadline:
+            time.sleep(0.002)
+        self.assertEqual(original(), text)
         self.ask(EDITOR, STOP, DOCUMENT, PROVIDER, EDITOR)
         self.assertEqual(original(), text)
 

@@ -2,7 +2,7 @@
 //
 // Many may read a file at once or one write it, first come, first served. A file is a directory and a name in it: what stands under that
 // name may be exchanged. Before a read begins in a provider's directory, the provider has brought the file's contents; when a write has
-// ended there, the provider has been told, also when the writer's connection ended with its write under way.
+// ended there, the provider is told, also when the writer's connection ended with its write under way.
 //
 // An access belongs to the connection that asked for it and ends with it. What a process asks of a file of which it has an access is not
 // kept waiting by those who wait: reading within its own access begins at once, and so does writing within its own write; writing within
@@ -59,7 +59,7 @@ class QXFileCoordination {
                                           std::optional<std::int64_t> party, ErrorReply completionHandler) = 0;
   virtual void coordinateWritingItemAtURL(std::optional<QXURL> url, std::optional<QXData> token, std::optional<QXUUID> accessID,
                                           std::optional<std::int64_t> party, ErrorReply completionHandler) = 0;
-  // Answered when the access has ended: of a write, when the provider has been told. An access that has not begun yet ends at once, and the
+  // Answered when the access has ended: of a write, when the provider is being told, or sure to be. An access that has not begun yet ends at once, and the
   // request for it is answered with `ended`.
   virtual void endAccess(std::optional<QXUUID> accessID, ErrorReply completionHandler) = 0;
   // How much of the file is present while an access waits for the file's provider, in bytes; both absent at any other time.
