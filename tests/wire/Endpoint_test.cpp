@@ -763,7 +763,7 @@ TEST_F(EndpointTest, UnansweredRequestsMayNotHoldTooManyBytes) {
 }
 
 TEST_F(EndpointTest, APeerMayAskForNoMoreThanItsRulesSay) {
-  auto raw = connectRaw(recorder, {{}, std::vector<std::string>{kEcho.name}, {}});
+  auto raw = connectRaw(recorder, {{}, std::vector<std::string>{kEcho.name}, {}, {}});
   raw.sayHello();
   ASSERT_TRUE(raw.read<Hello>());
   for (const auto& [number, operation] : {std::pair(1U, kList.name), std::pair(2U, std::string("unheard:of:"))}) {
@@ -785,7 +785,7 @@ TEST_F(EndpointTest, ARequestAndWhatFollowsFromItElsewhereAreForThePeer) {
                           subjects.put(LogSubject::current());
                           return values;
                         }),
-                        {{}, {}, peersName});
+                        {{}, {}, {}, peersName});
   raw.sayHello();
   ASSERT_TRUE(raw.read<Hello>());
   raw.write(Frame(RequestFrame{1, true, kEcho.name, {QXValue("a")}}));
@@ -892,9 +892,9 @@ TEST_F(EndpointTest, APeerMayNotKeepTooManyRequestsUnanswered) {
 
 TEST_F(EndpointTest, ConnectionsOfOneBudgetHaveTogetherNoMoreRequestsUnansweredThanItGives) {
   const auto budget = std::make_shared<CallBudget>(CallLimits{1, kMaximumCallBytes});
-  auto first = connectRaw(recorder, {budget, {}, {}});
+  auto first = connectRaw(recorder, {budget, {}, {}, {}});
   const Side other = std::exchange(server, {});
-  auto second = connectRaw(recorder, {budget, {}, {}});
+  auto second = connectRaw(recorder, {budget, {}, {}, {}});
   for (const auto* peer : {&first, &second}) {
     peer->sayHello();
     ASSERT_TRUE(peer->read<Hello>());
