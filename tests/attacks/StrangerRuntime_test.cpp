@@ -5,6 +5,7 @@
 #include <filesystem>
 #include <iterator>
 
+#include "tests/attacks/RuntimeTest.h"
 #include "tests/attacks/StrangerTest.h"
 
 namespace docuvend::tests {
@@ -14,7 +15,7 @@ namespace fs = std::filesystem;
 using ::testing::ElementsAre;
 using ::testing::HasSubstr;
 
-class StrangersPlaces : public WithStranger<AttackTest> {
+class StrangersPlaces : public WithStranger<RuntimeTest> {
  protected:
   void SetUp() override {
     WithStranger::SetUp();
@@ -23,8 +24,6 @@ class StrangersPlaces : public WithStranger<AttackTest> {
   }
 
   [[nodiscard]] std::string root() const { return fs::path(house_.home()).parent_path(); }
-  [[nodiscard]] std::string directory() const { return house_.runtime() + "/docuvend"; }
-  [[nodiscard]] std::string socket() const { return house_.publicSocket(kDVServiceName); }
 
   // The stranger does these acts while the directories of the user's on the way are open to all.
   void whileOpen(const std::vector<std::string>& words) const {
@@ -45,17 +44,6 @@ class StrangersPlaces : public WithStranger<AttackTest> {
       fs::create_directory(path);
       fs::permissions(path, fs::perms::owner_all);
     }
-  }
-
-  void expectRefused(const std::string& because) const {
-    const Ending ending = house_.runDaemon(house_.environment());
-    EXPECT_EQ(ending.status, 1);
-    EXPECT_THAT(ending.errors, HasSubstr(because));
-    EXPECT_THAT(ending.errors, ::testing::Not(HasSubstr("Server starting"))) << "it served somebody";
-  }
-  void expectStarts() {
-    house_.startDaemon();
-    EXPECT_TRUE(house_.answers());
   }
 };
 

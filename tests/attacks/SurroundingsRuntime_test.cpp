@@ -10,7 +10,7 @@
 
 #include <filesystem>
 
-#include "tests/attacks/AttackTest.h"
+#include "tests/attacks/RuntimeTest.h"
 
 namespace docuvend::tests {
 namespace {
@@ -19,11 +19,8 @@ namespace fs = std::filesystem;
 using linux_platform::UniqueDescriptor;
 using ::testing::HasSubstr;
 
-class RuntimeDirectory : public AttackTest {
+class RuntimeDirectory : public RuntimeTest {
  protected:
-  [[nodiscard]] std::string directory() const { return house_.runtime() + "/docuvend"; }
-  [[nodiscard]] std::string socket() const { return house_.publicSocket(kDVServiceName); }
-
   static void make(const std::string& path, fs::perms mode = fs::perms::owner_all) {
     fs::create_directories(path);
     fs::permissions(path, mode);
@@ -36,17 +33,6 @@ class RuntimeDirectory : public AttackTest {
     EXPECT_EQ(::bind(listener.get(), reinterpret_cast<const sockaddr*>(&address), sizeof address), 0) << path;
     EXPECT_EQ(::listen(listener.get(), SOMAXCONN), 0);
     return listener;
-  }
-
-  void expectRefused(const std::string& because) const {
-    const Ending ending = house_.runDaemon(house_.environment());
-    EXPECT_EQ(ending.status, 1);
-    EXPECT_THAT(ending.errors, HasSubstr(because));
-    EXPECT_THAT(ending.errors, ::testing::Not(HasSubstr("Server starting"))) << "it served somebody";
-  }
-  void expectStarts() {
-    house_.startDaemon();
-    EXPECT_TRUE(house_.answers());
   }
 };
 

@@ -94,8 +94,9 @@ void IncomingCalls::run(RequestFrame request, std::size_t bytes, const std::shar
     sink->sendFailure({request.callID, failure(QXRpcErrorCode::invalidArguments, request.operation + ": " + *mismatch)});
     return;
   }
-  auto share = isReleasing(request.operation) ? nullptr : budget_->take(bytes);
-  if (!share && !isReleasing(request.operation)) {
+  const bool takesNothing = isReleasing(request.operation);
+  auto share = takesNothing ? nullptr : budget_->take(bytes);
+  if (!share && !takesNothing) {
     sink->sendFailure({request.callID, failure(QXRpcErrorCode::tooManyCalls, "too many requests wait for their answers")});
     return;
   }
