@@ -14,7 +14,8 @@
 // Threads. Operations may take their time and block: each runs on a thread of the library's, never on the one that answers Docuvend.
 // Several run at once, so what they share must be guarded. Of one item at most one of startProviding, itemChanged, stopProviding and
 // providePlaceholder runs at a time, in the order in which they were asked for; identifierForItem, itemURL and performInitialSetup run
-// beside them, and are to answer within a few seconds: Docuvend ends a provider that lets it wait for these.
+// beside them, and are to answer within a few seconds: Docuvend ends a provider that lets it wait for these. How many it is asked for at
+// once is no matter: they are begun in the order in which they were asked for, and each has its time from then.
 #pragma once
 
 #include <optional>

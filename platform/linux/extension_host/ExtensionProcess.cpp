@@ -51,11 +51,12 @@ class ExtensionProcess::Proxy : public QXRpcProxy {
   void send(const QXRpcOperation& operation, QXArray arguments, QXRpcReply reply) override {
     const auto process = reply ? process_.lock() : nullptr;
     if (process) process->watchLiveness();
-    if (!process || !hasLimitedAnswer(operation.name)) {
+    const auto line = answerLineOf(operation.name);
+    if (!process || !line) {
       plain_->send(operation, std::move(arguments), std::move(reply));
       return;
     }
-    const AnswerDeadlines::Message message = process->expectAnswer(operation.name);
+    const AnswerDeadlines::Message message = process->expectAnswer(*line, operation.name);
     const auto limited = endpoint_->remoteObjectProxy([weak = process_, message, errorHandler = errorHandler_](const QXError& error) {
       if (const auto strongProcess = weak.lock()) strongProcess->gotAnswer(message);
       if (errorHandler) errorHandler(error);
@@ -232,7 +233,7 @@ void ExtensionProcess::askForSignOfLife() {
   if (!handlers_.hasRequests() && !endpoint_->awaitsAnswers()) return;
   watchLiveness();
   if (pingIsUnanswered_.exchange(true)) return;
-  const AnswerDeadlines::Message message = expectAnswer("a ping");
+  const AnswerDeadlines::Message message = expectAnswer(AnswerLine::signsOfLife, "a ping");
   endpoint_->ping([weak = weak_from_this(), message] {
     const auto strongSelf = weak.lock();
     if (!strongSelf) return;
@@ -247,19 +248,19 @@ void ExtensionProcess::closeAndKill(const QXError& why) {
   endProcessTree(process_);
 }
 
-AnswerDeadlines::Message ExtensionProcess::expectAnswer(const std::string& operationName) {
+AnswerDeadlines::Message ExtensionProcess::expectAnswer(AnswerLine line, const std::string& operationName) {
   AnswerDeadlines::Sent sent;
   {
     const std::lock_guard lock(deadlinesMutex_);
-    sent = deadlines_.sent(operationName, Clock::now());
+    sent = deadlines_.sent(line, operationName, Clock::now());
   }
   if (sent.setTimer) answerTimer_->setFor(*sent.setTimer);
   return sent.message;
 }
 
-void ExtensionProcess::gotAnswer(AnswerDeadlines::Message message) {
+void ExtensionProcess::gotAnswer(const AnswerDeadlines::Message& message) {
   const std::lock_guard lock(deadlinesMutex_);
-  deadlines_.answered(message);
+  deadlines_.answered(message, Clock::now());
 }
 
 void ExtensionProcess::note(QXLogType type, const std::string& what) const {

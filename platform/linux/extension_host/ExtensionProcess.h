@@ -82,8 +82,8 @@ class ExtensionProcess : public std::enable_shared_from_this<ExtensionProcess> {
   void askForSignOfLife();
   // With the event lock.
   void closeAndKill(const QXError& why);
-  [[nodiscard]] AnswerDeadlines::Message expectAnswer(const std::string& operationName);
-  void gotAnswer(AnswerDeadlines::Message message);
+  [[nodiscard]] AnswerDeadlines::Message expectAnswer(AnswerLine line, const std::string& operationName);
+  void gotAnswer(const AnswerDeadlines::Message& message);
   void note(QXLogType type, const std::string& what) const;
 
   // Constant after `create`.

@@ -10,7 +10,7 @@ struct ExtensionTimes {
 
   // A process without requests is kept this long for the next one.
   Duration linger{30'000};
-  // An answer that must be quick (initial setup, identifier, URL, a sign of life) and takes longer ends the process.
+  // An answer that must be quick (initial setup, identifier, URL, a sign of life) and takes longer, in its turn, ends the process.
   Duration answerLimit{10'000};
   // A process of which something is expected is asked for a sign of life this often.
   Duration livenessInterval{10'000};
