@@ -5,6 +5,8 @@
 #include <filesystem>
 
 #include "platform/linux/base/confinement.h"
+#include "platform/linux/bundles/BundleParser.h"
+#include "platform/linux/files/LinuxPropertyLists.h"
 #include "platform/linux/launch/LaunchDescription.h"
 #include "tests/attacks/TwoApplications.h"
 
@@ -20,8 +22,14 @@ class IdentityAttacks : public TwoApplications {
   [[nodiscard]] std::string forgedDescription(const std::string& directory) const {
     fs::create_directories(directory);
     const std::string path = directory + linux_platform::kDescriptionPath;
-    writeFile(path, linux_platform::descriptionText({kVictim, std::string(32, '0'), linux_platform::LaunchKind::application}));
+    writeFile(path, linux_platform::descriptionText(
+                        {kVictim, incarnationOf(kVictim), std::string(32, '0'), linux_platform::LaunchKind::application}));
     return path;
+  }
+  [[nodiscard]] std::string incarnationOf(const std::string& bundle) const {
+    linux_platform::LinuxPropertyLists propertyLists;
+    const auto parsed = linux_platform::parseBundle(house_.bundles() + "/" + bundle, propertyLists);
+    return std::get<linux_platform::ParsedBundle>(parsed).bundle.incarnation;
   }
   // As a launcher would start it who is not confined: the least of a confinement, with that description.
   [[nodiscard]] static Lines confinement(const std::string& description) {

@@ -99,12 +99,14 @@ TEST_F(BundleInstallerTest, UpdatesInPlaceWithAnotherVersion) {
   BundleHouse::write(source_ + "/only-old", "");
   installed(source_);
   const std::string before = house_.scan().at("org.a").version;
+  const std::string incarnation = house_.scan().at("org.a").incarnation;
   fs::remove(source_ + "/only-old");
   note(source_, "two");
   const auto result = installed(source_);
   EXPECT_EQ(result.outcome, Outcome::updated);
   EXPECT_EQ(result.directory, user("org.a"));
   EXPECT_NE(house_.scan().at("org.a").version, before);
+  EXPECT_NE(house_.scan().at("org.a").incarnation, incarnation);
   EXPECT_EQ(contentsOf(user("org.a") + "/note"), "two");
   EXPECT_FALSE(fs::exists(user("org.a") + "/only-old")) << "an update is no mixture";
   EXPECT_THAT(entries(), ElementsAre("org.a"));

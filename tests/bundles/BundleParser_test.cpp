@@ -11,6 +11,7 @@ namespace {
 
 using ::testing::ElementsAre;
 using ::testing::HasSubstr;
+using ::testing::MatchesRegex;
 
 class BundleParser : public ::testing::Test {
  protected:
@@ -167,6 +168,22 @@ TEST_F(BundleParser, GivesAnotherVersionAfterEachChange) {
 
   BundleHouse::write(directory_ + "/Entitlements.plist", BundleHouse::propertyList(""));
   EXPECT_NE(parse().bundle.version, second);
+}
+
+TEST_F(BundleParser, TellsItsDirectoryFromOthersOfItsNameWhateverChangesInIt) {
+  BundleHouse::install(directory_, "org.a");
+  const auto first = parse().bundle.incarnation;
+  EXPECT_THAT(first, MatchesRegex("[0-9]+\\.[0-9]+\\.[0-9]+\\.[0-9]+"));
+
+  BundleHouse::write(directory_ + "/Entitlements.plist", BundleHouse::propertyList(""));
+  BundleHouse::write(directory_ + "/new-file", "");
+  std::filesystem::rename(directory_, directory_ + "-elsewhere");
+  std::filesystem::rename(directory_ + "-elsewhere", directory_);
+  EXPECT_EQ(parse().bundle.incarnation, first);
+
+  std::filesystem::rename(directory_, directory_ + "-old");
+  BundleHouse::install(directory_, "org.a");
+  EXPECT_NE(parse().bundle.incarnation, first);
 }
 
 }  // namespace

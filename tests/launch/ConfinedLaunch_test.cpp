@@ -161,13 +161,15 @@ TEST_F(ConfinedApplication, ChangesNeitherItsBundleNorTheSystemNorItsDescription
 }
 
 TEST_F(ConfinedApplication, ReadsItsDescription) {
-  auto plan = house_.plan(house_.installProbe("org.a"), {"read", "/.docuvend-info"});
+  const auto bundle = house_.installProbe("org.a");
+  auto plan = house_.plan(bundle, {"read", "/.docuvend-info"});
   std::array<char, kLongestDescription> text{};
   const ssize_t count = ::pread(plan.inherited.back().descriptor.get(), text.data(), text.size(), 0);
   ASSERT_GT(count, 0);
   const auto description = parseDescription({text.data(), static_cast<std::size_t>(count)});
   ASSERT_TRUE(description);
   EXPECT_EQ(description->bundleIdentifier, "org.a");
+  EXPECT_EQ(description->incarnation, bundle.incarnation);
   EXPECT_EQ(description->kind, LaunchKind::application);
   EXPECT_EQ(ConfinedHouse::outcomes(ConfinedHouse::start(std::move(plan))).at("read /.docuvend-info"), "ok");
 }

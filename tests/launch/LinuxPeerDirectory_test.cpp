@@ -9,6 +9,7 @@
 #include <unistd.h>
 
 #include <cstring>
+#include <filesystem>
 #include <ostream>
 
 #include "platform/linux/launch/LaunchDescription.h"
@@ -43,8 +44,15 @@ class LinuxPeerDirectoryTest : public PeerTest {
     EXPECT_FALSE(identity->bundleIdentifier);
     EXPECT_TRUE(identity->entitlements.empty());
   }
-  static std::string description(const std::string& identifier) {
-    return descriptionText({identifier, "0123456789abcdef0123456789abcdef", LaunchKind::application});
+  // Of the bundle that is installed, if one is.
+  [[nodiscard]] std::string description(const std::string& identifier) {
+    const auto bundle = bundles_.find(identifier);
+    return descriptionText({identifier, bundle ? bundle->incarnation : "0", "0123456789abcdef0123456789abcdef", LaunchKind::application});
+  }
+  // Removes the bundle and installs it again, as another maker's, or its own next version, would be.
+  void replace(const std::string& identifier) {
+    std::filesystem::remove_all(house_.paths.userBundles + "/" + identifier);
+    (void)install(identifier);
   }
 
   LinuxPeerDirectory directory_{bundles_, house_.log.defaultLog()};
@@ -135,6 +143,56 @@ TEST_F(LinuxPeerDirectoryTest, AConfinedProcessWhoseBundleIsGoneIsNobody) {
   bundles_.bundles.clear();
   expectNobody(identify(peer));
   EXPECT_THAT(lastReason(), HasSubstr("is nobody: its bundle org.a is not installed."));
+}
+
+TEST_F(LinuxPeerDirectoryTest, AConfinedProcessIsNotTheBundleThatTookItsBundlesPlace) {
+  const auto old = confined(install("org.a"));
+  const auto before = identify(old);
+  ASSERT_EQ(before->bundleIdentifier, "org.a");
+  EXPECT_TRUE(directory_.isCurrent(*before));
+  replace("org.a");
+  EXPECT_FALSE(directory_.isCurrent(*before)) << "also over a connection that it has";
+  house_.log.clear();
+  expectNobody(identify(old));
+  EXPECT_THAT(lastReason(), HasSubstr("is nobody: its bundle org.a is not the one that is installed."));
+  EXPECT_THAT(house_.log.texts(QXLogType::defaultType),
+              ElementsAre("[NOTICE] PID " + std::to_string(before->pid) +
+                          " was started from another bundle org.a than the one that is installed now; it is to be started again."));
+  const auto anew = confined(bundles_.bundles.at("org.a"));
+  const auto after = identify(anew);
+  EXPECT_EQ(after->bundleIdentifier, "org.a");
+  EXPECT_TRUE(directory_.isCurrent(*after));
+  EXPECT_FALSE(directory_.isCurrent(*before));
+}
+
+TEST_F(LinuxPeerDirectoryTest, AConfinedProcessIsItsBundleAlsoWhenThatIsEditedOrRenamedOrAnotherGoes) {
+  (void)install("org.b");
+  const auto peer = confined(install("org.a"));
+  const auto before = identify(peer);
+  const std::string place = house_.paths.userBundles + "/org.a";
+  BundleHouse::write(place + "/Entitlements.plist", BundleHouse::propertyList("<key>another-right</key><true/>"));
+  BundleHouse::write(place + "/new-file", "new");
+  replace("org.b");
+  std::filesystem::rename(place, house_.paths.userBundles + "/elsewhere");
+  bundles_.bundles = house_.scan();
+  EXPECT_TRUE(directory_.isCurrent(*before));
+  const auto after = identify(peer);
+  EXPECT_EQ(after->bundleIdentifier, "org.a");
+  EXPECT_NE(qxFind<bool>(after->entitlements, "another-right"), nullptr);
+}
+
+TEST_F(LinuxPeerDirectoryTest, WhoIsNotConfinedStaysWhoItIsWhateverIsInstalled) {
+  (void)install("org.a");
+  const auto peer = unconfined();
+  const auto plain = identify(peer);
+  const auto declared = directory_.declare(*plain, "org.a");
+  ASSERT_TRUE(declared);
+  const auto confinedPeer = confined(bundles_.bundles.at("org.a"));
+  const auto confinedIdentity = identify(confinedPeer);
+  bundles_.bundles.clear();
+  EXPECT_TRUE(directory_.isCurrent(*plain));
+  EXPECT_TRUE(directory_.isCurrent(*declared));
+  EXPECT_FALSE(directory_.isCurrent(*confinedIdentity));
 }
 
 TEST_F(LinuxPeerDirectoryTest, NamespacesWithoutADescriptionAreNobodys) {

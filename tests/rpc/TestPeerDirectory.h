@@ -55,6 +55,15 @@ class TestPeerDirectory final : public linux_platform::PeerDirectory {
     identity->entitlements = found->second;
     return identity;
   }
+  // The bundle is replaced: whoever was started from it is not what it was any more.
+  void replace(const std::string& bundleIdentifier) {
+    const std::lock_guard lock(mutex_);
+    replaced_.insert(bundleIdentifier);
+  }
+  bool isCurrent(const linux_platform::PeerIdentity& peer) override {
+    const std::lock_guard lock(mutex_);
+    return peer.standing != linux_platform::Standing::confined || !replaced_.contains(peer.bundleIdentifier.value_or(""));
+  }
   std::shared_ptr<const linux_platform::PeerIdentity> find(const QXAuditToken&) override { return nullptr; }
 
   [[nodiscard]] static QXAuditToken tokenOf(std::uint8_t connection) {
@@ -69,6 +78,7 @@ class TestPeerDirectory final : public linux_platform::PeerDirectory {
   std::optional<std::string> bundleIdentifier_ = "com.example.App";
   QXDictionary entitlements_;
   std::map<std::string, QXDictionary> installed_;
+  std::set<std::string> replaced_;
   std::uint8_t connections_ = 0;
 };
 

@@ -114,6 +114,7 @@ TEST_F(AccessQueryTest, NeverLooksTheZeroTokenUp) {
    public:
     std::shared_ptr<const PeerIdentity> identify(int) override { return peer; }
     std::shared_ptr<const PeerIdentity> declare(const PeerIdentity&, const std::string&) override { return nullptr; }
+    bool isCurrent(const PeerIdentity&) override { return true; }
     std::shared_ptr<const PeerIdentity> find(const QXAuditToken&) override { return peer; }
     std::shared_ptr<const PeerIdentity> peer;
   } everybody;

@@ -123,6 +123,7 @@ class MadeUpPeers final : public PeerDirectory {
 
   std::shared_ptr<const PeerIdentity> identify(int) override { return std::make_shared<const PeerIdentity>(); }
   std::shared_ptr<const PeerIdentity> declare(const PeerIdentity&, const std::string&) override { return nullptr; }
+  bool isCurrent(const PeerIdentity&) override { return true; }
   std::shared_ptr<const PeerIdentity> find(const QXAuditToken& token) override {
     const auto found = peers_.find(token);
     return found == peers_.end() ? nullptr : found->second;

@@ -28,6 +28,10 @@ struct Bundle {
   // Differs after every installation or update of the bundle, and when it has come to belong to other groups (device, inode and change
   // times of the directory and its files, and the groups' names).
   std::string version;
+  // Tells this directory from every other that has had its name or will have it: the same when the bundle is edited in place, another after
+  // it was removed or replaced and after every `docuvendctl install` (device, inode, time of birth; digits and dots). Where the file system
+  // knows no time of birth an inode's number that is given again is not told from the first.
+  std::string incarnation;
 };
 
 // What is installed. May be used from any thread.

@@ -4,9 +4,11 @@
 #include <linux/openat2.h>
 #include <sys/stat.h>
 #include <sys/syscall.h>
+#include <sys/sysmacros.h>
 #include <unistd.h>
 
 #include <cerrno>
+#include <initializer_list>
 #include <optional>
 #include <string_view>
 #include <system_error>
@@ -46,7 +48,8 @@ class Parser {
     if (auto wrong = takeExecutable()) return wrong;
     if (auto wrong = takeGroups()) return wrong;
     if (auto wrong = takeGroupMembers()) return wrong;
-    return takeVersion();
+    if (auto wrong = takeVersion()) return wrong;
+    return takeIncarnation();
   }
 
   [[nodiscard]] ParsedBundle take() { return std::move(result_); }
@@ -135,12 +138,26 @@ class Parser {
     return std::nullopt;
   }
 
+  Problem takeIncarnation() {
+    struct statx status {};
+    if (::statx(directoryDescriptor_.get(), "", AT_EMPTY_PATH, STATX_INO | STATX_BTIME, &status) != 0) {
+      return problem(std::system_category().message(errno));
+    }
+    // Zero where there is no time of birth.
+    append(result_.bundle.incarnation, {::makedev(status.stx_dev_major, status.stx_dev_minor), status.stx_ino,
+                                        static_cast<std::uint64_t>(status.stx_btime.tv_sec), std::uint64_t{status.stx_btime.tv_nsec}});
+    return std::nullopt;
+  }
+
   void addVersion(const struct stat& status) {
-    auto& version = result_.bundle.version;
-    for (const auto number : {std::uint64_t{status.st_dev}, std::uint64_t{status.st_ino}, static_cast<std::uint64_t>(status.st_ctim.tv_sec),
-                              static_cast<std::uint64_t>(status.st_ctim.tv_nsec)}) {
-      if (!version.empty()) version += '.';
-      version += std::to_string(number);
+    append(result_.bundle.version, {std::uint64_t{status.st_dev}, std::uint64_t{status.st_ino},
+                                    static_cast<std::uint64_t>(status.st_ctim.tv_sec), static_cast<std::uint64_t>(status.st_ctim.tv_nsec)});
+  }
+
+  static void append(std::string& text, std::initializer_list<std::uint64_t> numbers) {
+    for (const auto number : numbers) {
+      if (!text.empty()) text += '.';
+      text += std::to_string(number);
     }
   }
 

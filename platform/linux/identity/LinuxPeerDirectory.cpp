@@ -9,6 +9,7 @@
 #include <fstream>
 #include <utility>
 
+#include "platform/linux/base/LogSubject.h"
 #include "platform/linux/base/kernel.h"
 #include "platform/linux/base/pidfd.h"
 #include "platform/linux/identity/ProcessReading.h"
@@ -76,12 +77,30 @@ void LinuxPeerDirectory::readPeer(int socket, PeerIdentity& identity) {
   if (description) {
     auto bundle = bundles_.find(description->bundleIdentifier);
     if (!bundle) return becomeNobody(identity, "its bundle " + description->bundleIdentifier + " is not installed");
+    if (bundle->incarnation != description->incarnation) {
+      tellOfOutdated(identity, description->bundleIdentifier);
+      return becomeNobody(identity, "its bundle " + description->bundleIdentifier + " is not the one that is installed");
+    }
     identity.bundleIdentifier = description->bundleIdentifier;
+    identity.incarnation = description->incarnation;
     identity.instance = description->instance;
     identity.entitlements = std::move(bundle->entitlements);
   }
   identity.standing = standing;
   identity.token = makeToken(identity.pid, identity.uid, serial);
+}
+
+// At the usual level, for whoever wonders why a program that was at work is refused; the bundle's share of the log is what it costs.
+void LinuxPeerDirectory::tellOfOutdated(const PeerIdentity& identity, const std::string& bundleIdentifier) const {
+  const LogSubject subject(std::make_shared<const std::string>(bundleIdentifier));
+  log_.write(QXLogType::defaultType, "[NOTICE] PID " + std::to_string(identity.pid) + " was started from another bundle " +
+                                         bundleIdentifier + " than the one that is installed now; it is to be started again.");
+}
+
+bool LinuxPeerDirectory::isCurrent(const PeerIdentity& peer) {
+  if (peer.standing != Standing::confined) return true;
+  const auto bundle = bundles_.find(*peer.bundleIdentifier);
+  return bundle && bundle->incarnation == peer.incarnation;
 }
 
 void LinuxPeerDirectory::becomeNobody(PeerIdentity& identity, const std::string& reason) {

@@ -26,12 +26,14 @@ class LinuxPeerDirectory final : public PeerDirectory {
 
   [[nodiscard]] std::shared_ptr<const PeerIdentity> identify(int socket) override;
   [[nodiscard]] std::shared_ptr<const PeerIdentity> declare(const PeerIdentity& peer, const std::string& bundleIdentifier) override;
+  [[nodiscard]] bool isCurrent(const PeerIdentity& peer) override;
   // Of several connections of one process, one that declared a bundle goes before the others.
   [[nodiscard]] std::shared_ptr<const PeerIdentity> find(const QXAuditToken& token) override;
 
  private:
   [[nodiscard]] QXAuditToken makeToken(pid_t pid, uid_t uid, std::uint64_t serial) const;
   void readPeer(int socket, PeerIdentity& identity);
+  void tellOfOutdated(const PeerIdentity& identity, const std::string& bundleIdentifier) const;
   void becomeNobody(PeerIdentity& identity, const std::string& reason);
   void syncPrune();
 

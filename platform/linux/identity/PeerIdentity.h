@@ -4,6 +4,10 @@
 // namespace, that namespace's owning user namespace and that one's parent. Owner is a direct child of the daemon's own user namespace:
 // the description at the root of that mount namespace is believed. Owner is the daemon's own user namespace: the process is
 // unconfined. Anything else is nobody, who may do nothing but wake the daemon.
+//
+// A confined process is its bundle as long as the very bundle that it was started from is installed. When that is removed or replaced, by
+// another maker's bundle of that identifier or by its own next version (nobody can tell these apart), the process is nobody until it is
+// started again: it gains neither the successor's entitlements nor the grants that are made to it.
 #pragma once
 
 #include <sys/types.h>
@@ -27,6 +31,7 @@ struct PeerIdentity {
   Standing standing = Standing::nobody;
   QXAuditToken token;                           // all zero for nobody
   std::optional<std::string> bundleIdentifier;  // confined: from the description; unconfined: what it declared, if anything
+  std::string incarnation;                      // confined: of the bundle that it was started from (Bundle.h); else empty
   std::string instance;                         // confined: names this one launch of the application; else empty
   UniqueDescriptor pidfd;                       // held for the connection's life; empty when the kernel gave none
   QXDictionary entitlements;                    // what the bundle said when the peer connected
@@ -45,6 +50,8 @@ class PeerDirectory {
   // An unconfined peer says which installed bundle it acts for, once per process; logged. The new identity, or null when the peer is not
   // unconfined, the bundle is not installed, or the process has declared another bundle on a connection that is still open.
   [[nodiscard]] virtual std::shared_ptr<const PeerIdentity> declare(const PeerIdentity& peer, const std::string& bundleIdentifier) = 0;
+  // Whether the peer is still who it was: the bundle that a confined one was started from is installed, and none in its place.
+  [[nodiscard]] virtual bool isCurrent(const PeerIdentity& peer) = 0;
   // The connected peer with that token, else null.
   [[nodiscard]] virtual std::shared_ptr<const PeerIdentity> find(const QXAuditToken& token) = 0;
 };

@@ -62,7 +62,7 @@ std::optional<QXError> prepareDirectories(const Bundle& bundle, const Paths& pat
 std::variant<UniqueDescriptor, QXError> writeDescription(const Bundle& bundle, LaunchKind kind) {
   auto instance = newInstance();
   if (!instance) return failure("cannot get random bytes");
-  const std::string text = descriptionText({bundle.identifier, *instance, kind});
+  const std::string text = descriptionText({bundle.identifier, bundle.incarnation, *instance, kind});
   UniqueDescriptor file(::memfd_create("docuvend-info", MFD_CLOEXEC));
   if (!file) return failure("cannot make the description");
   if (::write(file.get(), text.data(), text.size()) != static_cast<ssize_t>(text.size()) || ::lseek(file.get(), 0, SEEK_SET) != 0) {

@@ -2,8 +2,9 @@
 //
 // The process tree: bubblewrap (own user, mount, process and IPC namespaces, new session, no capabilities, cleared environment, no further
 // user namespaces) runs docuvend-confine (applies Landlock and an extension's limits), which runs the bundle's executable. A read-only
-// description at the root of the mount namespace names the bundle and this launch. The network stays the host's; where the kernel's
-// Landlock leaves abstract sockets open, an application gets none. docs/confinement.md says what is closed against whom.
+// description at the root of the mount namespace names the bundle, which of those that had its name it is, and this launch. The network
+// stays the host's; where the kernel's Landlock leaves abstract sockets open, an application gets none. docs/confinement.md says what is
+// closed against whom.
 #pragma once
 
 #include <optional>

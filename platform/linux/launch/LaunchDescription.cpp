@@ -13,6 +13,7 @@ namespace {
 
 constexpr std::string_view kHeader = "[Application]\n";
 constexpr std::string_view kName = "name=";
+constexpr std::string_view kIncarnation = "incarnation=";
 constexpr std::string_view kInstance = "instance=";
 constexpr std::string_view kKind = "kind=";
 constexpr std::string_view kApplication = "application";
@@ -40,11 +41,16 @@ bool isInstance(std::string_view text) {
          std::all_of(text.begin(), text.end(), [](char digit) { return kDigits.find(digit) != std::string_view::npos; });
 }
 
+bool isIncarnation(std::string_view text) {
+  return !text.empty() && std::all_of(text.begin(), text.end(), [](char c) { return (c >= '0' && c <= '9') || c == '.'; });
+}
+
 }  // namespace
 
 std::string descriptionText(const LaunchDescription& description) {
   std::string text(kHeader);
   text.append(kName).append(description.bundleIdentifier).append("\n");
+  text.append(kIncarnation).append(description.incarnation).append("\n");
   text.append(kInstance).append(description.instance).append("\n");
   text.append(kKind).append(description.kind == LaunchKind::extension ? kExtension : kApplication).append("\n");
   return text;
@@ -54,12 +60,15 @@ std::optional<LaunchDescription> parseDescription(std::string_view text) {
   if (text.size() > kLongestDescription || !take(text, kHeader)) return std::nullopt;
   auto name = takeLine(text, kName);
   if (!name || !isBundleIdentifier(*name)) return std::nullopt;
+  auto incarnation = takeLine(text, kIncarnation);
+  if (!incarnation || !isIncarnation(*incarnation)) return std::nullopt;
   auto instance = takeLine(text, kInstance);
   if (!instance || !isInstance(*instance)) return std::nullopt;
   const auto kind = takeLine(text, kKind);
   if (!kind || !text.empty()) return std::nullopt;
   if (*kind != kApplication && *kind != kExtension) return std::nullopt;
-  return LaunchDescription{std::move(*name), std::move(*instance), *kind == kExtension ? LaunchKind::extension : LaunchKind::application};
+  return LaunchDescription{std::move(*name), std::move(*incarnation), std::move(*instance),
+                           *kind == kExtension ? LaunchKind::extension : LaunchKind::application};
 }
 
 std::optional<std::string> newInstance() {

@@ -3,6 +3,7 @@
 //
 //   [Application]
 //   name=BUNDLE-IDENTIFIER
+//   incarnation=digits and dots
 //   instance=32 lower-case hexadecimal digits
 //   kind=application|extension
 #pragma once
@@ -20,6 +21,7 @@ inline constexpr std::size_t kLongestDescription = 512;
 
 struct LaunchDescription {
   std::string bundleIdentifier;
+  std::string incarnation;  // of the bundle (Bundle.h), as the launcher found it
   std::string instance;
   LaunchKind kind = LaunchKind::application;
   friend bool operator==(const LaunchDescription&, const LaunchDescription&) = default;
