@@ -12,6 +12,7 @@
 
 #include "platform/fake/FakeFileSystem.h"
 #include "platform/fake/FakeQueues.h"
+#include "platform/linux/base/LogSubject.h"
 #include "platform/linux/wire/FileCoordinationProtocol.h"
 #include "tests/coordination/RecordingProvider.h"
 #include "tests/coordination/Turns.h"
@@ -615,6 +616,28 @@ TEST_F(FileAccessesTest, HoldsNoLockWhileItAnswersAsksAndTells) {
   EXPECT_EQ(seen, (std::vector<std::size_t>{1, 1, 0}));
   end(write(item, a));
   EXPECT_EQ(seen, (std::vector<std::size_t>{1, 1, 0, 1}));
+}
+
+// So that nobody brings lines into the log that count as another's, or as nobody's: whoever ends an access may be the daemon itself, when
+// a connection has gone.
+TEST_F(FileAccessesTest, AsksAndTellsForTheHolderWhoeverSetsThatGoing) {
+  const auto subject = [] {
+    const auto name = LogSubject::current();
+    return name ? *name : "nobody in particular";
+  };
+  provider->onAsked = [this, &subject] { events.push_back("asked for " + subject()); };
+  provider->onTold = [this, &subject] { events.push_back("told for " + subject()); };
+  const AccessNumber writer = write(item, a);
+  read(item, b);
+  FileAccess unconfined = access("/storage/other", AccessKind::reading, c);
+  unconfined.holder.bundleIdentifier.reset();
+  news();
+  {
+    const LogSubject somebodyElse(std::make_shared<const std::string>("somebody else"));
+    end(writer);
+    begin(unconfined);
+  }
+  EXPECT_EQ(news(), (Events{"told for com.example.101", "1 ended", "asked for com.example.102", "asked for nobody in particular"}));
 }
 
 TEST_F(FileAccessesTest, TakesOneWhoWantsNoAnswers) {

@@ -120,8 +120,8 @@ TEST_F(LinuxFileCoordinatorTest, AsksAnObjectOnItsOwnQueueAndNamesEveryReaderAne
   const auto provider = std::make_shared<RecordingProvider>(directoryURL("/a"), queues.operationQueue());
   std::vector<std::optional<QXError>> answers;
   const auto completion = [&answers](std::optional<QXError> error) { answers.push_back(std::move(error)); };
-  coordinator.askToProvide(provider, 42, fileURL("/a/x.txt"), completion);
-  coordinator.askToProvide(provider, 42, fileURL("/a/x.txt"), completion);
+  coordinator.askToProvide(provider, {42, {}}, fileURL("/a/x.txt"), completion);
+  coordinator.askToProvide(provider, {42, {}}, fileURL("/a/x.txt"), completion);
   EXPECT_TRUE(provider->asked.empty());
   queues.runAll();
   ASSERT_EQ(provider->asked.size(), 2U);
@@ -134,7 +134,7 @@ TEST_F(LinuxFileCoordinatorTest, AsksAnObjectOnItsOwnQueueAndNamesEveryReaderAne
 
 TEST_F(LinuxFileCoordinatorTest, AsksAnObjectWithoutAQueueAtOnce) {
   const auto provider = added("/a/storage");
-  coordinator.askToProvide(provider, 42, fileURL("/a/storage/x.txt"), /*completion=*/{});
+  coordinator.askToProvide(provider, {42, {}}, fileURL("/a/storage/x.txt"), /*completion=*/{});
   EXPECT_EQ(provider->asked.size(), 1U);
 }
 

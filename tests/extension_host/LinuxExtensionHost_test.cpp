@@ -13,6 +13,7 @@
 #include <string>
 #include <thread>
 
+#include "platform/linux/base/LogSubject.h"
 #include "platform/linux/base/UniqueDescriptor.h"
 #include "platform/linux/base/pidfd.h"
 #include "platform/linux/extension_host/ExtensionErrors.h"
@@ -429,6 +430,21 @@ TEST_F(LinuxExtensionHostTest, ARequestThatWaitsForAProcessCountsAsOpen) {
   EXPECT_EQ(*status, (QXDictionary{{"state", "starting"}, {"openRequests", 1}, {"badLivesInARow", 0}}));
   real.dropHost();
   EXPECT_TRUE(isBegun);
+}
+
+// It runs on the thread that starts processes, which is at work for nobody in particular.
+TEST_F(LinuxExtensionHostTest, ARequestThatWaitsForAProcessIsCompletedForWhomItWasBegun) {
+  RealExtensions real;
+  const auto extension = real.extension();
+  std::promise<LogSubject::Name> subject;
+  {
+    const LogSubject beginners(std::make_shared<const std::string>("com.example.app"));
+    extension->beginExtensionRequest(
+        [&subject](std::optional<QXUUID>, std::optional<QXError>) { subject.set_value(LogSubject::current()); });
+  }
+  const auto completed = await(subject.get_future());
+  ASSERT_TRUE(completed && *completed);
+  EXPECT_EQ(**completed, "com.example.app");
 }
 
 TEST_F(LinuxExtensionHostTest, TheStatusOfAnExtensionThatBacksOffSaysForHowLong) {

@@ -66,8 +66,9 @@ TEST(LinuxQueues, ATaskIsForWhomItsSubmitterWasAtWork) {
       each->sync(tell);
       each->after(1ms, tell);
     }
+    queues.operationQueue()->addOperation(tell);
   }
-  ASSERT_TRUE(arrivals.waitFor(8));
+  ASSERT_TRUE(arrivals.waitFor(9));
   EXPECT_THAT(arrivals.names(), testing::Each("one"));
 
   const auto other = queues.serialQueue("other");

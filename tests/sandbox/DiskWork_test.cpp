@@ -8,11 +8,14 @@
 #include <condition_variable>
 #include <cstdlib>
 #include <functional>
+#include <memory>
 #include <mutex>
 #include <set>
 #include <string>
 #include <system_error>
 #include <vector>
+
+#include "platform/linux/base/LogSubject.h"
 
 namespace docuvend::linux_platform {
 namespace {
@@ -88,6 +91,23 @@ TEST(DiskWork, OfOtherOwnersRunsBesideIt) {
   EXPECT_TRUE(works.awaitBegun(DiskWork::kMostThreads));
   works.release("long");
   EXPECT_TRUE(works.awaitEnded(DiskWork::kMostThreads));
+}
+
+TEST(DiskWork, IsForWhomItsSubmitterWasAtWork) {
+  Works works;
+  LogSubject::Name subject;
+  DiskWork disk;
+  works.release("a1");
+  {
+    const LogSubject submitters(std::make_shared<const std::string>("com.example.app"));
+    disk.submit("a", [&subject, work = works.named("a1")] {
+      subject = LogSubject::current();
+      work();
+    });
+  }
+  ASSERT_TRUE(works.awaitEnded(1));
+  ASSERT_TRUE(subject);
+  EXPECT_EQ(*subject, "com.example.app");
 }
 
 // With every thread but one occupied.

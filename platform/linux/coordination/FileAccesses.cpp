@@ -179,12 +179,12 @@ void FileAccesses::provide(const Reader& reader) {
 
 FileAccesses::Question FileAccesses::question(const std::shared_ptr<QXDocuvend>& provider, const Provisions::Question& asked) const {
   const FileAccess& access = entries_.at(asked.number).access;
-  return {provider, asked.request, access.holder.processIdentifier, access.url};
+  return {provider, asked.request, access.holder, access.url};
 }
 
 void FileAccesses::ask(const Question& question) {
   // This outlives the request.
-  coordinator_.askToProvide(question.provider, question.readerProcess, question.url,
+  coordinator_.askToProvide(question.provider, question.reader, question.url,
                             [this, request = question.request](const std::optional<QXError>& error) { requestIsAnswered(request, error); });
 }
 

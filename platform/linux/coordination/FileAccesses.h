@@ -95,7 +95,7 @@ class FileAccesses {
   struct Question {
     std::shared_ptr<QXDocuvend> provider;
     ProvideRequest request;
-    int readerProcess;
+    AccessHolder reader;
     QXURL url;
   };
   // What follows from a change, for when the lock is free.

@@ -5,6 +5,7 @@
 #include <utility>
 #include <variant>
 
+#include "platform/linux/base/LogSubject.h"
 #include "platform/linux/coordination/CoordinationErrors.h"
 
 namespace docuvend::linux_platform {
@@ -16,6 +17,10 @@ void onItsQueue(const QXDocuvend& provider, QXTask task) {
   } else {
     task();
   }
+}
+
+LogSubject::Name subjectOf(const AccessHolder& holder) {
+  return holder.bundleIdentifier ? std::make_shared<const std::string>(*holder.bundleIdentifier) : nullptr;
 }
 
 }  // namespace
@@ -178,11 +183,11 @@ std::string LinuxFileCoordinator::nameFor(const char* role, int process) {
   return name;
 }
 
-void LinuxFileCoordinator::askToProvide(const std::shared_ptr<QXDocuvend>& provider, int readerProcess, const QXURL& file,
+void LinuxFileCoordinator::askToProvide(const std::shared_ptr<QXDocuvend>& provider, const AccessHolder& reader, const QXURL& file,
                                         QXDocuvend::ProvideCompletion completion) {
-  onItsQueue(*provider, [provider, reader = QXCoordinationID{nameFor("reader", readerProcess)}, file, completion = std::move(completion)] {
-    provider->_provideItemAtURL(file, reader, completion);
-  });
+  const LogSubject subject(subjectOf(reader));
+  onItsQueue(*provider, [provider, name = QXCoordinationID{nameFor("reader", reader.processIdentifier)}, file,
+                         completion = std::move(completion)] { provider->_provideItemAtURL(file, name, completion); });
 }
 
 std::optional<QXError> LinuxFileCoordinator::refusalOfWrite(const FileOwner& owner, const AccessHolder& writer,
@@ -213,6 +218,7 @@ void LinuxFileCoordinator::tellFinishedWriting(const FileOwner& owner, const Acc
 
 void LinuxFileCoordinator::begin(const ChangeNotices::Notice& notice, std::function<void()> told) {
   const auto& [provider, file, writer] = notice;
+  const LogSubject subject(subjectOf(writer));
   auto untilTold = std::make_shared<const NoticeUnderWay>(*this, provider, file.key);
   onItsQueue(*provider, [provider = provider, name = nameFor("writer", writer.processIdentifier), untilTold = std::move(untilTold),
                          url = file.url, told = std::move(told)]() mutable {

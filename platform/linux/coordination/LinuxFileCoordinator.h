@@ -83,9 +83,10 @@ class LinuxFileCoordinator final : public QXFileCoordinator {
   // lock held. One that is running when another handler is set may still run.
   void setRegistrationHandler(std::function<void()> handler);
 
-  // Asks the object for the contents of the file on behalf of a reader of that process, under an identifier that no other reader has.
-  // `completion` comes as the object has it: on any thread, also inside the call, and perhaps twice.
-  void askToProvide(const std::shared_ptr<QXDocuvend>& provider, int readerProcess, const QXURL& file,
+  // Asks the object for the contents of the file on behalf of a reader, under an identifier that no other reader has. `completion` comes as
+  // the object has it: on any thread, also inside the call, and perhaps twice. What objects are asked and told is work for the reader or
+  // the writer, whoever's access has set it going.
+  void askToProvide(const std::shared_ptr<QXDocuvend>& provider, const AccessHolder& reader, const QXURL& file,
                     QXDocuvend::ProvideCompletion completion);
   // Why nobody of that application may write the file now: its owner is still to be told of as much as one application may have written.
   [[nodiscard]] std::optional<QXError> refusalOfWrite(const FileOwner& owner, const AccessHolder& writer, const KeyedFile& file) const;

@@ -10,6 +10,7 @@
 #include <chrono>
 #include <utility>
 
+#include "platform/linux/base/LogSubject.h"
 #include "platform/linux/extension_host/ExtensionConnection.h"
 #include "platform/linux/extension_host/ExtensionErrors.h"
 #include "platform/linux/extension_host/Matching.h"
@@ -90,7 +91,7 @@ void LinuxExtension::beginExtensionRequest(BeginCompletion completion) {
     if (begin == ProcessLifetime::Begin::join) joined = process_;
     if (begin == ProcessLifetime::Begin::refuse) refusal = isStopped_ ? hostIsStopping() : backingOffError();
     if (begin == ProcessLifetime::Begin::start || begin == ProcessLifetime::Begin::wait) {
-      waiting_.push_back({request, std::move(completion)});
+      waiting_.push_back({request, LogSubject::carrying(std::move(completion))});
     }
   }
   switch (begin) {

@@ -67,4 +67,6 @@ std::string LinuxOperationQueue::name() const {
   return name_;
 }
 
+void LinuxOperationQueue::addOperation(QXTask operation) { pool_->submit(LogSubject::carrying(std::move(operation))); }
+
 }  // namespace docuvend::linux_platform

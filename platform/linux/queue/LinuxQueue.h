@@ -56,7 +56,7 @@ class LinuxOperationQueue final : public QXOperationQueue {
 
   void setName(std::string name) override;
   [[nodiscard]] std::string name() const override;
-  void addOperation(QXTask operation) override { pool_->submit(std::move(operation)); }
+  void addOperation(QXTask operation) override;
 
  private:
   const std::shared_ptr<ThreadPool> pool_;

@@ -3,6 +3,8 @@
 #include <system_error>
 #include <utility>
 
+#include "platform/linux/base/LogSubject.h"
+
 namespace docuvend::linux_platform {
 
 DiskWork::DiskWork() {
@@ -26,7 +28,7 @@ DiskWork::~DiskWork() {
 void DiskWork::submit(const std::string& owner, std::function<void()> work) {
   const std::lock_guard lock(mutex_);
   const auto [line, isNew] = lines_.try_emplace(owner);
-  line->second.push_back(std::move(work));
+  line->second.push_back(LogSubject::carrying(std::move(work)));
   if (!isNew) return;
   waiting_.push_back(owner);
   changed_.notify_one();
