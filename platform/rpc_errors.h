@@ -3,6 +3,10 @@
 #pragma once
 
 #include <cstdint>
+#include <string>
+#include <utility>
+
+#include "platform/QXError.h"
 
 namespace docuvend {
 
@@ -21,5 +25,9 @@ enum class QXRpcErrorCode : std::int64_t {
   refused = 9,             // the connection ended: the service does not want it
   notPermitted = 10,       // nobody knows who asks, and the operation is not for everybody
 };
+
+[[nodiscard]] inline QXError qxRpcError(QXRpcErrorCode code, std::string description) {
+  return QXError::make(kQXRpcErrorDomain, static_cast<std::int64_t>(code), std::move(description));
+}
 
 }  // namespace docuvend

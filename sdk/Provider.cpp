@@ -26,6 +26,7 @@ namespace {
 constexpr unsigned kReactorThreads = 1;
 constexpr std::chrono::milliseconds kLastOperations{1'000};
 constexpr int kUsageStatus = 64;
+constexpr int kNoThreadStatus = 71;
 
 constexpr const char* kErrorDomain = "DVProviderErrorDomain";
 constexpr std::int64_t kMissingArgument = 1;
@@ -147,6 +148,10 @@ int runProvider(Provider& provider) {
   const auto end = std::make_shared<ConnectionEnd>();
   {
     linux_platform::Reactor reactor(kReactorThreads);
+    if (!reactor.isRunning()) {
+      std::fputs("The system gives no thread to talk to Docuvend.\n", stderr);
+      return kNoThreadStatus;
+    }
     linux_platform::Endpoint::Handlers handlers;
     handlers.onClose = [end](const QXError&) { end->signal(); };
     const auto endpoint = linux_platform::Endpoint::create(reactor, std::move(socket), linux_platform::Hello{}, std::move(handlers));

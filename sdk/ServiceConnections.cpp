@@ -94,6 +94,7 @@ Result<std::shared_ptr<Connection>> ServiceConnections::connectAnew(const std::s
 }
 
 Result<UniqueDescriptor> ServiceConnections::connectSocket(const std::string& service, Attempts& attempts) const {
+  if (!reactor_.isRunning()) return QXError::system(EAGAIN, "The system gives no thread to talk to the Docuvend daemon.");
   for (;;) {
     const auto left = std::chrono::duration_cast<std::chrono::milliseconds>(attempts.until() - std::chrono::steady_clock::now());
     auto socket = linux_platform::connectToSocket(socketDirectory_ + "/" + service, left);

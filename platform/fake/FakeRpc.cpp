@@ -8,10 +8,6 @@
 namespace docuvend::fake_platform {
 namespace {
 
-QXError failure(QXRpcErrorCode code, std::string description) {
-  return QXError::make(kQXRpcErrorDomain, static_cast<std::int64_t>(code), std::move(description));
-}
-
 class Peer final : public QXRpcProxy {
  public:
   Peer(std::shared_ptr<FakeRpcConnection> connection, QXErrorHandler errorHandler)
@@ -63,7 +59,7 @@ bool FakeRpcProxy::answer(std::size_t index, QXArray values) {
   const auto entry = settle(index);
   if (!entry) return false;
   if (const auto mismatch = qxMismatch(entry->send.operation.replies, values)) {
-    if (errorHandler_) errorHandler_(failure(QXRpcErrorCode::invalidReply, *mismatch));
+    if (errorHandler_) errorHandler_(qxRpcError(QXRpcErrorCode::invalidReply, *mismatch));
     return true;
   }
   entry->reply(std::move(values));
@@ -225,11 +221,11 @@ void FakeRpcConnection::run(const std::shared_ptr<Invocation>& invocation) {
   const auto object = exportedObject();
   const auto operation = interface && object ? interface->indexOf(invocation->operationName) : std::nullopt;
   if (!operation) {
-    fail(invocation, failure(QXRpcErrorCode::unknownOperation, "unknown operation " + invocation->operationName));
+    fail(invocation, qxRpcError(QXRpcErrorCode::unknownOperation, "unknown operation " + invocation->operationName));
     return;
   }
   if (const auto mismatch = qxMismatch(interface->operations()[*operation].arguments, invocation->arguments)) {
-    fail(invocation, failure(QXRpcErrorCode::invalidArguments, *mismatch));
+    fail(invocation, qxRpcError(QXRpcErrorCode::invalidArguments, *mismatch));
     return;
   }
   QXRpcReply reply;
@@ -246,7 +242,7 @@ void FakeRpcConnection::run(const std::shared_ptr<Invocation>& invocation) {
 void FakeRpcConnection::complete(const std::shared_ptr<Invocation>& invocation, const QXRpcInterface& interface, std::size_t operation,
                                  QXArray values) {
   if (const auto mismatch = qxReplyMismatch(interface, operation, values)) {
-    fail(invocation, failure(QXRpcErrorCode::invalidReply, *mismatch));
+    fail(invocation, qxRpcError(QXRpcErrorCode::invalidReply, *mismatch));
     return;
   }
   if (settle(invocation)) invocation->reply(std::move(values));

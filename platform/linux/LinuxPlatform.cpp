@@ -54,6 +54,7 @@ constexpr const char* kEndAccess = "endAccess:completionHandler:";
 constexpr unsigned kFewestReactorThreads = 4;
 // What this process and the extensions make is the user's alone, whatever a login leaves to others.
 constexpr mode_t kOwnerOnlyMask = 077;
+constexpr const char* kNoThread = "cannot begin a thread";
 
 // Confined processes see the public directory and nothing beside it. That the administration is not for them does not rest on this.
 NamedServices namedServices(const Paths& paths) {
@@ -130,9 +131,11 @@ struct LinuxPlatform::Services {
   LinuxExtensionHost extensionHost{bundles, paths, reactor, log.defaultLog()};
   LinuxStatus status{rpc, extensionHost};
   Remnants remnants{fileSystem, QXURL::fileURL(paths.groupContainers, QXURLKind::directory)};
-  LinuxFileCoordinator fileCoordinator{fileSystem,
-                                       {[this] { return installedStorages(bundles); }, &KeyedFile::isInPlace,
-                                        [this](const KeyedFile& file) { return remnants.hasPlaceholder(file); }}};
+  LinuxFileCoordinator fileCoordinator{
+      fileSystem,
+      {[this] { return installedStorages(bundles); }, &KeyedFile::isInPlace,
+       [this](const KeyedFile& file) { return remnants.hasPlaceholder(file); },
+       [this](std::chrono::milliseconds delay, QXTask task) { queues.globalQueue().after(delay, std::move(task)); }, &log.defaultLog()}};
   FileAccesses fileAccesses{fileCoordinator};
 
   std::unique_ptr<LinuxSandbox> sandbox;  // made in `create`, never null after it
@@ -147,6 +150,7 @@ struct LinuxPlatform::Services {
     // Nothing of this goes before the process does.
     bundles.onChange([this] { fileCoordinator.installedStoragesChanged(); });
     bundles.onChange([this] { followInstalledBundles(); });
+    bundles.onChange([this] { rpc.endOutdatedConnections(); });
     sandboxDelegate = std::make_shared<SandboxListenerDelegate>(*sandbox, log.defaultLog());
     coordinationDelegate = std::make_shared<FileCoordinationListenerDelegate>(
         FileCoordinationServicer::Surroundings{fileCoordinator, fileAccesses, *sandbox, peers});
@@ -162,8 +166,9 @@ struct LinuxPlatform::Services {
   void followInstalledBundles() {
     const auto error = sandbox->followInstalledBundles();
     if (!error) return;
-    log.defaultLog().write(QXLogType::fault, "[ERROR] The tokens for a container that a bundle has left may be good again after a restart: " +
-                                                 error->description());
+    log.defaultLog().write(
+        QXLogType::fault,
+        "[ERROR] The tokens for a container that a bundle has left may be good again after a restart: " + error->description());
   }
   std::shared_ptr<QXRpcListener> listen(const char* name, const std::shared_ptr<QXRpcListenerDelegate>& delegate) {
     auto listener = rpc.listenerForService(name);
@@ -187,12 +192,13 @@ std::variant<std::unique_ptr<LinuxPlatform>, QXError> LinuxPlatform::create() tr
   if (auto* error = std::get_if<QXError>(&lock)) return *error;
 
   auto services = std::make_unique<Services>(std::move(paths), std::get<UniqueDescriptor>(std::move(lock)));
+  if (!services->reactor.isRunning()) return QXError::system(EAGAIN, kNoThread);
   auto sandbox = LinuxSandbox::create(services->paths, services->bundles, services->peers, services->log.defaultLog());
   if (auto* error = std::get_if<QXError>(&sandbox)) return *error;
   services->sandbox = std::get<std::unique_ptr<LinuxSandbox>>(std::move(sandbox));
   return std::unique_ptr<LinuxPlatform>(new LinuxPlatform(std::move(services)));
 } catch (const std::system_error& error) {
-  return QXError::system(error.code().value(), "cannot begin a thread");
+  return QXError::system(error.code().value(), kNoThread);
 }
 
 LinuxPlatform::LinuxPlatform(std::unique_ptr<Services> services) : services_(std::move(services)) {}

@@ -53,6 +53,8 @@ std::vector<Limit> limits() {
           {"kMaximumCallBytes", kMaximumCallBytes},
           {"kMaximumOutputBytes", kMaximumOutputBytes},
           {"kMaximumOutputBeforeRequest", kMaximumOutputBeforeRequest},
+          {"kMaximumOutputBeforeFrame", kMaximumOutputBeforeFrame},
+          {"kTurn", static_cast<std::uint64_t>(kTurn.count())},
           {"kMaximumConnectionsPerPeer", kMaximumConnectionsPerPeer},
           {"kMaximumUnconfinedConnections", kMaximumUnconfinedConnections},
           {"kMaximumConnectionsOfNobody", kMaximumConnectionsOfNobody},

@@ -98,12 +98,30 @@ TEST_F(ConnectionLimiterTest, APeerThatComesBackFindsTheRequestsThatItLeftBehind
   EXPECT_TRUE(back.budget->take(1));
 }
 
+TEST_F(ConnectionLimiterTest, OnePeersConnectionsShareItsLaneAndAnotherHasItsOwn) {
+  const auto first = admit("one");
+  EXPECT_TRUE(first.lane);
+  EXPECT_EQ(admit("one").lane, first.lane);
+  EXPECT_NE(admit("two").lane, first.lane);
+}
+
+TEST_F(ConnectionLimiterTest, APeerWhoseRequestsStillRunFindsItsLaneAgain) {
+  std::shared_ptr<Reactor::Lane> busy;
+  {
+    const auto admission = admit("one");
+    busy = admission.lane;
+  }
+  EXPECT_EQ(limiter->openConnections(), 0U);
+  EXPECT_EQ(admit("one").lane, busy);
+}
+
 TEST_F(ConnectionLimiterTest, APeerThatLeftNothingBehindIsForgotten) {
   std::weak_ptr<CallBudget> budget;
   {
     auto admission = admit("one");
     budget = admission.budget;
     admission.budget.reset();
+    admission.lane.reset();
     EXPECT_FALSE(budget.expired());
   }
   EXPECT_TRUE(budget.expired());

@@ -677,23 +677,69 @@ TEST(LinuxRpcServicePublishingTest, APassedSocketDoesNotMakeItsNameAService) {
               EndedWith("no socket is known for it"));
 }
 
-TEST_F(LinuxRpcServiceTest, ARequestThatTakesLongHoldsUpNoOtherConnection) {
-  const auto slow = std::make_shared<SlowObject>();
-  delegate->makeObject = [slow, isFirst = true]() mutable -> std::shared_ptr<TestProtocol> {
-    if (std::exchange(isFirst, false)) return slow;
-    return std::make_shared<TestObject>();
-  };
-  serve();
+// The first connection that is made gets the slow object.
+class SlowRequestTest : public LinuxRpcServiceTest {
+ protected:
+  void serveSlowly() {
+    delegate->makeObject = [slow = slow, isFirst = true]() mutable -> std::shared_ptr<TestProtocol> {
+      if (std::exchange(isFirst, false)) return slow;
+      return std::make_shared<TestObject>();
+    };
+    serve();
+  }
+  LinuxDriver::Client connectAs(Standing standing, std::optional<std::string> bundle) {
+    driver.peers.setNextPeer(standing, std::move(bundle), {});
+    return driver.connect();
+  }
+  static void ping(const LinuxDriver::Client& client, Mailbox<bool>& answered) {
+    QXRemote<TestProtocol>(client.proxy([&answered](const QXError&) { answered.put(false); })).call<&TestProtocol::ping>([&answered] {
+      answered.put(true);
+    });
+  }
+
+  const std::shared_ptr<SlowObject> slow = std::make_shared<SlowObject>();
+};
+
+TEST_F(SlowRequestTest, ARequestThatTakesLongHoldsUpNoOtherPeer) {
+  serveSlowly();
   Mailbox<bool> answered;
-  const auto first = driver.connect();
-  QXRemote<TestProtocol>(first.proxy([&answered](const QXError&) { answered.put(false); })).call<&TestProtocol::ping>([&answered] {
-    answered.put(true);
-  });
+  const auto first = connectAs(Standing::confined, "com.example.Slow");
+  ping(first, answered);
   ASSERT_TRUE(slow->begun.take());
-  EXPECT_TRUE(roundTrip(driver.connect()));
+  EXPECT_TRUE(roundTrip(connectAs(Standing::confined, "com.example.Other")));
+  EXPECT_TRUE(roundTrip(connectAs(Standing::unconfined, std::nullopt)));
+  EXPECT_TRUE(roundTrip(connectAs(Standing::nobody, std::nullopt)));
   EXPECT_EQ(answered.count(), 0U);
   slow->mayEnd.put(true);
   EXPECT_EQ(answered.take(), true);
+}
+
+TEST_F(SlowRequestTest, UnconfinedProcessesDoNotHoldUpEachOther) {
+  serveSlowly();
+  Mailbox<bool> answered;
+  const auto first = connectAs(Standing::unconfined, std::nullopt);
+  ping(first, answered);
+  ASSERT_TRUE(slow->begun.take());
+  EXPECT_TRUE(roundTrip(connectAs(Standing::unconfined, std::nullopt)));
+  EXPECT_EQ(answered.count(), 0U);
+  slow->mayEnd.put(true);
+  EXPECT_EQ(answered.take(), true);
+}
+
+TEST_F(SlowRequestTest, OfOneBundlesConnectionsOneIsServedAtATime) {
+  serveSlowly();
+  Mailbox<bool> answered;
+  Mailbox<bool> answeredSecond;
+  const auto first = connectAs(Standing::confined, "com.example.Slow");
+  ping(first, answered);
+  ASSERT_TRUE(slow->begun.take());
+  const auto second = connectAs(Standing::confined, "com.example.Slow");
+  ping(second, answeredSecond);
+  for (int i = 0; i < 20; ++i) EXPECT_TRUE(roundTrip(connectAs(Standing::confined, "com.example.Other")));
+  EXPECT_EQ(answeredSecond.count(), 0U);
+  slow->mayEnd.put(true);
+  EXPECT_EQ(answered.take(), true);
+  EXPECT_EQ(answeredSecond.take(), true);
 }
 
 TEST_F(LinuxRpcServiceTest, TheListenersEndClosesItsConnections) {

@@ -43,7 +43,7 @@ TEST_F(Doctor, FindsTheDaemonAndEveryProtectionThatThisKernelGives) {
   const JSON findings = JSON::parse(ending.output);
   EXPECT_EQ(findingOf(findings, "daemon").second, "process " + std::to_string(house_.daemon().pid()) + " answers");
   for (const char* protection : {"ordinary user", "run-time directory", "user namespaces", "bubblewrap", "docuvend-confine", "Landlock",
-                                 "confinement", "directories", "bundles", "daemon", "daemon's kernel", "daemon's privileges"}) {
+                                 "confinement", "directories", "bundles", "watches", "daemon", "daemon's kernel", "daemon's privileges"}) {
     EXPECT_EQ(findingOf(findings, protection).first, "in force") << protection << ": " << findingOf(findings, protection).second;
   }
 }

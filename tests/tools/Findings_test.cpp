@@ -51,7 +51,7 @@ void expectOnly(const MachineFacts& facts, const std::string& protection, Verdic
 
 TEST(Findings, OnASoundMachineEverythingIsInForceAndTheStatusIsDone) {
   const auto findings = findingsFrom(soundMachine());
-  EXPECT_EQ(findings.size(), 19U);
+  EXPECT_EQ(findings.size(), 20U);
   for (const Finding& finding : findings) EXPECT_EQ(finding.verdict, Verdict::inForce) << finding.protection;
   EXPECT_EQ(reportOf(findings).status, ExitStatus::done);
 }
@@ -164,6 +164,12 @@ TEST(Findings, BundlesThatOthersCanWriteAreTold) {
   MachineFacts facts = soundMachine();
   facts.bundlesProblem = "/home/u can be written by everybody";
   expectOnly(facts, "bundles", Verdict::missing, "/home/u can be written by everybody");
+}
+
+TEST(Findings, AKernelThatWatchesNoMoreIsTold) {
+  MachineFacts facts = soundMachine();
+  facts.watchesProblem = "used up";
+  expectOnly(facts, "watches", Verdict::missing, "used up");
 }
 
 TEST(Findings, WithoutADaemonWhatItHasIsNotKnown) {

@@ -4,6 +4,7 @@
 #include <fcntl.h>
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
+#include <sys/resource.h>
 #include <unistd.h>
 
 #include "platform/linux/base/UniqueDescriptor.h"
@@ -18,6 +19,17 @@ using ::testing::Optional;
 TEST(Trials, WhatTheKernelGivesWorks) {
   EXPECT_EQ(tryUserNamespace(), std::nullopt);
   EXPECT_EQ(tryLandlock(linux_platform::landlockLevel()), std::nullopt);
+  EXPECT_EQ(tryWatch(), std::nullopt);
+}
+
+TEST(Trials, AKernelThatWatchesNoMoreIsFoundOut) {
+  rlimit before{};
+  ASSERT_EQ(::getrlimit(RLIMIT_NOFILE, &before), 0);
+  const rlimit none{0, before.rlim_max};
+  ASSERT_EQ(::setrlimit(RLIMIT_NOFILE, &none), 0);
+  const auto failure = tryWatch();
+  ASSERT_EQ(::setrlimit(RLIMIT_NOFILE, &before), 0);
+  EXPECT_THAT(failure, Optional(HasSubstr("max_user_watches")));
 }
 
 TEST(Trials, ALandlockThatDoesNotRestrictIsFoundOut) { EXPECT_THAT(tryLandlock(0), Optional(HasSubstr("could not be restricted"))); }

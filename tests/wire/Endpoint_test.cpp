@@ -713,6 +713,91 @@ TEST_F(EndpointTest, APeerThatDoesNotReadIsDroppedAndHoldsNobodyUp) {
   EXPECT_THAT(server.blamed->take(), IsRpcError(QXRpcErrorCode::peerDoesNotRead));
 }
 
+TEST_F(EndpointTest, APeerInALaneThatDoesNotReadIsServedNoFurtherUntilItDoes) {
+  const std::string block(kMaximumTextBytes, 'a');
+  std::atomic<std::size_t> served = 0;
+  CallRules rules;
+  rules.lane = Reactor::makeLane();
+  auto raw = connectRaw(std::make_shared<Answerer>([&](const QXArray&) {
+                          ++served;
+                          return QXArray{QXValue(block)};
+                        }),
+                        std::move(rules));
+  raw.sayHello();
+  constexpr std::size_t kAnswers = 2 * kMaximumOutputBytes / kMaximumTextBytes;
+  for (std::size_t i = 1; i <= kAnswers; ++i) ASSERT_TRUE(raw.write(Frame(RequestFrame{i, true, kEcho.name, {QXValue("a")}})));
+  // It is left alone when nothing more happens, however often the threads come round.
+  constexpr int kRounds = 1000;
+  std::size_t before = 0;
+  for (int quiet = 0; quiet < kRounds; ++quiet) {
+    Mailbox<int> passed;
+    reactor->post([&passed] { passed.put(1); });
+    ASSERT_TRUE(passed.take());
+    if (std::exchange(before, served) != served || served == 0) quiet = 0;
+  }
+  EXPECT_LT(served, kAnswers);
+  EXPECT_EQ(server.closed->count(), 0U);
+  ASSERT_TRUE(raw.read<Hello>());
+  for (std::size_t i = 1; i <= kAnswers; ++i) {
+    const auto reply = raw.read<ReplyFrame>();
+    ASSERT_TRUE(reply);
+    EXPECT_EQ(reply->callID, i);
+  }
+  EXPECT_EQ(served, kAnswers);
+}
+
+TEST_F(EndpointTest, APeerInALaneThatLeavesWithoutReadingIsForgotten) {
+  const std::string block(kMaximumTextBytes, 'a');
+  Mailbox<int> served;
+  CallRules rules;
+  rules.lane = Reactor::makeLane();
+  auto raw = connectRaw(std::make_shared<Answerer>([&](const QXArray&) {
+                          served.put(1);
+                          return QXArray{QXValue(block)};
+                        }),
+                        std::move(rules));
+  raw.sayHello();
+  for (std::size_t i = 1; i <= 100; ++i) ASSERT_TRUE(raw.write(Frame(RequestFrame{i, true, kEcho.name, {QXValue("a")}})));
+  ASSERT_TRUE(served.take());
+  raw.leave();
+  EXPECT_TRUE(server.closed->take());
+}
+
+TEST_F(EndpointTest, AFloodOfRequestsLeavesOthersTheirTurns) {
+  reactor = std::make_unique<Reactor>(1U);
+  constexpr std::size_t kFlood = 200;
+  Mailbox<int> mayGoOn;
+  Mailbox<std::size_t> servedBefore;
+  std::atomic<std::size_t> served = 0;
+  auto raw = connectRaw(std::make_shared<Answerer>([&](QXArray values) {
+    if (served++ == 0) mayGoOn.take();
+    std::this_thread::sleep_for(2 * kTurn);  // what a request costs, not what is waited for
+    return values;
+  }));
+  const Side flooded = std::exchange(server, {});
+  auto other = connectRaw(std::make_shared<Answerer>([&](QXArray values) {
+    servedBefore.put(served);
+    return values;
+  }));
+  raw.sayHello();
+  std::vector<std::uint8_t> flood;
+  for (std::size_t i = 1; i <= kFlood; ++i) {
+    const auto bytes = tests::bytesOf(Frame(RequestFrame{i, true, kEcho.name, {QXValue("a")}}));
+    flood.insert(flood.end(), bytes.begin(), bytes.end());
+  }
+  ASSERT_TRUE(raw.write(flood));
+  other.sayHello();
+  ASSERT_TRUE(other.write(Frame(RequestFrame{1, true, kEcho.name, {QXValue("b")}})));
+  mayGoOn.put(1);
+  ASSERT_TRUE(other.read<Hello>());
+  ASSERT_TRUE(other.read<ReplyFrame>());
+  const auto count = servedBefore.take();
+  ASSERT_TRUE(count);
+  EXPECT_LT(*count, 5U);
+  ASSERT_TRUE(raw.read<Hello>());
+  for (std::size_t i = 1; i <= kFlood; ++i) ASSERT_TRUE(raw.read<ReplyFrame>());
+}
+
 TEST_F(EndpointTest, WhatAPeerIsAskedForNeverPilesUpSoFarThatItIsBlamed) {
   reactor = std::make_unique<Reactor>(1U);
   auto raw = connectRaw(nullptr);
@@ -763,7 +848,7 @@ TEST_F(EndpointTest, UnansweredRequestsMayNotHoldTooManyBytes) {
 }
 
 TEST_F(EndpointTest, APeerMayAskForNoMoreThanItsRulesSay) {
-  auto raw = connectRaw(recorder, {{}, std::vector<std::string>{kEcho.name}, {}, {}});
+  auto raw = connectRaw(recorder, {{}, std::vector<std::string>{kEcho.name}, {}, {}, {}});
   raw.sayHello();
   ASSERT_TRUE(raw.read<Hello>());
   for (const auto& [number, operation] : {std::pair(1U, kList.name), std::pair(2U, std::string("unheard:of:"))}) {
@@ -785,7 +870,7 @@ TEST_F(EndpointTest, ARequestAndWhatFollowsFromItElsewhereAreForThePeer) {
                           subjects.put(LogSubject::current());
                           return values;
                         }),
-                        {{}, {}, {}, peersName});
+                        {{}, {}, {}, peersName, {}});
   raw.sayHello();
   ASSERT_TRUE(raw.read<Hello>());
   raw.write(Frame(RequestFrame{1, true, kEcho.name, {QXValue("a")}}));
@@ -892,9 +977,9 @@ TEST_F(EndpointTest, APeerMayNotKeepTooManyRequestsUnanswered) {
 
 TEST_F(EndpointTest, ConnectionsOfOneBudgetHaveTogetherNoMoreRequestsUnansweredThanItGives) {
   const auto budget = std::make_shared<CallBudget>(CallLimits{1, kMaximumCallBytes});
-  auto first = connectRaw(recorder, {budget, {}, {}, {}});
+  auto first = connectRaw(recorder, {budget, {}, {}, {}, {}});
   const Side other = std::exchange(server, {});
-  auto second = connectRaw(recorder, {budget, {}, {}, {}});
+  auto second = connectRaw(recorder, {budget, {}, {}, {}, {}});
   for (const auto* peer : {&first, &second}) {
     peer->sayHello();
     ASSERT_TRUE(peer->read<Hello>());

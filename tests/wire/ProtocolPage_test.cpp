@@ -188,6 +188,8 @@ TEST_F(ProtocolPageTest, GivesTheLimits) {
       {"bytes of such requests", std::to_string(kMaximumCallBytes) + "; one more fails with error 5"},
       {"bytes written for a peer that it does not read", std::to_string(kMaximumOutputBytes) + "; then the connection ends"},
       {"the same with one more request", std::to_string(kMaximumOutputBeforeRequest) + "; the request is not made and fails with error 5"},
+      {"the same of a bundle's or of a process without an identity",
+       std::to_string(kMaximumOutputBeforeFrame) + "; until they are taken the daemon reads no further"},
       {"connections of one bundle to the daemon", std::to_string(kMaximumConnectionsPerPeer) + "; one more is ended with error 9"},
       {"connections of all unconfined processes together",
        std::to_string(kMaximumUnconfinedConnections) + "; one more is ended with error 9"},
@@ -230,7 +232,9 @@ TEST_F(ProtocolPageTest, SaysWhatAnExtensionIsGivenAndHowLong) {
   };
   const ExtensionTimes times;
   const std::vector<std::pair<std::string, std::string>> expected = {
-      {"to answer the initial setup, an identifier or a URL", seconds(times.answerLimit) + "; then the process is ended"},
+      {"to answer the initial setup", seconds(times.answerLimit) + "; then the process is ended"},
+      {"to answer an identifier or a URL",
+       seconds(times.answerLimit) + " from when all that were asked for before are answered; then the process is ended"},
       {"to answer the others", "none, as long as it gives signs of life"},
       {"between two pings, while it owes an answer", seconds(times.livenessInterval)},
       {"to answer a ping", seconds(times.answerLimit) + "; then the process is ended"},

@@ -82,6 +82,7 @@ Result<Answer> doctor(const Call& call) {
   if (facts.kernel.landlockLevel > 0) facts.landlockProblem = tryLandlock(facts.kernel.landlockLevel);
   facts.launchProblem = tryLaunch();
   lookAtPlaces(paths, host, facts);
+  facts.watchesProblem = tryWatch();
   // Last: it starts threads.
   askDaemon(call, facts);
   return Answer(reportOf(findingsFrom(facts)));

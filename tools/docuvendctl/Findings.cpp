@@ -119,6 +119,7 @@ std::vector<Finding> findingsFrom(const MachineFacts& facts) {
       ofKernel("audit tokens", kernel.uniquePidfdInodes, levels.tokens),
       judged("directories", facts.placesProblem, Verdict::fatal, "no application sees more than its own"),
       judged("bundles", facts.bundlesProblem, Verdict::missing, "nobody else can write where they lie"),
+      judged("watches", facts.watchesProblem, Verdict::missing, "the kernel watches further sockets for this user"),
       ofDaemon(facts),
       ofDaemonsKernel(facts, levels),
       ofDaemonsPrivileges(facts),

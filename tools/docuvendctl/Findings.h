@@ -33,6 +33,7 @@ struct MachineFacts {
   Problem launchProblem;    // starting a confined process
   Problem placesProblem;    // what of the user's every application sees
   Problem bundlesProblem;   // who else can change what lies there
+  Problem watchesProblem;   // having sockets watched by the kernel
   std::optional<DaemonFacts> daemon;
   std::string daemonProblem;  // why there are no facts about it
 };

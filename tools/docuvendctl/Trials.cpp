@@ -24,6 +24,7 @@
 #include "platform/linux/base/pidfd.h"
 #include "platform/linux/launch/ConfinedLaunch.h"
 #include "platform/linux/launch/policy/Landlock.h"
+#include "platform/linux/wire/EpollSet.h"
 
 namespace docuvend::ctl {
 namespace {
@@ -141,6 +142,11 @@ TrialFailure tryLaunch() {
   auto plan = planLaunch(bundle, /*arguments=*/{}, linux_platform::LaunchKind::extension, std::move(inside), linux_platform::Paths{});
   if (const auto* error = std::get_if<QXError>(&plan)) return error->description();
   return runPlan(std::get<linux_platform::LaunchPlan>(std::move(plan)));
+}
+
+TrialFailure tryWatch() {
+  if (linux_platform::EpollSet::create()) return std::nullopt;
+  return "this user's processes have used up fs.epoll.max_user_watches: who connects now is served more slowly";
 }
 
 }  // namespace docuvend::ctl

@@ -20,4 +20,7 @@ using TrialFailure = std::optional<std::string>;
 // behind.
 [[nodiscard]] TrialFailure tryLaunch();
 
+// The kernel watches another socket for this user.
+[[nodiscard]] TrialFailure tryWatch();
+
 }  // namespace docuvend::ctl

@@ -1,6 +1,6 @@
 // A request may outlive its connection: whoever was asked for it, perhaps a provider, is still at it. A peer is therefore remembered while
-// anything holds its budget, and finds it again when it comes back; closing connections gives it nothing new. Who is forgotten is looked
-// for when a place is given back: peers are bundles, and few.
+// anything holds its budget or its lane, and finds them again when it comes back; closing connections gives it nothing new. Who is
+// forgotten is looked for when a place is given back: peers are bundles, and few.
 
 #include "platform/linux/rpc/ConnectionLimiter.h"
 
@@ -10,17 +10,20 @@ namespace docuvend::linux_platform {
 
 ConnectionLimiter::Admission ConnectionLimiter::admit(const std::string& peer, Limits limits) {
   std::shared_ptr<CallBudget> budget;
+  std::shared_ptr<Reactor::Lane> lane;
   {
     const std::lock_guard lock(mutex_);
     Count& count = counts_[peer];
     if (count.open >= limits.connections) {
-      return {std::exchange(count.refusing, true) ? Verdict::refusedAgain : Verdict::refused, /*place=*/{}, /*budget=*/{}};
+      return {std::exchange(count.refusing, true) ? Verdict::refusedAgain : Verdict::refused, /*place=*/{}, /*budget=*/{}, /*lane=*/{}};
     }
     if (!count.budget) count.budget = std::make_shared<CallBudget>(limits.calls);
+    if (!count.lane) count.lane = Reactor::makeLane();
     budget = count.budget;
+    lane = count.lane;
     ++count.open;
   }
-  return {Verdict::admitted, std::make_unique<Place>(shared_from_this(), peer), std::move(budget)};
+  return {Verdict::admitted, std::make_unique<Place>(shared_from_this(), peer), std::move(budget), std::move(lane)};
 }
 
 std::size_t ConnectionLimiter::openConnections() const {
@@ -36,7 +39,7 @@ void ConnectionLimiter::giveBack(const std::string& peer) {
   found->second.refusing = false;
   --found->second.open;
   // What this map alone holds nobody can take hold of meanwhile.
-  std::erase_if(counts_, [](const auto& counted) { return counted.second.open == 0 && counted.second.budget.use_count() == 1; });
+  std::erase_if(counts_, [](const auto& counted) { return counted.second.isForgettable(); });
 }
 
 }  // namespace docuvend::linux_platform

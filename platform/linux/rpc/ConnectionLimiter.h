@@ -10,6 +10,7 @@
 #include <string>
 
 #include "platform/linux/wire/CallBudget.h"
+#include "platform/linux/wire/Reactor.h"
 
 namespace docuvend::linux_platform {
 
@@ -49,7 +50,8 @@ class ConnectionLimiter : public std::enable_shared_from_this<ConnectionLimiter>
     Verdict verdict;
     // When admitted.
     std::unique_ptr<Place> place;
-    std::shared_ptr<CallBudget> budget;  // the peer's
+    std::shared_ptr<CallBudget> budget;   // the peer's
+    std::shared_ptr<Reactor::Lane> lane;  // the peer's
   };
   struct Limits {
     std::size_t connections;
@@ -64,13 +66,16 @@ class ConnectionLimiter : public std::enable_shared_from_this<ConnectionLimiter>
  private:
   struct Count {
     std::shared_ptr<CallBudget> budget;
+    std::shared_ptr<Reactor::Lane> lane;
     std::size_t open = 0;
     bool refusing = false;
+
+    [[nodiscard]] bool isForgettable() const { return open == 0 && budget.use_count() == 1 && lane.use_count() == 1; }
   };
   void giveBack(const std::string& peer);
 
   mutable std::mutex mutex_;
-  std::map<std::string, Count> counts_;  // of peers with open connections or requests that outlived theirs
+  std::map<std::string, Count> counts_;  // of peers with open connections, or with work that outlived theirs
 };
 
 }  // namespace docuvend::linux_platform

@@ -39,8 +39,7 @@ std::optional<QXError> LinuxRpcConnection::peerSaidHello(PeerDirectory& peers, c
   if (!hello.declaredBundle) return std::nullopt;
   auto declared = peers.declare(*peer(), *hello.declaredBundle);
   if (!declared) {
-    return QXError::make(kQXRpcErrorDomain, static_cast<std::int64_t>(QXRpcErrorCode::refused),
-                         "this process cannot act for the bundle " + *hello.declaredBundle);
+    return qxRpcError(QXRpcErrorCode::refused, "this process cannot act for the bundle " + *hello.declaredBundle);
   }
   const std::lock_guard lock(mutex_);
   peer_.swap(declared);

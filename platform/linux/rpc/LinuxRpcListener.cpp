@@ -18,9 +18,7 @@ constexpr std::chrono::milliseconds kPauseWithoutDescriptors{100};
 
 UniqueDescriptor spareDescriptor() { return UniqueDescriptor(::open("/dev/null", O_RDONLY | O_CLOEXEC)); }
 
-QXError refusal(std::string description) {
-  return QXError::make(kQXRpcErrorDomain, static_cast<std::int64_t>(QXRpcErrorCode::refused), std::move(description));
-}
+QXError refusal(std::string description) { return qxRpcError(QXRpcErrorCode::refused, std::move(description)); }
 
 // What a peer's connections are counted by.
 std::string countedAs(const PeerIdentity& peer) {
@@ -133,16 +131,16 @@ void LinuxRpcListener::admit(UniqueDescriptor socket) {
   const std::string counted = countedAs(*peer);
   const int process = peer->pid;
   const ConnectionLimiter::Limits limits = limitsFor(*peer);
-  auto [verdict, place, budget] = surroundings_.limiter->admit(counted, limits);
-  if (verdict != ConnectionLimiter::Verdict::admitted) {
-    if (verdict == ConnectionLimiter::Verdict::refused) {
+  auto admission = surroundings_.limiter->admit(counted, limits);
+  if (admission.verdict != ConnectionLimiter::Verdict::admitted) {
+    if (admission.verdict == ConnectionLimiter::Verdict::refused) {
       surroundings_.log.write(QXLogType::defaultType, "[NOTICE] Refusing a connection of PID " + std::to_string(process) + ": " + counted +
                                                           " may not open more than " + std::to_string(limits.connections) + ".");
     }
     refuse(std::move(socket), "too many connections");
     return;
   }
-  CallRules rules = rulesFor(*peer, std::move(budget));
+  CallRules rules = rulesFor(*peer, admission);
   const std::uint64_t number = nextNumber_++;
   auto connection =
       LinuxRpcConnection::create(surroundings_.reactor, surroundings_.peers, surroundings_.log, std::move(peer), std::move(socket),
@@ -151,7 +149,7 @@ void LinuxRpcListener::admit(UniqueDescriptor socket) {
                                  });
   {
     const std::lock_guard lock(mutex_);
-    accepted_.emplace(number, Accepted{connection, std::move(place)});
+    accepted_.emplace(number, Accepted{connection, std::move(admission.place)});
   }
   offer(connection);
 }
@@ -161,9 +159,10 @@ bool LinuxRpcListener::isFor(const PeerIdentity& peer) const {
   return service_.audience == Audience::everyone || peer.standing == Standing::unconfined;
 }
 
-CallRules LinuxRpcListener::rulesFor(const PeerIdentity& peer, std::shared_ptr<CallBudget> budget) const {
-  CallRules rules{std::move(budget), /*operations=*/{}, service_.releasing, LogSubject::current()};
+CallRules LinuxRpcListener::rulesFor(const PeerIdentity& peer, ConnectionLimiter::Admission& admission) const {
+  CallRules rules{std::move(admission.budget), /*operations=*/{}, service_.releasing, LogSubject::current(), /*lane=*/{}};
   if (peer.standing == Standing::nobody) rules.operations = service_.operationsForNobody;
+  if (peer.standing != Standing::unconfined) rules.lane = std::move(admission.lane);
   return rules;
 }
 

@@ -62,7 +62,7 @@ class LinuxRpcListener final : public QXRpcListener, public std::enable_shared_f
   void acceptAndDrop(int errnoValue);
   void admit(UniqueDescriptor socket);
   [[nodiscard]] bool isFor(const PeerIdentity& peer) const;
-  [[nodiscard]] CallRules rulesFor(const PeerIdentity& peer, std::shared_ptr<CallBudget> budget) const;
+  [[nodiscard]] CallRules rulesFor(const PeerIdentity& peer, ConnectionLimiter::Admission& admission) const;
   void refuseOutsider(const PeerIdentity& peer, UniqueDescriptor socket);
   void refuse(UniqueDescriptor socket, std::string reason) const;
   void offer(const std::shared_ptr<LinuxRpcConnection>& connection);

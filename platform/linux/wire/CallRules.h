@@ -8,6 +8,7 @@
 
 #include "platform/linux/base/LogSubject.h"
 #include "platform/linux/wire/CallBudget.h"
+#include "platform/linux/wire/Reactor.h"
 
 namespace docuvend::linux_platform {
 
@@ -20,6 +21,9 @@ struct CallRules {
   std::vector<std::string> releasing;
   // For whom its requests are run.
   LogSubject::Name subject;
+  // Of a peer that is not trusted, shared by its connections: one of them is served at a time, and only as long as it takes its answers.
+  // Empty for others.
+  std::shared_ptr<Reactor::Lane> lane;
 };
 
 }  // namespace docuvend::linux_platform

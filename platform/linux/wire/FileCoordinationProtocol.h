@@ -59,8 +59,8 @@ class QXFileCoordination {
                                           std::optional<std::int64_t> party, ErrorReply completionHandler) = 0;
   virtual void coordinateWritingItemAtURL(std::optional<QXURL> url, std::optional<QXData> token, std::optional<QXUUID> accessID,
                                           std::optional<std::int64_t> party, ErrorReply completionHandler) = 0;
-  // Answered when the access has ended: of a write, when the provider is being told, or sure to be. An access that has not begun yet ends at once, and the
-  // request for it is answered with `ended`.
+  // Answered when the access has ended: of a write, when the provider is being told, or sure to be. An access that has not begun yet ends
+  // at once, and the request for it is answered with `ended`.
   virtual void endAccess(std::optional<QXUUID> accessID, ErrorReply completionHandler) = 0;
   // How much of the file is present while an access waits for the file's provider, in bytes; both absent at any other time.
   virtual void progressOfAccess(std::optional<QXUUID> accessID, ProgressReply completionHandler) = 0;

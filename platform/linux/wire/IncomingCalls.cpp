@@ -14,10 +14,6 @@ namespace {
 
 constexpr std::size_t kMaximumQuotedName = 255;
 
-QXError failure(QXRpcErrorCode code, std::string description) {
-  return QXError::make(kQXRpcErrorDomain, static_cast<std::int64_t>(code), std::move(description));
-}
-
 std::string quote(const std::string& operation) {
   return operation.size() > kMaximumQuotedName ? "of " + std::to_string(operation.size()) + " bytes" : operation;
 }
@@ -40,7 +36,7 @@ struct IncomingCalls::Answer {
     const auto open = sink.lock();
     if (!open) return;
     if (auto mismatch = qxReplyMismatch(*interface, operation, values)) {
-      open->sendFailure({callID, failure(QXRpcErrorCode::invalidReply, *std::move(mismatch))});
+      open->sendFailure({callID, qxRpcError(QXRpcErrorCode::invalidReply, *std::move(mismatch))});
     } else {
       open->sendReply({callID, std::move(values)});
     }
@@ -75,7 +71,7 @@ bool IncomingCalls::isReleasing(const std::string& operation) const { return con
 
 void IncomingCalls::run(RequestFrame request, std::size_t bytes, const std::shared_ptr<AnswerSink>& sink) {
   if (!mayAskFor(request.operation)) {
-    sink->sendFailure({request.callID, failure(QXRpcErrorCode::notPermitted, "the operation is not for a process without an identity")});
+    sink->sendFailure({request.callID, qxRpcError(QXRpcErrorCode::notPermitted, "the operation is not for a process without an identity")});
     return;
   }
   std::shared_ptr<const QXRpcInterface> interface;
@@ -87,17 +83,17 @@ void IncomingCalls::run(RequestFrame request, std::size_t bytes, const std::shar
   }
   const auto operation = interface && object ? interface->indexOf(request.operation) : std::nullopt;
   if (!operation) {
-    sink->sendFailure({request.callID, failure(QXRpcErrorCode::unknownOperation, "unknown operation " + quote(request.operation))});
+    sink->sendFailure({request.callID, qxRpcError(QXRpcErrorCode::unknownOperation, "unknown operation " + quote(request.operation))});
     return;
   }
   if (auto mismatch = qxMismatch(interface->operations()[*operation].arguments, request.arguments)) {
-    sink->sendFailure({request.callID, failure(QXRpcErrorCode::invalidArguments, request.operation + ": " + *mismatch)});
+    sink->sendFailure({request.callID, qxRpcError(QXRpcErrorCode::invalidArguments, request.operation + ": " + *mismatch)});
     return;
   }
   const bool takesNothing = isReleasing(request.operation);
   auto share = takesNothing ? nullptr : budget_->take(bytes);
   if (!share && !takesNothing) {
-    sink->sendFailure({request.callID, failure(QXRpcErrorCode::tooManyCalls, "too many requests wait for their answers")});
+    sink->sendFailure({request.callID, qxRpcError(QXRpcErrorCode::tooManyCalls, "too many requests wait for their answers")});
     return;
   }
   // A request that wants no answer is as much work as one that does.

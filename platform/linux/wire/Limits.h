@@ -1,6 +1,7 @@
 // What a peer may ask this process to hold. Both directions keep to them: a message that breaks one is not sent.
 #pragma once
 
+#include <chrono>
 #include <cstddef>
 #include <cstdint>
 
@@ -18,6 +19,9 @@ inline constexpr std::size_t kMaximumCallBytes = std::size_t{4} << 20U;    // of
 inline constexpr std::size_t kMaximumOutputBytes = std::size_t{4} << 20U;  // written for a peer and not taken by it yet
 // The same; while there are more, this end asks nothing further of the peer. So what this end asks alone never ends the connection.
 inline constexpr std::size_t kMaximumOutputBeforeRequest = kMaximumOutputBytes / 2;
+// The same of a peer that is not trusted; while there are more, nothing further of what it says is looked at.
+inline constexpr std::size_t kMaximumOutputBeforeFrame = std::size_t{1} << 16U;
+inline constexpr std::chrono::milliseconds kTurn{1};              // after which further frames wait until others have had theirs
 inline constexpr std::size_t kReadBytes = std::size_t{1} << 16U;  // taken from a socket at a time
 
 }  // namespace docuvend::linux_platform

@@ -1,73 +1,97 @@
 #include "platform/linux/wire/Reactor.h"
 
 #include <sys/epoll.h>
-#include <sys/eventfd.h>
-#include <unistd.h>
 
 #include <cassert>
-#include <cerrno>
-#include <cstdio>
-#include <cstdlib>
+#include <condition_variable>
 #include <deque>
 #include <map>
 #include <mutex>
+#include <optional>
+#include <system_error>
 #include <thread>
 #include <utility>
 #include <vector>
 
-#include "platform/linux/base/UniqueDescriptor.h"
+#include "platform/linux/wire/EpollSet.h"
+#include "platform/linux/wire/PollThread.h"
 
 // One epoll instance, several threads that wait on it, one event at a time each.
 //
-// A watched descriptor is armed for one event: the thread that gets it owns the registration until its handler has returned, and arms it
+// A watched descriptor is armed for one event: the thread that gets it takes the registration until its handler has returned, and arms it
 // again with the handler's result and with what others asked for meanwhile. Events carry a number, not a pointer: an event of a
 // registration that has been dropped in between finds nothing. Handlers are called with no lock held.
 //
-// Posted tasks are counted by a semaphore-like eventfd: each event lets one thread take one. A second eventfd, never read, tells all
-// threads to stop.
+// A registration whose lane is busy stays taken and stands in the lane's line; whoever leaves the lane posts the first of the line as a
+// task, and one that asks to be run again is posted too. Tasks and events come out of the same instance by turns: a lane, however long its
+// line, never has more than one of the turns.
+//
+// Where the kernel gives no epoll at all, threads wait for tasks on a condition variable. What epoll does not take is watched by a thread
+// that polls, and posts what is ready.
 
 namespace docuvend::linux_platform {
 namespace {
 
-constexpr std::uint64_t kStopKey = 0;
-constexpr std::uint64_t kPostKey = 1;
-constexpr std::uint64_t kFirstWatchKey = 2;
-
-[[noreturn]] void giveUp(const char* what) {
-  std::perror(what);
-  std::abort();
-}
+struct Ready {
+  std::uint64_t key;
+  std::uint32_t events;
+};
 
 struct Watched {
-  int descriptor;
+  int descriptor = -1;
   std::shared_ptr<Reactor::Handler> handler;
+  std::shared_ptr<Reactor::Lane> lane;  // null: it is in no other's way
+  bool isPolled = false;
   std::uint32_t armed = 0;
-  std::uint32_t wantedMeanwhile = 0;  // asked for while the handler runs
-  bool running = false;
+  std::uint32_t wantedMeanwhile = 0;  // asked for while it is taken
+  bool isTaken = false;               // its handler runs, or is to run
 };
 
 }  // namespace
 
+// Guarded by the reactor's mutex.
+class Reactor::Lane {
+ public:
+  bool isBusy = false;
+  std::deque<Ready> line;
+};
+
 struct Reactor::State {
   // Constant after construction.
-  UniqueDescriptor epoll;
-  UniqueDescriptor stop;
-  UniqueDescriptor posted;
+  std::unique_ptr<EpollSet> epoll;  // null: without
   std::vector<std::thread> threads;
+  bool isRunning = false;
 
   std::mutex mutex;  // guards the rest
-  std::uint64_t nextKey = kFirstWatchKey;
+  std::condition_variable changed;
+  std::uint64_t nextKey = EpollSet::kFirstKey;
   std::map<std::uint64_t, Watched> watches;
+  std::unique_ptr<PollThread> polling;  // made when it is needed; after the threads have ended, gone
   std::deque<std::function<void()>> tasks;
+  bool isStopping = false;
   bool over = false;
 
-  void run();
-  void runHandler(std::uint64_t key, std::uint32_t events);
-  void runTask();
+  void start(unsigned count, Waiting waiting);
+  void stop();
+  void runByEpoll();
+  void runByCondition();
+  void runPosted();
   void post(std::function<void()> task);
-  void arm(std::uint64_t key, Watched& watched, std::uint32_t events) const;
+
+  void take(Ready ready);
+  void runTaken(Ready ready, const std::shared_ptr<Lane>& lane);
+  std::optional<std::uint64_t> watch(Watched watched, std::uint32_t events);
   void drop(std::uint64_t key);
   void rearm(std::uint64_t key, std::uint32_t events);
+
+  // With the mutex held.
+  void syncPost(std::function<void()> task);
+  bool syncAdd(std::uint64_t key, Watched& watched, std::uint32_t events);
+  bool syncAddPolled(std::uint64_t key, Watched& watched, std::uint32_t events);
+  void syncRemove(std::uint64_t key, const Watched& watched);
+  void syncArm(std::uint64_t key, Watched& watched, std::uint32_t events);
+  void syncRunLater(Ready ready, const std::shared_ptr<Lane>& lane);
+  void syncLeave(const std::shared_ptr<Lane>& lane);
 };
 
 class Reactor::Watch final : public Reactor::Registration {
@@ -82,13 +106,47 @@ class Reactor::Watch final : public Reactor::Registration {
   const std::uint64_t key_;
 };
 
-void Reactor::State::arm(std::uint64_t key, Watched& watched, std::uint32_t events) const {
+bool Reactor::State::syncAdd(std::uint64_t key, Watched& watched, std::uint32_t events) {
+  const auto adding = epoll ? epoll->add(key, watched.descriptor, events) : EpollSet::Adding::refused;
+  return adding == EpollSet::Adding::done || (adding == EpollSet::Adding::refused && syncAddPolled(key, watched, events));
+}
+
+bool Reactor::State::syncAddPolled(std::uint64_t key, Watched& watched, std::uint32_t events) {
+  if (watched.descriptor < 0 || isStopping) return false;
+  if (!polling) {
+    polling = PollThread::start([this](std::uint64_t ready, std::uint32_t told) { post([this, ready, told] { take({ready, told}); }); });
+  }
+  if (!polling) return false;
+  watched.isPolled = true;
+  polling->arm(key, watched.descriptor, events);
+  return true;
+}
+
+void Reactor::State::syncRemove(std::uint64_t key, const Watched& watched) {
+  if (!watched.isPolled) {
+    epoll->remove(watched.descriptor);
+  } else if (polling) {
+    polling->letGo(key);
+  }
+}
+
+void Reactor::State::syncArm(std::uint64_t key, Watched& watched, std::uint32_t events) {
   watched.armed = events;
   if (events == 0) return;
-  epoll_event event{};
-  event.events = events | static_cast<std::uint32_t>(EPOLLONESHOT);
-  event.data.u64 = key;
-  ::epoll_ctl(epoll.get(), EPOLL_CTL_MOD, watched.descriptor, &event);
+  if (!watched.isPolled) {
+    epoll->arm(key, watched.descriptor, events);
+  } else if (polling) {
+    polling->arm(key, watched.descriptor, events);
+  }
+}
+
+std::optional<std::uint64_t> Reactor::State::watch(Watched watched, std::uint32_t events) {
+  const std::lock_guard lock(mutex);
+  const std::uint64_t key = nextKey++;
+  if (!syncAdd(key, watched, events)) return std::nullopt;
+  watched.armed = events | EPOLLHUP;  // armed even without events: a hang-up is told
+  watches.emplace(key, std::move(watched));
+  return key;
 }
 
 void Reactor::State::rearm(std::uint64_t key, std::uint32_t events) {
@@ -96,55 +154,99 @@ void Reactor::State::rearm(std::uint64_t key, std::uint32_t events) {
   const auto found = watches.find(key);
   if (found == watches.end()) return;
   Watched& watched = found->second;
-  if (watched.running) {
+  if (watched.isTaken) {
     watched.wantedMeanwhile |= events;
   } else if ((watched.armed | events) != watched.armed) {
-    arm(key, watched, watched.armed | events);
+    syncArm(key, watched, watched.armed | events);
   }
 }
 
 void Reactor::State::drop(std::uint64_t key) {
-  std::shared_ptr<Handler> released;  // after the lock: it may own registrations
+  Watched dropped;  // goes after the lock: its handler may own registrations
   const std::lock_guard lock(mutex);
   const auto found = watches.find(key);
   if (found == watches.end()) return;
-  ::epoll_ctl(epoll.get(), EPOLL_CTL_DEL, found->second.descriptor, nullptr);
-  released = std::move(found->second.handler);
+  syncRemove(key, found->second);
+  dropped = std::move(found->second);
   watches.erase(found);
 }
 
-void Reactor::State::runHandler(std::uint64_t key, std::uint32_t events) {
+void Reactor::State::take(Ready ready) {
+  std::shared_ptr<Lane> lane;
+  {
+    const std::lock_guard lock(mutex);
+    const auto found = watches.find(ready.key);
+    if (found == watches.end() || found->second.isTaken || found->second.armed == 0) return;
+    Watched& watched = found->second;
+    watched.isTaken = true;
+    watched.armed = 0;
+    lane = watched.lane;
+    if (lane && std::exchange(lane->isBusy, true)) {
+      lane->line.push_back(ready);
+      return;
+    }
+  }
+  runTaken(ready, lane);
+}
+
+void Reactor::State::runTaken(Ready ready, const std::shared_ptr<Lane>& lane) {
   std::shared_ptr<Handler> handler;
   {
     const std::lock_guard lock(mutex);
-    const auto found = watches.find(key);
-    if (found == watches.end() || found->second.running || found->second.armed == 0) return;
-    found->second.running = true;
-    found->second.armed = 0;
-    handler = found->second.handler;
+    const auto found = watches.find(ready.key);
+    if (found != watches.end()) handler = found->second.handler;
   }
-  const std::uint32_t wanted = (*handler)(events);
+  const std::uint32_t wanted = handler ? (*handler)(ready.events) : 0;
+  handler.reset();
   const std::lock_guard lock(mutex);
-  const auto found = watches.find(key);
-  if (found == watches.end()) return;
-  Watched& watched = found->second;
-  watched.running = false;
-  arm(key, watched, wanted | std::exchange(watched.wantedMeanwhile, 0));
+  const auto found = watches.find(ready.key);
+  if (found != watches.end()) {
+    Watched& watched = found->second;
+    if ((wanted & kAgain) != 0) {
+      syncRunLater({ready.key, 0}, lane);
+    } else {
+      watched.isTaken = false;
+      syncArm(ready.key, watched, wanted | std::exchange(watched.wantedMeanwhile, 0));
+    }
+  }
+  if (lane) syncLeave(lane);
+}
+
+void Reactor::State::syncRunLater(Ready ready, const std::shared_ptr<Lane>& lane) {
+  if (lane) {
+    lane->line.push_back(ready);
+  } else {
+    syncPost([this, ready] { runTaken(ready, /*lane=*/{}); });
+  }
+}
+
+void Reactor::State::syncLeave(const std::shared_ptr<Lane>& lane) {
+  while (!lane->line.empty()) {
+    const Ready next = lane->line.front();
+    lane->line.pop_front();
+    if (!watches.contains(next.key)) continue;
+    syncPost([this, next, lane] { runTaken(next, lane); });
+    return;
+  }
+  lane->isBusy = false;
 }
 
 void Reactor::State::post(std::function<void()> task) {
-  {
-    const std::lock_guard lock(mutex);
-    if (over) return;
-    tasks.push_back(std::move(task));
-  }
-  const std::uint64_t one = 1;
-  if (::write(posted.get(), &one, sizeof one) != sizeof one) giveUp("cannot post to a reactor");
+  const std::lock_guard lock(mutex);
+  syncPost(std::move(task));
 }
 
-void Reactor::State::runTask() {
-  std::uint64_t one = 0;
-  if (::read(posted.get(), &one, sizeof one) != sizeof one) return;  // another thread was faster
+void Reactor::State::syncPost(std::function<void()> task) {
+  if (over) return;
+  tasks.push_back(std::move(task));
+  if (epoll) {
+    epoll->post();
+  } else {
+    changed.notify_one();
+  }
+}
+
+void Reactor::State::runPosted() {
   std::function<void()> task;
   {
     const std::lock_guard lock(mutex);
@@ -155,48 +257,67 @@ void Reactor::State::runTask() {
   task();
 }
 
-void Reactor::State::run() {
+void Reactor::State::runByEpoll() {
   while (true) {
-    epoll_event event{};
-    const int count = ::epoll_wait(epoll.get(), &event, 1, -1);
-    if (count < 0 && errno != EINTR) giveUp("epoll_wait");
-    if (count <= 0) continue;
-    if (event.data.u64 == kStopKey) return;
-    if (event.data.u64 == kPostKey) {
-      runTask();
+    const auto event = epoll->wait();
+    if (event.kind == EpollSet::Event::Kind::stopped) return;
+    if (event.kind == EpollSet::Event::Kind::posted) {
+      runPosted();
     } else {
-      runHandler(event.data.u64, event.events);
+      take({event.key, event.events});
     }
   }
 }
 
-Reactor::Reactor(unsigned threads) : state_(std::make_shared<State>()) {
-  assert(threads > 0);
-  state_->epoll = UniqueDescriptor(::epoll_create1(EPOLL_CLOEXEC));
-  state_->stop = UniqueDescriptor(::eventfd(0, EFD_CLOEXEC));
-  state_->posted = UniqueDescriptor(::eventfd(0, EFD_CLOEXEC | EFD_NONBLOCK | EFD_SEMAPHORE));
-  if (!state_->epoll || !state_->stop || !state_->posted) giveUp("cannot create a reactor");
-  for (const auto& [descriptor, key] : {std::pair{state_->stop.get(), kStopKey}, std::pair{state_->posted.get(), kPostKey}}) {
-    epoll_event event{};
-    event.events = EPOLLIN;
-    event.data.u64 = key;
-    if (::epoll_ctl(state_->epoll.get(), EPOLL_CTL_ADD, descriptor, &event) != 0) giveUp("epoll_ctl");
-  }
-  for (unsigned i = 0; i < threads; ++i) {
-    state_->threads.emplace_back([state = state_.get()] { state->run(); });  // joined before the state goes
+void Reactor::State::runByCondition() {
+  while (true) {
+    {
+      std::unique_lock lock(mutex);
+      changed.wait(lock, [this] { return isStopping || !tasks.empty(); });
+      if (isStopping) return;
+    }
+    runPosted();
   }
 }
 
+void Reactor::State::start(unsigned count, Waiting waiting) {
+  if (waiting == Waiting::byEpoll) epoll = EpollSet::create();
+  for (unsigned i = 0; i < count; ++i) {
+    try {
+      threads.emplace_back([this] { epoll ? runByEpoll() : runByCondition(); });  // joined before the state goes
+    } catch (const std::system_error&) {
+      return;
+    }
+  }
+  isRunning = true;
+}
+
+void Reactor::State::stop() {
+  std::unique_ptr<PollThread> ended;
+  {
+    const std::lock_guard lock(mutex);
+    isStopping = true;
+    ended.swap(polling);
+  }
+  ended.reset();
+  changed.notify_all();
+  if (epoll) epoll->stop();
+  for (std::thread& thread : threads) thread.join();
+}
+
+Reactor::Reactor(unsigned threads, Waiting waiting) : state_(std::make_shared<State>()) {
+  assert(threads > 0);
+  state_->start(threads, waiting);
+}
+
 Reactor::~Reactor() {
-  const std::uint64_t one = 1;
-  if (::write(state_->stop.get(), &one, sizeof one) != sizeof one) giveUp("cannot stop a reactor");
-  for (std::thread& thread : state_->threads) thread.join();
+  state_->stop();
 
   std::map<std::uint64_t, Watched> left;
   {
     const std::lock_guard lock(state_->mutex);
     left.swap(state_->watches);
-    for (const auto& [key, watched] : left) ::epoll_ctl(state_->epoll.get(), EPOLL_CTL_DEL, watched.descriptor, nullptr);
+    for (const auto& [key, watched] : left) state_->syncRemove(key, watched);
   }
   left.clear();
   while (true) {
@@ -214,16 +335,15 @@ Reactor::~Reactor() {
   }
 }
 
-std::shared_ptr<Reactor::Registration> Reactor::watch(int descriptor, std::uint32_t events, Handler handler) {
-  const std::lock_guard lock(state_->mutex);
-  const std::uint64_t key = state_->nextKey++;
-  epoll_event event{};
-  event.events = events | static_cast<std::uint32_t>(EPOLLONESHOT);
-  event.data.u64 = key;
-  if (::epoll_ctl(state_->epoll.get(), EPOLL_CTL_ADD, descriptor, &event) != 0) return nullptr;
-  // Armed even without events: a hang-up is told.
-  state_->watches.emplace(key, Watched{descriptor, std::make_shared<Handler>(std::move(handler)), events | EPOLLHUP});
-  return std::make_shared<Watch>(state_, key);
+bool Reactor::isRunning() const { return state_->isRunning; }
+
+std::shared_ptr<Reactor::Lane> Reactor::makeLane() { return std::make_shared<Lane>(); }
+
+std::shared_ptr<Reactor::Registration> Reactor::watch(int descriptor, std::uint32_t events, Handler handler, std::shared_ptr<Lane> lane) {
+  const std::optional<std::uint64_t> key =
+      state_->watch({descriptor, std::make_shared<Handler>(std::move(handler)), std::move(lane)}, events);
+  if (!key) return nullptr;
+  return std::make_shared<Watch>(state_, *key);
 }
 
 Reactor::Poster Reactor::poster() const {
