@@ -1,4 +1,4 @@
-// How long a writer's identifier is held: as long as the extension is being told, whatever comes of that.
+// How long a writer's identifier is held: as long as the extension is being told, whatever comes of that; and when the telling has failed.
 #include <memory>
 
 #include "tests/providers/ProvidersTest.h"
@@ -15,8 +15,17 @@ class ToldTest : public ProvidersTest {
     EXPECT_TRUE(provider);
   }
 
+  class Notice final : public QXWriteNotice {
+   public:
+    explicit Notice(int& failures) : failures_(failures) {}
+    void failed() override { ++failures_; }
+
+   private:
+    int& failures_;
+  };
+
   void tell(const QXURL& url) {
-    auto held = std::make_shared<int>();
+    auto held = std::make_shared<Notice>(failures);
     watched = held;
     provider->_writerWithID({"writer-3", std::move(held)}, url);
   }
@@ -27,7 +36,8 @@ class ToldTest : public ProvidersTest {
   std::shared_ptr<TracingExtension> cellar;
   std::shared_ptr<DVExtensionDocuvend> provider;
   const QXURL url = FakePlatform::itemURL(kCellar, "report.txt");
-  std::weak_ptr<const int> watched;
+  std::weak_ptr<const QXWriteNotice> watched;
+  int failures = 0;
 };
 
 TEST_F(ToldTest, TheWriterIsHeldUntilTheExtensionHasAnswered) {
@@ -36,6 +46,7 @@ TEST_F(ToldTest, TheWriterIsHeldUntilTheExtensionHasAnswered) {
   cellar->vendor().answerLast({QXValue()});
   letGo();
   EXPECT_FALSE(isHeld());
+  EXPECT_EQ(failures, 0);
 }
 
 TEST_F(ToldTest, TheWriterIsHeldUntilTheExtensionHasRefused) {
@@ -44,6 +55,7 @@ TEST_F(ToldTest, TheWriterIsHeldUntilTheExtensionHasRefused) {
   cellar->vendor().answerLast({QXValue(QXError::make("TestDomain", 7, "broken"))});
   letGo();
   EXPECT_FALSE(isHeld());
+  EXPECT_EQ(failures, 0) << "it has heard of it";
 }
 
 TEST_F(ToldTest, TheWriterIsHeldUntilTheMessageIsLost) {
@@ -52,6 +64,7 @@ TEST_F(ToldTest, TheWriterIsHeldUntilTheMessageIsLost) {
   cellar->vendor().failLastDelivery(QXError::make("TestDomain", 8, "lost"));
   letGo();
   EXPECT_FALSE(isHeld());
+  EXPECT_EQ(failures, 1);
 }
 
 TEST_F(ToldTest, TheWriterIsHeldUntilTheRequestCannotBegin) {
@@ -60,12 +73,14 @@ TEST_F(ToldTest, TheWriterIsHeldUntilTheRequestCannotBegin) {
   EXPECT_TRUE(isHeld());
   cellar->failHeldBegin(QXError::make("TestDomain", 7, "broken"));
   EXPECT_FALSE(isHeld());
+  EXPECT_EQ(failures, 1);
 }
 
 TEST_F(ToldTest, TheWriterIsHeldUntilThereIsNoContext) {
   cellar->setHasContexts(false);
   tell(url);
   EXPECT_FALSE(isHeld());
+  EXPECT_EQ(failures, 1);
 }
 
 TEST_F(ToldTest, TheWriterOfNobodysFileIsNotHeld) {
@@ -73,6 +88,7 @@ TEST_F(ToldTest, TheWriterOfNobodysFileIsNotHeld) {
   EXPECT_FALSE(isHeld());
   tell(FakePlatform::storageURL(kCellar));
   EXPECT_FALSE(isHeld());
+  EXPECT_EQ(failures, 0);
 }
 
 }  // namespace

@@ -26,18 +26,25 @@ LogSubject::Name subjectOf(const AccessHolder& holder) {
 }  // namespace
 
 // Whoever drops the last reference ends it, and never while the coordinator has its lock.
-class LinuxFileCoordinator::NoticeUnderWay {
+class LinuxFileCoordinator::NoticeUnderWay final : public QXWriteNotice {
  public:
   NoticeUnderWay(LinuxFileCoordinator& coordinator, std::shared_ptr<QXDocuvend> provider, FileKey file)
       : coordinator_(coordinator), provider_(std::move(provider)), file_(std::move(file)) {}
-  NoticeUnderWay(const NoticeUnderWay&) = delete;
-  NoticeUnderWay& operator=(const NoticeUnderWay&) = delete;
-  ~NoticeUnderWay() { coordinator_.noticeHasEnded(provider_, file_); }
+  ~NoticeUnderWay() override {
+    if (hasFailed_) {
+      coordinator_.noticeHasFailed(provider_, file_);
+    } else {
+      coordinator_.noticeHasEnded(provider_, file_);
+    }
+  }
+
+  void failed() override { hasFailed_ = true; }
 
  private:
   LinuxFileCoordinator& coordinator_;
   const std::shared_ptr<QXDocuvend> provider_;
   const FileKey file_;
+  std::atomic<bool> hasFailed_ = false;
 };
 
 std::optional<ChangeNotices::Owner> FileOwner::known() const {
@@ -219,7 +226,7 @@ void LinuxFileCoordinator::tellFinishedWriting(const FileOwner& owner, const Acc
 void LinuxFileCoordinator::begin(const ChangeNotices::Notice& notice, std::function<void()> told) {
   const auto& [provider, file, writer] = notice;
   const LogSubject subject(subjectOf(writer));
-  auto untilTold = std::make_shared<const NoticeUnderWay>(*this, provider, file.key);
+  auto untilTold = std::make_shared<NoticeUnderWay>(*this, provider, file.key);
   onItsQueue(*provider, [provider = provider, name = nameFor("writer", writer.processIdentifier), untilTold = std::move(untilTold),
                          url = file.url, told = std::move(told)]() mutable {
     provider->_writerWithID({std::move(name), std::move(untilTold)}, url);
@@ -234,6 +241,30 @@ void LinuxFileCoordinator::noticeHasEnded(const std::shared_ptr<QXDocuvend>& pro
     next = notices_.end(provider, file);
   }
   for (const ChangeNotices::Notice& notice : next) begin(notice, /*told=*/{});
+}
+
+// Until the next try the notice is under way as far as anybody knows: what holds it is the task that waits for that.
+void LinuxFileCoordinator::noticeHasFailed(const std::shared_ptr<QXDocuvend>& provider, const FileKey& file) {
+  std::optional<ChangeNotices::Failed> failed;
+  if (outside_.later) {
+    const std::lock_guard lock(mutex_);
+    failed = notices_.fail(provider, file);
+  }
+  if (failed && failed->wait) {
+    outside_.later(*failed->wait, [again = std::make_shared<NoticeUnderWay>(*this, provider, file)]() mutable { again.reset(); });
+    return;
+  }
+  if (failed) {
+    const auto& [gone, written, writer] = failed->notice;
+    const LogSubject subject(subjectOf(writer));
+    logError("The extension " + provider->_fileReactorID().value_or("(null)") + " was never told that the item at URL " +
+             written.url.absoluteString() + " has changed.");
+  }
+  noticeHasEnded(provider, file);
+}
+
+void LinuxFileCoordinator::logError(const std::string& text) const {
+  if (outside_.log != nullptr) outside_.log->write(QXLogType::fault, "[ERROR] " + text);
 }
 
 }  // namespace docuvend::linux_platform

@@ -5,14 +5,16 @@
 // meanwhile it is told when it is registered.
 //
 // An object that is being told of a file's change is not told of that file again until it lets go of the writer's identifier, and is then
-// if the file was written meanwhile; nor of any number of files at a time (ChangeNotices.h). What it was still to be told when it is
-// removed is told to the next one that is registered for the file.
+// if the file was written meanwhile; nor of any number of files at a time (ChangeNotices.h). What it could not be told it is told again
+// after a while, a limited number of times. What it was still to be told when it is removed is told to the next one that is registered for
+// the file.
 //
 // May be used from any thread. Provider objects are called with no lock held, on their own operation queues; one that has none is called
 // on the caller's thread. Outlives every writer's identifier that an object may hold.
 #pragma once
 
 #include <atomic>
+#include <chrono>
 #include <cstddef>
 #include <cstdint>
 #include <functional>
@@ -28,6 +30,8 @@
 #include "platform/linux/coordination/AccessHolder.h"
 #include "platform/linux/coordination/ChangeNotices.h"
 #include "platform/linux/coordination/FileKey.h"
+#include "platform/log.h"
+#include "platform/queue.h"
 
 namespace docuvend::linux_platform {
 
@@ -58,6 +62,10 @@ class LinuxFileCoordinator final : public QXFileCoordinator {
     std::function<bool(const KeyedFile&)> isInPlace = {};
     // Whether a file of nobody's is a placeholder that a provider has left behind. Never when empty.
     std::function<bool(const KeyedFile&)> isRemnant = {};
+    // Runs the task that much later. When empty nothing is told again.
+    std::function<void(std::chrono::milliseconds delay, QXTask task)> later = {};
+    // For what nobody else hears of. Null: nothing is logged.
+    QXLogHandle* log = nullptr;
   };
 
   // The file system outlives it.
@@ -105,9 +113,11 @@ class LinuxFileCoordinator final : public QXFileCoordinator {
   [[nodiscard]] bool contains(const QXURL& directory, const QXURL& file, DirectoryItself itself, std::optional<QXError>& failure) const;
   void begin(const ChangeNotices::Notice& notice, std::function<void()> told);
   void noticeHasEnded(const std::shared_ptr<QXDocuvend>& provider, const FileKey& file);
+  void noticeHasFailed(const std::shared_ptr<QXDocuvend>& provider, const FileKey& file);
   void tellUntold();
   void registrationsChanged();
   void callHandler();
+  void logError(const std::string& text) const;
   // Never used before.
   [[nodiscard]] std::string nameFor(const char* role, int process);
 
