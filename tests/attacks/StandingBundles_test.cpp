@@ -126,6 +126,36 @@ TEST_F(BundleAttacks, AGroupIsTakenOverNeitherByItsNameNorByALongerOneNorByWhatC
   eventually("the owner has its storage again", [this] { return house_.ctl({"bookmark", letter_}).status == 0; });
 }
 
+// The daemon sees the thief first, and the owner is named as a member.
+TEST_F(BundleAttacks, AGroupIsNotTakenByWhoComesBeforeItsOwner) {
+  const std::string thief = "com.orvane";
+  fs::rename(house_.bundles() + "/" + kCellar, house_.home() + "/owner");
+  claimGroup(thief);
+  house_.startDaemon();
+  EXPECT_TRUE(
+      house_.awaitLog("[ERROR] The bundle " + thief + " may not name members of the group " + kGroup + ", which is " + kCellar + "'s."));
+  EXPECT_EQ(says(thief, {"put", house_.storage(kCellar) + "/stolen", "x"}), Lines{"ENOENT\n"});
+  const Ending installed = house_.ctl({"install", house_.home() + "/owner"});
+  EXPECT_EQ(installed.status, 0) << installed.errors;
+  eventually("the owner provides", [this] { return house_.ctl({"bookmark", letter_}).status == 0; });
+  expectNothingOfTheGroup(thief);
+  EXPECT_EQ(says(thief, {"read", letter_, "contents"}), Lines{"ENOENT\nEBADF\n"});
+}
+
+TEST_F(BundleAttacks, WhoComesBeforeTheOwnerOfTheGroupThatItClaimsIsNotInstalled) {
+  house_.startDaemon();
+  EXPECT_EQ(house_.ctl({"uninstall", kCellar}).status, 0);
+  claimGroup("com.orvane");
+  const std::string away = house_.home() + "/thief";
+  fs::rename(house_.bundles() + "/com.orvane", away);
+  const Ending refused = house_.ctl({"install", away});
+  EXPECT_NE(refused.status, 0);
+  EXPECT_NE(refused.errors.find("The bundle com.orvane may not name members of the group " + kGroup + ", which is " + kCellar + "'s."),
+            std::string::npos)
+      << refused.errors;
+  EXPECT_FALSE(fs::exists(house_.bundles() + "/com.orvane"));
+}
+
 TEST_F(BundleAttacks, AnIdentifierOfOneWordIsNone) {
   claim("com", "com", groupEntries_, {});
   house_.startDaemon();
@@ -144,7 +174,8 @@ TEST_F(BundleAttacks, WhatClaimsAnothersGroupIsNotInstalled) {
   for (const bool isOwnerThere : {true, false}) {
     const Ending ending = house_.ctl({"install", away});
     EXPECT_NE(ending.status, 0) << isOwnerThere;
-    EXPECT_NE(ending.errors.find("may not belong to the group " + kGroup + ", which is " + kCellar + "'s."), std::string::npos)
+    const std::string what = isOwnerThere ? "belong to" : "name members of";
+    EXPECT_NE(ending.errors.find("may not " + what + " the group " + kGroup + ", which is " + kCellar + "'s."), std::string::npos)
         << ending.errors;
     EXPECT_FALSE(fs::exists(house_.bundles() + "/" + thief));
     if (isOwnerThere) {

@@ -32,7 +32,6 @@ class BundleHouse {
     paths.userBundles = share + "/bundles";
     paths.containers = share + "/containers";
     paths.groupContainers = share + "/groups";
-    paths.groupOwners = share + "/group-owners";
     paths.runtime = root_ + "/run/docuvend";
     paths.publicSockets = paths.runtime + "/public";
     paths.lockState = paths.runtime + "/lock-state";

@@ -29,13 +29,5 @@ TEST(BundleIdentifier, HasSeveralPartsWhenItHasADot) {
   EXPECT_FALSE(hasSeveralParts("com"));
 }
 
-TEST(BundleIdentifier, ReachesToTheNextDot) {
-  EXPECT_FALSE(isBelowIdentifier("com.a", "com.a")) << "a group of that name would be of whoever takes it for an identifier";
-  EXPECT_TRUE(isBelowIdentifier("com.a.documents", "com.a"));
-  EXPECT_FALSE(isBelowIdentifier("com.ab", "com.a"));
-  EXPECT_FALSE(isBelowIdentifier("com", "com.a"));
-  EXPECT_FALSE(isBelowIdentifier("group.com.a", "com.a"));
-}
-
 }  // namespace
 }  // namespace docuvend::linux_platform

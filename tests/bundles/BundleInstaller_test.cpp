@@ -164,32 +164,44 @@ TEST_F(BundleInstallerTest, AnIdentifierOfTheSystemsIsRefused) {
 
 TEST_F(BundleInstallerTest, ABundleThatClaimsWhatIsAnothersIsRefusedWithTheReason) {
   const std::string docs = BundleHouse::entry("QXGroups", BundleHouse::array({"org.owner.one.docs"}));
-  const std::string list =
-      BundleHouse::entry("QXGroupMembers", "<dict><key>org.owner.one.docs</key>" + BundleHouse::array({"org.a"}) + "</dict>");
   const std::string whose = " the group org.owner.one.docs, which is org.owner.one's.";
-  const auto expectRefused = [&](const std::string& where) {
+  for (const std::string& owner : {user("owner"), house_.paths.systemBundles + "/owner"}) {
+    BundleHouse::install(owner, "org.owner.one", docs);
     for (const std::string& claimant : {std::string("org.a"), std::string("org.owner.one.docs"), std::string("org.owner")}) {
       BundleHouse::install(source_, claimant, docs);
       EXPECT_THAT(refusal(BundleErrorCode::notItsOwn, source_), EndsWith(": The bundle " + claimant + " may not belong to" + whose))
-          << where;
+          << owner;
     }
-    BundleHouse::install(source_, "org.a", list);
-    EXPECT_THAT(refusal(BundleErrorCode::notItsOwn, source_), EndsWith(": The bundle org.a may not name members of" + whose)) << where;
-  };
-  BundleHouse::install(user("owner"), "org.owner.one", docs);
-  expectRefused("nothing is recorded yet");
-  (void)house_.scan();
-  fs::remove_all(user("owner"));
-  expectRefused("only the record is left");
-  fs::remove(house_.paths.groupOwners + "/org.owner.one.docs");
-  BundleHouse::install(house_.paths.systemBundles + "/owner", "org.owner.one", docs);
-  expectRefused("the system's");
+    fs::remove_all(owner);
+  }
 }
 
-TEST_F(BundleInstallerTest, WhoIsNamedAsAMemberMayBeInstalledAndWhoWaitsForAnOwnerToo) {
+TEST_F(BundleInstallerTest, ABundleThatNamesMembersOfWhatIsAnothersIsRefusedAlsoWhenThatOneIsNotThereYet) {
+  const std::string list =
+      BundleHouse::entry("QXGroupMembers", "<dict><key>org.owner.one.docs</key>" + BundleHouse::array({"org.owner.one"}) + "</dict>");
+  for (const std::string& claimant : {std::string("org.a"), std::string("org.owner.one.docs"), std::string("org.owner")}) {
+    BundleHouse::install(source_, claimant, list);
+    EXPECT_THAT(refusal(BundleErrorCode::notItsOwn, source_),
+                EndsWith(": The bundle " + claimant + " may not name members of the group org.owner.one.docs, which is org.owner.one's."));
+  }
+  BundleHouse::install(source_, "org.owner.one", list);
+  EXPECT_EQ(installed(source_).outcome, Outcome::installed);
+}
+
+TEST_F(BundleInstallerTest, AGroupThatNobodyCanOwnIsRefused) {
+  for (const std::string& group : {std::string("documents"), std::string("org.documents")}) {
+    BundleHouse::install(source_, "org.a", BundleHouse::entry("QXGroups", BundleHouse::array({group})));
+    EXPECT_THAT(refusal(BundleErrorCode::notItsOwn, source_),
+                EndsWith(": The bundle org.a may not belong to the group " + group +
+                         ", which is nobody's: a group's name is its owner's identifier and one part more."));
+  }
+}
+
+TEST_F(BundleInstallerTest, WhoIsNamedAsAMemberMayBeInstalledAndWhoWaitsForTheOwnerToo) {
   const std::string docs = BundleHouse::entry("QXGroups", BundleHouse::array({"org.owner.docs"}));
   BundleHouse::install(source_, "org.a", docs);
-  EXPECT_EQ(installed(source_).outcome, Outcome::installed) << "nobody owns it";
+  EXPECT_EQ(installed(source_).outcome, Outcome::installed) << "the owner is not there yet";
+  EXPECT_TRUE(house_.scan().at("org.a").groups.empty());
   BundleHouse::install(user("owner"), "org.owner",
                        BundleHouse::entry("QXGroupMembers", "<dict><key>org.owner.docs</key>" + BundleHouse::array({"org.a"}) + "</dict>"));
   EXPECT_EQ(installed(source_).outcome, Outcome::updated);

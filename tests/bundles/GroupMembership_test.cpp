@@ -3,112 +3,86 @@
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
 
-#include "tests/bundles/BundleHouse.h"
-
 namespace docuvend::linux_platform {
 namespace {
 
 using ::testing::ElementsAre;
-using ::testing::HasSubstr;
 using ::testing::IsEmpty;
+using Reason = GroupMembership::Refusal::Reason;
 
-ParsedBundle named(const std::string& identifier, BundleOrigin origin = BundleOrigin::user) {
+ParsedBundle named(const std::string& identifier) {
   ParsedBundle parsed;
   parsed.bundle.identifier = identifier;
-  parsed.origin = origin;
   return parsed;
 }
 
-std::string ownerOf(const std::string& group, const std::vector<ParsedBundle>& bundles) {
-  const auto* owner = ownerByName(group, bundles);
-  return owner == nullptr ? "" : owner->bundle.identifier;
+// Empty when the bundle may belong to the group.
+std::string textOf(const std::optional<GroupMembership::Refusal>& refusal) { return refusal ? refusal->text : ""; }
+
+TEST(GroupMembership, TheNameTellsTheOneThatCanOwnAGroup) {
+  EXPECT_EQ(ownerOfGroup("org.a.documents"), "org.a");
+  EXPECT_EQ(ownerOfGroup("org.a.b.documents"), "org.a.b");
+  EXPECT_EQ(ownerOfGroup("org.a.b"), "org.a");
+  EXPECT_EQ(ownerOfGroup("org.a"), std::nullopt) << "its owner would have a single part";
+  EXPECT_EQ(ownerOfGroup("documents"), std::nullopt);
 }
 
-class GroupMembershipTest : public ::testing::Test {
- protected:
-  void record(const std::string& group, const std::string& owner) const {
-    const auto recorded = owners_.record(group, owner);
-    ASSERT_TRUE(std::holds_alternative<std::string>(recorded)) << std::get<QXError>(recorded).description();
-  }
-  // Empty when the bundle may belong to the group.
-  [[nodiscard]] std::string refusal(const std::string& identifier, const std::string& group,
-                                    const std::vector<ParsedBundle>& bundles) const {
-    const auto answer = GroupMembership(bundles, owners_).admit(identifier, group);
-    const auto* refusal = std::get_if<GroupMembership::Refusal>(&answer);
-    return refusal == nullptr ? "" : refusal->text;
-  }
-
-  BundleHouse house_;
-  const GroupOwners owners_{house_.paths.groupOwners};
-};
-
-TEST_F(GroupMembershipTest, TheLongestBeginningOwnsAGroupAndTheWholeNameIsNone) {
-  const std::vector<ParsedBundle> bundles = {named("org.a"), named("org.a.b"), named("org.a.bc"), named("org.a.b.documents")};
-  EXPECT_EQ(ownerOf("org.a.documents", bundles), "org.a");
-  EXPECT_EQ(ownerOf("org.a.b.documents", bundles), "org.a.b");
-  EXPECT_EQ(ownerOf("org.a.bc", bundles), "org.a");
-  EXPECT_EQ(ownerOf("org.a", bundles), "");
-  EXPECT_EQ(ownerOf("group.org.a", bundles), "");
-  EXPECT_EQ(ownerOf("org.abc", bundles), "");
-}
-
-TEST_F(GroupMembershipTest, ABundleOfTheSystemsComesBeforeALongerOneOfTheUsers) {
-  const auto users = named("org.a.b");
-  const auto systems = named("org.a", BundleOrigin::system);
-  const auto longer = named("org.a.b.c", BundleOrigin::system);
-  for (const auto& bundles : {std::vector{users, systems}, std::vector{systems, users}}) {
-    EXPECT_EQ(ownerOf("org.a.b.documents", bundles), "org.a");
-  }
-  EXPECT_EQ(ownerOf("org.a.b.c.documents", {longer, systems}), "org.a.b.c");
-  EXPECT_EQ(ownerOf("org.a.b.c.documents", {systems, longer}), "org.a.b.c");
-}
-
-TEST_F(GroupMembershipTest, OnlyTheOwnerAndWhomItNamesBelong) {
+TEST(GroupMembership, OnlyTheOwnerAndWhomItNamesBelong) {
   auto owner = named("org.a");
   owner.groupMembers["org.a.one"] = {"org.friend"};
   auto stranger = named("org.stranger");
   stranger.groupMembers["org.a.one"] = {"org.stranger"};
   const std::vector<ParsedBundle> bundles = {owner, stranger, named("org.friend")};
-  EXPECT_EQ(refusal("org.a", "org.a.one", bundles), "");
-  EXPECT_EQ(refusal("org.friend", "org.a.one", bundles), "");
-  EXPECT_EQ(refusal("org.friend", "org.a.two", bundles), "The bundle org.friend may not belong to the group org.a.two, which is org.a's");
-  EXPECT_EQ(refusal("org.stranger", "org.a.one", bundles),
-            "The bundle org.stranger may not belong to the group org.a.one, which is org.a's");
-  EXPECT_EQ(refusal("org.a", "com.b", bundles), "The bundle org.a may not belong to the group com.b");
+  const GroupMembership membership(bundles);
+  EXPECT_FALSE(membership.refusal("org.a", "org.a.one"));
+  EXPECT_FALSE(membership.refusal("org.friend", "org.a.one"));
+  EXPECT_EQ(textOf(membership.refusal("org.friend", "org.a.two")),
+            "The bundle org.friend may not belong to the group org.a.two, which is org.a's");
+  const auto refusal = membership.refusal("org.stranger", "org.a.one");
+  EXPECT_EQ(textOf(refusal), "The bundle org.stranger may not belong to the group org.a.one, which is org.a's");
+  EXPECT_EQ(refusal->reason, Reason::anothers);
 }
 
-TEST_F(GroupMembershipTest, TheRecordedOwnerKeepsItsGroupWhateverIsInstalled) {
-  record("org.a.b.documents", "org.a");
-  auto later = named("org.a.b", BundleOrigin::system);
-  later.groupMembers["org.a.b.documents"] = {"org.friend"};
-  auto owner = named("org.a");
+TEST(GroupMembership, NeitherAShorterBeginningNorALongerOneNorTheWholeNameOwnsAGroup) {
   const std::string group = "org.a.b.documents";
-  for (const std::string& other : {std::string("org.a.b"), std::string("org.friend")}) {
-    const std::string expected = "The bundle " + other + " may not belong to the group " + group + ", which is org.a's";
-    EXPECT_EQ(refusal(other, group, {owner, later}), expected);
-    EXPECT_EQ(refusal(other, group, {later}), expected) << "the owner is not installed";
+  for (const std::string& identifier : {std::string("org.a"), std::string("org.a.b.documents"), std::string("org.a.b.documents.x"),
+                                        std::string("org.a.bc"), std::string("org.a.b.document")}) {
+    auto claimant = named(identifier);
+    claimant.groupMembers[group] = {"org.a.b", identifier};
+    const std::vector<ParsedBundle> alone = {claimant};
+    const auto before = GroupMembership(alone).refusal(identifier, group);
+    ASSERT_TRUE(before) << identifier;
+    EXPECT_EQ(before->reason, Reason::ownerIsMissing);
+    const std::vector<ParsedBundle> both = {claimant, named("org.a.b")};
+    const auto after = GroupMembership(both).refusal(identifier, group);
+    ASSERT_TRUE(after) << identifier;
+    EXPECT_EQ(after->reason, Reason::anothers);
+    EXPECT_FALSE(GroupMembership(both).refusal("org.a.b", group));
   }
-  EXPECT_EQ(refusal("org.a", group, {owner, later}), "");
-  owner.groupMembers[group] = {"org.friend"};
-  EXPECT_EQ(refusal("org.friend", group, {owner, later}), "");
 }
 
-TEST_F(GroupMembershipTest, ARecordThatSaysNothingIsNobodysLeave) {
-  record("org.a.documents", "org.a");
-  BundleHouse::write(house_.paths.groupOwners + "/org.a.documents", "x");
-  EXPECT_THAT(refusal("org.a", "org.a.documents", {named("org.a")}), HasSubstr("It is not known whose the group org.a.documents is: "));
+TEST(GroupMembership, AGroupThatNobodyCanOwnHasNoMembers) {
+  auto bundle = named("org.a");
+  bundle.groupMembers["documents"] = {"org.a"};
+  const std::vector<ParsedBundle> bundles = {bundle};
+  const auto refusal = GroupMembership(bundles).refusal("org.a", "documents");
+  EXPECT_EQ(textOf(refusal),
+            "The bundle org.a may not belong to the group documents, which is nobody's: a group's name is its owner's identifier and one "
+            "part more");
+  EXPECT_EQ(refusal->reason, Reason::nobodys);
+  EXPECT_THAT(GroupMembership::foreignLists(bundle),
+              ElementsAre("The bundle org.a may not name members of the group documents, which is nobody's: a group's name is its owner's "
+                          "identifier and one part more"));
 }
 
-TEST_F(GroupMembershipTest, OnlyTheOwnerNamesMembers) {
+TEST(GroupMembership, OnlyTheOwnerNamesMembers) {
   auto owner = named("org.a");
   owner.groupMembers["org.a.documents"] = {"org.c"};
   auto other = named("org.b");
   other.groupMembers["org.a.documents"] = {"org.c"};
-  other.groupMembers["org.z.documents"] = {"org.c"};
-  const std::vector<ParsedBundle> bundles = {owner, other};
-  const GroupMembership membership(bundles, owners_);
-  EXPECT_THAT(membership.foreignLists(owner), IsEmpty());
-  EXPECT_THAT(membership.foreignLists(other),
+  other.groupMembers["org.b.documents"] = {"org.c"};
+  EXPECT_THAT(GroupMembership::foreignLists(owner), IsEmpty());
+  EXPECT_THAT(GroupMembership::foreignLists(other),
               ElementsAre("The bundle org.b may not name members of the group org.a.documents, which is org.a's"));
 }
 

@@ -48,7 +48,6 @@ std::variant<Paths, QXError> Paths::fromEnvironment() {
   paths.userBundles = share + "/bundles";
   paths.containers = share + "/containers";
   paths.groupContainers = share + "/groups";
-  paths.groupOwners = share + "/group-owners";
   paths.runtime = std::get<std::string>(runtime) + "/docuvend";
   paths.publicSockets = paths.runtime + "/public";
   paths.lockState = paths.runtime + "/lock-state";

@@ -15,7 +15,6 @@ struct Paths {
   std::string userBundles;      // home + "/.local/share/docuvend/bundles"
   std::string containers;       // home + "/.local/share/docuvend/containers"; one directory per bundle identifier
   std::string groupContainers;  // home + "/.local/share/docuvend/groups"; one directory per group
-  std::string groupOwners;      // home + "/.local/share/docuvend/group-owners"; one record per group
   std::string runtime;          // $XDG_RUNTIME_DIR + "/docuvend", mode 700
   std::string publicSockets;    // runtime + "/public": what confined processes see of it
   std::string lockState;        // runtime + "/lock-state"

@@ -1,8 +1,8 @@
 // An installed bundle: a directory with Info.plist and, beside it, Entitlements.plist.
 //
 // Info.plist holds the strings "QXBundleIdentifier" and "QXBundleExecutable" (a path relative to the bundle), the array of strings
-// "QXGroups" (groups that the bundle asks to belong to), the dictionary "QXGroupMembers" (of groups that this bundle owns: group to array
-// of other bundles' identifiers) and, for an extension, the dictionary "QXExtension".
+// "QXGroups" (groups that the bundle asks to belong to), the dictionary "QXGroupMembers" (of groups that this bundle owns, which are named
+// like it with one part more: group to array of other bundles' identifiers) and, for an extension, the dictionary "QXExtension".
 #pragma once
 
 #include <functional>

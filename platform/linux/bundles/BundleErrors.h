@@ -18,7 +18,7 @@ enum class BundleErrorCode : std::int64_t {
   notPermitted = 4,  // the system's directory has a bundle of that identifier
   notFound = 5,      // no bundle of that identifier is installed
   inTheWay = 6,      // something else lies where the bundle is to be put
-  notItsOwn = 7,     // it claims a group that is another bundle's
+  notItsOwn = 7,     // it claims a group that is not its own, or to say who its members are
 };
 
 [[nodiscard]] inline QXError bundleError(BundleErrorCode code, std::string description) {

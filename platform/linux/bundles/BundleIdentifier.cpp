@@ -17,8 +17,4 @@ bool isBundleIdentifier(std::string_view text) {
 
 bool hasSeveralParts(std::string_view identifier) { return identifier.find('.') != std::string_view::npos; }
 
-bool isBelowIdentifier(std::string_view name, std::string_view identifier) {
-  return name.size() > identifier.size() && name.starts_with(identifier) && name[identifier.size()] == '.';
-}
-
 }  // namespace docuvend::linux_platform

@@ -11,10 +11,7 @@ inline constexpr std::size_t kLongestIdentifier = 128;
 // Parts of letters, digits and "-" joined by single dots, not beginning with "-", at most kLongestIdentifier bytes.
 [[nodiscard]] bool isBundleIdentifier(std::string_view text);
 
-// True when a well-formed identifier has a dot: a single word would begin the groups of everybody whose names begin with it.
+// True when a well-formed identifier has a dot: a single word would be the name of everything that begins with it.
 [[nodiscard]] bool hasSeveralParts(std::string_view identifier);
-
-// True when `name` begins with `identifier` and a dot.
-[[nodiscard]] bool isBelowIdentifier(std::string_view name, std::string_view identifier);
 
 }  // namespace docuvend::linux_platform

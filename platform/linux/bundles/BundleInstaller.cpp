@@ -74,16 +74,14 @@ std::vector<ParsedBundle> bundlesWith(const ParsedBundle& bundle, const Paths& p
 
 std::optional<QXError> refuseWhatIsAnothers(const ParsedBundle& bundle, const Paths& paths, QXPropertyLists& propertyLists) {
   const auto bundles = bundlesWith(bundle, paths, propertyLists);
-  const GroupOwners owners(paths.groupOwners);
-  const GroupMembership membership(bundles, owners);
+  const GroupMembership membership(bundles);
   for (const std::string& group : bundle.wantedGroups) {
-    const auto answer = membership.admit(bundle.bundle.identifier, group);
-    const auto* refusal = std::get_if<GroupMembership::Refusal>(&answer);
-    // Without an owner the bundle may wait for one.
-    if (refusal == nullptr || refusal->reason == GroupMembership::Refusal::Reason::noOwner) continue;
+    const auto refusal = membership.refusal(bundle.bundle.identifier, group);
+    // The bundle may wait for the owner.
+    if (!refusal || refusal->reason == GroupMembership::Refusal::Reason::ownerIsMissing) continue;
     return bundleError(BundleErrorCode::notItsOwn, refusal->text + ".");
   }
-  const auto lists = membership.foreignLists(bundle);
+  const auto lists = GroupMembership::foreignLists(bundle);
   if (lists.empty()) return std::nullopt;
   return bundleError(BundleErrorCode::notItsOwn, lists.front() + ".");
 }

@@ -10,10 +10,11 @@
 // writable by the user, and executable if the original is; it has no attributes of the original beside that. Anything else in a bundle is
 // refused, and so is one that is larger than an installer takes (BundleCopy.h).
 //
-// A bundle that claims a group of another's, or to say who its members are, is refused (GroupMembership.h). The user's directory is
-// made for the user alone, and closed to others who can write it.
+// A bundle that claims a group of another's or of nobody's, or to say who the members of one are, is refused (GroupMembership.h). The
+// user's directory is made for the user alone, and closed to others who can write it.
 //
-// A program that was started from the older copy or from a removed bundle keeps running, but opens no further file of its bundle.
+// A program that was started from the older copy or from a removed bundle keeps running, but opens no further file of its bundle, and is
+// nobody to the daemon (PeerIdentity.h).
 //
 // Containers and group containers are the user's data: they are neither made nor removed. May be used from any thread and from several
 // processes at once; a call waits until other installers are through.

@@ -7,6 +7,7 @@
 #include <system_error>
 #include <utility>
 
+#include "platform/linux/bundles/GroupMembership.h"
 #include "platform/linux/bundles/OwnDirectory.h"
 
 namespace docuvend::linux_platform {
@@ -145,35 +146,22 @@ void BundleScan::add(const ParsedBundle& parsed) {
 BundleMap BundleScan::resolve() {
   const std::string containers = realPath(paths_.containers);
   const std::string groupContainers = realPath(paths_.groupContainers);
-  const GroupMembership membership(found_, owners_);
+  const GroupMembership membership(found_);
   BundleMap result;
   for (const auto& parsed : found_) {
     Bundle bundle = parsed.bundle;
     bundle.container = containers + "/" + bundle.identifier;
     for (const auto& group : parsed.wantedGroups) {
-      if (!gives(membership.admit(bundle.identifier, group), group)) continue;
+      if (const auto refusal = membership.refusal(bundle.identifier, group)) {
+        report("[ERROR] " + refusal->text + ".");
+        continue;
+      }
       if (bundle.groups.try_emplace(group, groupContainers + "/" + group).second) bundle.version += "/" + group;
     }
-    for (const auto& list : membership.foreignLists(parsed)) report("[ERROR] " + list + ".");
+    for (const auto& list : GroupMembership::foreignLists(parsed)) report("[ERROR] " + list + ".");
     result.emplace(bundle.identifier, std::move(bundle));
   }
   return result;
-}
-
-// Another process may have recorded another owner meanwhile; then it is not given, and the next look tells.
-bool BundleScan::gives(const GroupMembership::Answer& answer, const std::string& group) {
-  if (const auto* refusal = std::get_if<GroupMembership::Refusal>(&answer)) {
-    report("[ERROR] " + refusal->text + ".");
-    return false;
-  }
-  const auto& admission = std::get<GroupMembership::Admission>(answer);
-  if (admission.isRecorded) return true;
-  const auto recorded = owners_.record(group, admission.owner);
-  if (const auto* error = std::get_if<QXError>(&recorded)) {
-    report("[ERROR] Nobody gets the group " + group + ", because its owner cannot be recorded: " + error->description());
-    return false;
-  }
-  return std::get<std::string>(recorded) == admission.owner;
 }
 
 void BundleScan::report(const std::string& text) {

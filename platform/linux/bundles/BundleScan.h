@@ -9,8 +9,6 @@
 
 #include "platform/linux/base/Paths.h"
 #include "platform/linux/bundles/BundleParser.h"
-#include "platform/linux/bundles/GroupMembership.h"
-#include "platform/linux/bundles/GroupOwners.h"
 #include "platform/log.h"
 
 namespace docuvend::linux_platform {
@@ -21,13 +19,12 @@ using BundleMap = std::map<std::string, Bundle, std::less<>>;
 class BundleScan {
  public:
   BundleScan(const Paths& paths, QXPropertyLists& propertyLists, QXLogHandle& log)
-      : paths_(paths), owners_(paths.groupOwners), propertyLists_(propertyLists), log_(log) {}
+      : paths_(paths), propertyLists_(propertyLists), log_(log) {}
 
   // Every sound bundle of the system's and then of the user's directory. Of several with one identifier the system's wins, then the
   // first by name of directory. Directories whose name begins with "." are not looked at: an installer copies under such a name, then
   // renames. Links are no bundles, nor is what another user owns or can write (distrustOf). A directory of `unsettled` is not read: it
-  // counts as what the last look found there, and as nothing if that was no bundle. Creates nothing but the records of groups that are
-  // given out for the first time (GroupOwners.h); a group whose record cannot be made is given to nobody.
+  // counts as what the last look found there, and as nothing if that was no bundle. Creates nothing.
   [[nodiscard]] BundleMap run(const std::set<std::string>& unsettled = {});
 
  private:
@@ -36,11 +33,9 @@ class BundleScan {
   void scanDirectory(const std::string& root, BundleOrigin origin, const std::set<std::string>& unsettled, const Parsed& lastParsed);
   void add(const ParsedBundle& parsed);
   [[nodiscard]] BundleMap resolve();
-  [[nodiscard]] bool gives(const GroupMembership::Answer& answer, const std::string& group);
   void report(const std::string& text);
 
   const Paths paths_;
-  const GroupOwners owners_;
   QXPropertyLists& propertyLists_;
   QXLogHandle& log_;
 

@@ -8,62 +8,43 @@
 namespace docuvend::linux_platform {
 namespace {
 
-bool comesBefore(const ParsedBundle& one, const ParsedBundle& other) {
-  if (one.origin != other.origin) return one.origin == BundleOrigin::system;
-  return one.bundle.identifier.size() > other.bundle.identifier.size();
+// Goes on after the group's name.
+std::string whose(const std::optional<std::string>& owner) {
+  return owner ? ", which is " + *owner + "'s" : ", which is nobody's: a group's name is its owner's identifier and one part more";
+}
+
+bool names(const ParsedBundle& owner, const std::string& identifier, const std::string& group) {
+  const auto members = owner.groupMembers.find(group);
+  return members != owner.groupMembers.end() &&
+         std::find(members->second.begin(), members->second.end(), identifier) != members->second.end();
 }
 
 }  // namespace
 
-const ParsedBundle* ownerByName(const std::string& group, const std::vector<ParsedBundle>& bundles) {
-  const ParsedBundle* owner = nullptr;
-  for (const auto& candidate : bundles) {
-    if (!isBelowIdentifier(group, candidate.bundle.identifier)) continue;
-    if (owner == nullptr || comesBefore(candidate, *owner)) owner = &candidate;
-  }
-  return owner;
+std::optional<std::string> ownerOfGroup(std::string_view group) {
+  const auto owner = group.substr(0, group.rfind('.'));
+  if (owner.size() == group.size() || !hasSeveralParts(owner)) return std::nullopt;
+  return std::string(owner);
 }
 
-std::variant<std::optional<GroupMembership::Admission>, QXError> GroupMembership::ownerOf(const std::string& group) const {
-  auto recorded = owners_.ownerOf(group);
-  if (auto* error = std::get_if<QXError>(&recorded)) return std::move(*error);
-  if (auto& owner = std::get<std::optional<std::string>>(recorded)) return Admission{*std::move(owner), /*isRecorded=*/true};
-  const ParsedBundle* owner = ownerByName(group, bundles_);
-  if (owner == nullptr) return std::nullopt;
-  return Admission{owner->bundle.identifier, /*isRecorded=*/false};
-}
-
-bool GroupMembership::isNamed(const std::string& identifier, const std::string& group, const std::string& owner) const {
+std::optional<GroupMembership::Refusal> GroupMembership::refusal(const std::string& identifier, const std::string& group) const {
+  const auto owner = ownerOfGroup(group);
+  if (owner == identifier) return std::nullopt;
+  const std::string text = "The bundle " + identifier + " may not belong to the group " + group + whose(owner);
+  if (!owner) return Refusal{Refusal::Reason::nobodys, text};
   const auto manifest =
-      std::find_if(bundles_.begin(), bundles_.end(), [&owner](const ParsedBundle& parsed) { return parsed.bundle.identifier == owner; });
-  if (manifest == bundles_.end()) return false;
-  const auto members = manifest->groupMembers.find(group);
-  return members != manifest->groupMembers.end() &&
-         std::find(members->second.begin(), members->second.end(), identifier) != members->second.end();
+      std::find_if(bundles_.begin(), bundles_.end(), [&owner](const ParsedBundle& parsed) { return parsed.bundle.identifier == *owner; });
+  if (manifest == bundles_.end()) return Refusal{Refusal::Reason::ownerIsMissing, text};
+  if (names(*manifest, identifier, group)) return std::nullopt;
+  return Refusal{Refusal::Reason::anothers, text};
 }
 
-GroupMembership::Answer GroupMembership::admit(const std::string& identifier, const std::string& group) const {
-  auto found = ownerOf(group);
-  if (const auto* error = std::get_if<QXError>(&found)) {
-    return Refusal{Refusal::Reason::unknownOwner, "It is not known whose the group " + group + " is: " + error->description()};
-  }
-  std::string refusal = "The bundle " + identifier + " may not belong to the group " + group;
-  auto& admission = std::get<std::optional<Admission>>(found);
-  if (!admission) return Refusal{Refusal::Reason::noOwner, std::move(refusal)};
-  const std::string& owner = admission->owner;
-  if (owner == identifier || isNamed(identifier, group, owner)) return *std::move(admission);
-  refusal += ", which is " + owner + "'s";
-  return Refusal{Refusal::Reason::anothers, std::move(refusal)};
-}
-
-std::vector<std::string> GroupMembership::foreignLists(const ParsedBundle& bundle) const {
-  const std::string& identifier = bundle.bundle.identifier;
+std::vector<std::string> GroupMembership::foreignLists(const ParsedBundle& bundle) {
   std::vector<std::string> lists;
   for (const auto& [group, members] : bundle.groupMembers) {
-    const auto found = ownerOf(group);
-    const auto* owner = std::get_if<std::optional<Admission>>(&found);
-    if (owner == nullptr || !*owner || (*owner)->owner == identifier) continue;
-    lists.push_back("The bundle " + identifier + " may not name members of the group " + group + ", which is " + (*owner)->owner + "'s");
+    const auto owner = ownerOfGroup(group);
+    if (owner == bundle.bundle.identifier) continue;
+    lists.push_back("The bundle " + bundle.bundle.identifier + " may not name members of the group " + group + whose(owner));
   }
   return lists;
 }

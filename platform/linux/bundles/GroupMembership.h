@@ -1,52 +1,41 @@
 // Which bundle belongs to which group.
 //
-// A group has one owner: the bundle that is recorded, or, as long as none is, the one that the group's name begins with. To it belong the
-// owner, while it is installed, and the bundles that the owner's QXGroupMembers names for that group.
+// A group has one owner, which its name tells: the bundle whose identifier is the name without its last part. No other can become it, in
+// whatever order bundles are installed and removed. To the group belong the owner, while it is installed, and the bundles that the owner's
+// QXGroupMembers names for that group.
 #pragma once
 
 #include <optional>
 #include <string>
-#include <variant>
+#include <string_view>
 #include <vector>
 
 #include "platform/linux/bundles/BundleParser.h"
-#include "platform/linux/bundles/GroupOwners.h"
 
 namespace docuvend::linux_platform {
 
-// Of the bundles whose identifier and a dot begin the group's name, a bundle of the system's before one of the user's, and then the one
-// with the longest identifier; null when there is none.
-[[nodiscard]] const ParsedBundle* ownerByName(const std::string& group, const std::vector<ParsedBundle>& bundles);
+// The identifier of the owner of a group of that well-formed name; none when no bundle can have it.
+[[nodiscard]] std::optional<std::string> ownerOfGroup(std::string_view group);
 
-// Both outlive it. `bundles` has each identifier once.
+// The bundles outlive it; each identifier is there once.
 class GroupMembership {
  public:
-  struct Admission {
-    std::string owner;
-    bool isRecorded;  // that it is the owner
-  };
   struct Refusal {
-    enum class Reason { noOwner, anothers, unknownOwner };
+    enum class Reason { nobodys, ownerIsMissing, anothers };
     Reason reason;
     std::string text;  // a sentence without its full stop
   };
 
-  using Answer = std::variant<Admission, Refusal>;
+  explicit GroupMembership(const std::vector<ParsedBundle>& bundles) : bundles_(bundles) {}
 
-  GroupMembership(const std::vector<ParsedBundle>& bundles, const GroupOwners& owners) : bundles_(bundles), owners_(owners) {}
+  // Why the bundle, which is one of them or about to be, may not have the group's container; none when it may.
+  [[nodiscard]] std::optional<Refusal> refusal(const std::string& identifier, const std::string& group) const;
 
-  // Whether the bundle, which is one of them or about to be, may have the group's container.
-  [[nodiscard]] Answer admit(const std::string& identifier, const std::string& group) const;
-
-  // For each group of others whose members the bundle wants to name, a sentence without its full stop.
-  [[nodiscard]] std::vector<std::string> foreignLists(const ParsedBundle& bundle) const;
+  // For each group whose members the bundle wants to name without being its owner, a sentence without its full stop.
+  [[nodiscard]] static std::vector<std::string> foreignLists(const ParsedBundle& bundle);
 
  private:
-  [[nodiscard]] std::variant<std::optional<Admission>, QXError> ownerOf(const std::string& group) const;
-  [[nodiscard]] bool isNamed(const std::string& identifier, const std::string& group, const std::string& owner) const;
-
   const std::vector<ParsedBundle>& bundles_;
-  const GroupOwners& owners_;
 };
 
 }  // namespace docuvend::linux_platform
