@@ -109,13 +109,15 @@ CommandGroup bundleCommands() {
                {},
                "install or update the bundle that DIRECTORY holds",
                "It is copied for this user and takes its place in one step, also while the daemon runs. Its containers stay as they are.\n"
+               "The daemon refuses processes of the older version from then on: start them again.\n"
                "Prints: bundle, directory, outcome (installed or updated).\n",
                install},
               {"uninstall",
                "BUNDLE",
                {{"--remove-grants", "", "take back all grants that name BUNDLE, also when it is gone already; needs the running daemon"}},
                "remove an installed bundle of this user",
-               "Its containers stay. So do grants that name it, and a later bundle of that name inherits them, unless they are removed.\n"
+               "The daemon refuses its processes from then on. Its containers stay. So do grants that name it, and a later bundle of\n"
+               "that name inherits them, unless they are removed.\n"
                "Prints: bundle, and remainingGrants or removedGrants, a list: provider, item, consumer. Which grants remain is unknown\n"
                "(null) when the daemon cannot be asked.\n",
                uninstall},

@@ -142,16 +142,36 @@ void LinuxRpcListener::admit(UniqueDescriptor socket) {
   }
   CallRules rules = rulesFor(*peer, admission);
   const std::uint64_t number = nextNumber_++;
-  auto connection =
-      LinuxRpcConnection::create(surroundings_.reactor, surroundings_.peers, surroundings_.log, std::move(peer), std::move(socket),
-                                 std::move(rules), service_.straightBelow, [weak = weak_from_this(), number](const QXError&) {
-                                   if (const auto strongSelf = weak.lock()) strongSelf->forget(number);
-                                 });
+  auto connection = LinuxRpcConnection::create(surroundings_.reactor, surroundings_.peers, surroundings_.log, peer, std::move(socket),
+                                               std::move(rules), service_.straightBelow, [weak = weak_from_this(), number](const QXError&) {
+                                                 if (const auto strongSelf = weak.lock()) strongSelf->forget(number);
+                                               });
   {
     const std::lock_guard lock(mutex_);
-    accepted_.emplace(number, Accepted{connection, std::move(admission.place)});
+    accepted_.emplace(number, Accepted{connection, peer, std::move(admission.place)});
   }
+  // Its bundle may have gone since the peer was looked at, and the others of that bundle been ended before this one was among them.
+  if (!surroundings_.peers.isCurrent(*peer)) return end(*connection, *peer);
   offer(connection);
+}
+
+void LinuxRpcListener::endOutdated() {
+  std::vector<std::pair<std::shared_ptr<LinuxRpcConnection>, std::shared_ptr<const PeerIdentity>>> all;
+  {
+    const std::lock_guard lock(mutex_);
+    for (const auto& [number, accepted] : accepted_) all.emplace_back(accepted.connection, accepted.peer);
+  }
+  for (const auto& [connection, peer] : all) {
+    if (!surroundings_.peers.isCurrent(*peer)) end(*connection, *peer);
+  }
+}
+
+void LinuxRpcListener::end(LinuxRpcConnection& connection, const PeerIdentity& peer) const {
+  const LogSubject subject(logSubjectFor(peer));
+  const std::string reason = "its bundle " + countedAs(peer) + " was removed or replaced";
+  surroundings_.log.write(QXLogType::defaultType,
+                          "[NOTICE] Closing the connection of PID " + std::to_string(peer.pid) + ": " + reason + ".");
+  connection.close(refusal(reason));
 }
 
 // A declared bundle changes nothing here: it comes later, and only from an unconfined process.

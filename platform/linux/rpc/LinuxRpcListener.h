@@ -51,9 +51,13 @@ class LinuxRpcListener final : public QXRpcListener, public std::enable_shared_f
   void setDelegate(std::weak_ptr<QXRpcListenerDelegate> delegate) override;
   void resume() override;
 
+  // Ends the connections of peers that are not what they were any more (PeerDirectory).
+  void endOutdated();
+
  private:
   struct Accepted {
     std::shared_ptr<LinuxRpcConnection> connection;
+    std::shared_ptr<const PeerIdentity> peer;  // as it connected
     std::unique_ptr<ConnectionLimiter::Place> place;
   };
 
@@ -65,6 +69,7 @@ class LinuxRpcListener final : public QXRpcListener, public std::enable_shared_f
   [[nodiscard]] CallRules rulesFor(const PeerIdentity& peer, ConnectionLimiter::Admission& admission) const;
   void refuseOutsider(const PeerIdentity& peer, UniqueDescriptor socket);
   void refuse(UniqueDescriptor socket, std::string reason) const;
+  void end(LinuxRpcConnection& connection, const PeerIdentity& peer) const;
   void offer(const std::shared_ptr<LinuxRpcConnection>& connection);
   void forget(std::uint64_t number);
 

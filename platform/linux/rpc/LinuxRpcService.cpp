@@ -36,7 +36,25 @@ void LinuxRpcService::giveUp(const std::string& name, const QXError& error) cons
 std::shared_ptr<QXRpcListener> LinuxRpcService::listenerForService(const std::string& name) {
   const auto found = services_.find(name);
   if (found == services_.end()) giveUp(name, QXError::system(ENOENT, "no socket is known for it"));
-  const auto& [socketPath, audience, straightBelow, operationsForNobody, releasing] = found->second;
+  auto listener = makeListener(name, found->second);
+  const std::lock_guard lock(mutex_);
+  listeners_.push_back(listener);
+  return listener;
+}
+
+void LinuxRpcService::endOutdatedConnections() {
+  std::vector<std::weak_ptr<LinuxRpcListener>> listeners;
+  {
+    const std::lock_guard lock(mutex_);
+    listeners = listeners_;
+  }
+  for (const auto& weakListener : listeners) {
+    if (const auto strongListener = weakListener.lock()) strongListener->endOutdated();
+  }
+}
+
+std::shared_ptr<LinuxRpcListener> LinuxRpcService::makeListener(const std::string& name, const NamedService& named) {
+  const auto& [socketPath, audience, straightBelow, operationsForNobody, releasing] = named;
   LinuxRpcListener::Surroundings surroundings{reactor_, peers_, log_, limiter_};
   LinuxRpcListener::Service service{name, audience, straightBelow, operationsForNobody, releasing};
   if (auto passed = takePassedSocket(name)) {

@@ -16,6 +16,8 @@
 
 namespace docuvend::linux_platform {
 
+class LinuxRpcListener;
+
 class LinuxRpcService final : public QXRpcService {
  public:
   // A passed socket serves the name that the service manager calls it by or that ends its path; nothing is bound then. The reactor, the
@@ -26,10 +28,14 @@ class LinuxRpcService final : public QXRpcService {
   // The caller owns the listener. A name that is none of the services' or whose socket cannot be bound ends the process, with one log line.
   [[nodiscard]] std::shared_ptr<QXRpcListener> listenerForService(const std::string& name) override;
 
+  // Ends the connections of confined peers whose bundle was removed or replaced; to be called when that may have happened.
+  void endOutdatedConnections();
+
   // The connections that are open now, to all services together.
   [[nodiscard]] std::size_t connectionCount() const { return limiter_->openConnections(); }
 
  private:
+  [[nodiscard]] std::shared_ptr<LinuxRpcListener> makeListener(const std::string& name, const NamedService& named);
   [[nodiscard]] UniqueDescriptor takePassedSocket(const std::string& name);
   [[noreturn]] void giveUp(const std::string& name, const QXError& error) const;
 
@@ -39,8 +45,9 @@ class LinuxRpcService final : public QXRpcService {
   const NamedServices services_;
   const std::shared_ptr<ConnectionLimiter> limiter_ = std::make_shared<ConnectionLimiter>();
 
-  std::mutex mutex_;
-  std::vector<ActivatedSocket> passedSockets_;  // not given to a listener yet
+  std::mutex mutex_;                                        // guards the rest
+  std::vector<ActivatedSocket> passedSockets_;              // not given to a listener yet
+  std::vector<std::weak_ptr<LinuxRpcListener>> listeners_;  // all that were made
 };
 
 }  // namespace docuvend::linux_platform
