@@ -109,5 +109,28 @@ TEST_F(Floods, OfLinesAreCutAndOthersAreStillToldOf) {
   EXPECT_EQ(house_.loggedContaining(" from bundle " + kAccomplice + " to consumer ID com.orvane.friend"), 1);
 }
 
+// Its provider is in league with it, and fails whenever it is asked.
+TEST_F(Floods, OfCoordinatedReadsThatFailAreCutInTheLogAndOthersAreStillToldOf) {
+  constexpr std::size_t kMany = 4 * LogAllowance::kLinesAtOnce;
+  const std::string failure = "[ERROR] Proxy failed to start providing item at URL ";
+  house_.installTrickster();
+  house_.startDaemon("");
+  const auto grantSour = [this](const std::string& consumer) {
+    const std::string path = house_.storage(kTrickster) + "/sour";
+    EXPECT_EQ(house_.confined(kPicker, {"grant", path, kTrickster, consumer}).status, 0);
+    return house_.bookmark(path);
+  };
+  const std::string string = grantSour(kAttacker);
+  (void)grantSour(kAccomplice);
+  const auto began = std::chrono::steady_clock::now();
+  EXPECT_THAT(attack({"misread", string, std::to_string(kMany)}), ElementsAre(std::to_string(kMany)));
+  const auto back = static_cast<std::size_t>((std::chrono::steady_clock::now() - began) / LogAllowance::kTimeForALine) + 1;
+  const auto lines = static_cast<std::size_t>(house_.loggedContaining(failure));
+  EXPECT_GE(lines, LogAllowance::kLinesAtOnce);
+  EXPECT_LE(lines, LogAllowance::kLinesAtOnce + back);
+  EXPECT_EQ(house_.confined(kAccomplice, {"misread", string, "1"}).output, "1\n");
+  EXPECT_EQ(static_cast<std::size_t>(house_.loggedContaining(failure)), lines + 1);
+}
+
 }  // namespace
 }  // namespace docuvend::tests

@@ -6,8 +6,8 @@
 #include <algorithm>
 #include <chrono>
 
-#include "platform/linux/extension_host/LineAllowance.h"
 #include "platform/linux/extension_host/OutputLines.h"
+#include "platform/linux/extension_host/OutputLog.h"
 #include "platform/linux/wire/ConnectToSocket.h"
 #include "tests/attacks/AttackTest.h"
 #include "tests/wire/RawPeer.h"
@@ -15,8 +15,8 @@
 namespace docuvend::tests {
 namespace {
 
-using linux_platform::LineAllowance;
 using linux_platform::OutputLines;
+using linux_platform::OutputLog;
 using ::testing::ElementsAre;
 using ::testing::HasSubstr;
 
@@ -116,11 +116,10 @@ TEST_F(ForgedLines, AnExtensionThatPrintsWithoutEndFillsNoLog) {
   // Whoever reads the log learns what is missing, at the latest when the extension has ended.
   (void)house_.client(kAttacker)->ask<&DVDaemon::extendSandboxForFileURL>(item("leave"), ProviderID{kTrickster}, ConsumerID{kEditor});
   ASSERT_TRUE(house_.awaitLog(" lines more than are logged."));
-  // As many as may have begun and ended meanwhile, with the one that was under way.
-  const auto periods = (std::chrono::steady_clock::now() - began) / LineAllowance::kPeriod + 2;
+  const auto back = (std::chrono::steady_clock::now() - began) / OutputLog::kTimeForALine + 1;
   const int told = house_.loggedContaining("[INFO] com.orvane.trickster: flood");
   EXPECT_GT(told, 0);
-  EXPECT_LE(told, static_cast<int>(LineAllowance::kLinesOfAPeriod) * periods);
+  EXPECT_LE(told, static_cast<int>(OutputLog::kLinesAtOnce) + back);
   EXPECT_EQ(house_.logged("[INFO] com.orvane.trickster: " + std::string(OutputLines::kLongestLine, 'w')), 1);
   EXPECT_EQ(house_.loggedContaining(std::string(OutputLines::kLongestLine + 1, 'w')), 0);
 }

@@ -16,8 +16,8 @@
 #include "platform/linux/coordination/FileAccesses.h"
 #include "platform/linux/coordination/FileCoordinationServicer.h"
 #include "platform/linux/coordination/Provisions.h"
-#include "platform/linux/extension_host/LineAllowance.h"
 #include "platform/linux/extension_host/OutputLines.h"
+#include "platform/linux/extension_host/OutputLog.h"
 #include "platform/linux/files/property_list_scalars.h"
 #include "platform/linux/launch/LaunchArguments.h"
 #include "platform/linux/launch/LaunchDescription.h"
@@ -99,7 +99,7 @@ std::vector<Limit> limits() {
           {"kExtensionOpenFiles", kExtensionOpenFiles},
           {"kExtensionMemory", kExtensionMemory.value_or(kMemoryWithoutSanitizer)},
           {"OutputLines::kLongestLine", OutputLines::kLongestLine},
-          {"LineAllowance::kLinesOfAPeriod", LineAllowance::kLinesOfAPeriod},
+          {"OutputLog::kLinesAtOnce", OutputLog::kLinesAtOnce},
           {"kLongestLogText", kLongestLogText},
           {"kDVLongestLoggedValue", kDVLongestLoggedValue},
           {"LogAllowance::kLinesAtOnce", LogAllowance::kLinesAtOnce}};

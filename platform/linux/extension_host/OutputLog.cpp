@@ -5,14 +5,12 @@
 
 #include <array>
 #include <cerrno>
-#include <chrono>
-#include <cstddef>
 #include <mutex>
 #include <string_view>
 #include <utility>
 
-#include "platform/linux/extension_host/LineAllowance.h"
 #include "platform/linux/extension_host/OutputLines.h"
+#include "platform/linux/log/LineAllowance.h"
 
 namespace docuvend::linux_platform {
 namespace {
@@ -35,12 +33,12 @@ struct OutputLog::State {
 
   void write(const std::string& line) {
     if (!log.isEnabled(QXLogType::info)) return;
-    const auto verdict = allowance.line(std::chrono::steady_clock::now());
-    tellOfDropped(verdict.droppedBefore);
-    if (verdict.isAllowed) log.write(QXLogType::info, "[INFO] " + name + ": " + line);
+    const auto now = std::chrono::steady_clock::now();
+    tellOfLeftOut(allowance.dueCount(now));
+    if (allowance.line(now)) log.write(QXLogType::info, "[INFO] " + name + ": " + line);
   }
 
-  void tellOfDropped(std::size_t count) const {
+  void tellOfLeftOut(std::size_t count) const {
     if (count > 0) log.write(QXLogType::info, "[INFO] " + name + " wrote " + std::to_string(count) + " lines more than are logged.");
   }
 
@@ -59,7 +57,7 @@ struct OutputLog::State {
   void finish() {
     const std::lock_guard lock(mutex);
     lines.finish();
-    tellOfDropped(allowance.finish());
+    tellOfLeftOut(allowance.finish());
   }
 
   QXLogHandle& log;
@@ -67,7 +65,7 @@ struct OutputLog::State {
   UniqueDescriptor pipe;
   std::mutex mutex;  // guards the two below and the order of reading
   OutputLines lines;
-  LineAllowance allowance;
+  LineAllowance allowance{{kLinesAtOnce, kTimeForALine}};
 };
 
 OutputLog::OutputLog(Reactor& reactor, QXLogHandle& log, std::string name, UniqueDescriptor pipe)

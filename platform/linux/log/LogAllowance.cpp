@@ -1,29 +1,19 @@
 #include "platform/linux/log/LogAllowance.h"
 
 #include <algorithm>
-#include <utility>
 
 namespace docuvend::linux_platform {
 
 // Who has not written for as long as a whole allowance takes is like one who never wrote; they are forgotten when somebody new comes.
 bool LogAllowance::line(const std::string& subject, Time now) {
-  constexpr auto kWhole = kLinesAtOnce * kTimeForALine;
   auto found = accounts_.find(subject);
   if (found == accounts_.end()) {
-    std::erase_if(accounts_, [now](const auto& known) { return known.second.whole <= now && known.second.leftOut == 0; });
-    found = accounts_.emplace(subject, Account{}).first;
+    std::erase_if(accounts_, [now](const auto& known) { return known.second.isUntouched(now); });
+    found = accounts_.emplace(subject, LineAllowance({kLinesAtOnce, kTimeForALine})).first;
   }
-  Account& account = found->second;
-  const Time whole = std::max(account.whole, now) + kTimeForALine;
-  if (whole - now <= kWhole) {
-    account.whole = whole;
-    return true;
-  }
-  if (account.leftOut++ == 0) {
-    account.firstLeftOut = now;
-    if (!nextCount_) nextCount_ = now + kTimeUntilCount;
-  }
-  return false;
+  const bool isAllowed = found->second.line(now);
+  noteCountOf(found->second);
+  return isAllowed;
 }
 
 std::vector<LogAllowance::LeftOut> LogAllowance::dueCounts(Time now) {
@@ -31,15 +21,14 @@ std::vector<LogAllowance::LeftOut> LogAllowance::dueCounts(Time now) {
   if (!nextCount_ || now < *nextCount_) return due;
   nextCount_.reset();
   for (auto& [subject, account] : accounts_) {
-    if (account.leftOut == 0) continue;
-    const Time time = account.firstLeftOut + kTimeUntilCount;
-    if (time <= now) {
-      due.push_back({subject, std::exchange(account.leftOut, 0)});
-    } else {
-      nextCount_ = nextCount_ ? std::min(*nextCount_, time) : time;
-    }
+    if (const std::size_t lines = account.dueCount(now); lines > 0) due.push_back({subject, lines});
+    noteCountOf(account);
   }
   return due;
+}
+
+void LogAllowance::noteCountOf(const LineAllowance& account) {
+  if (const auto time = account.timeOfCount()) nextCount_ = std::min(nextCount_.value_or(*time), *time);
 }
 
 }  // namespace docuvend::linux_platform

@@ -1,7 +1,6 @@
 // How many lines the log takes about one subject, so that no peer fills a disk or drowns what is said of others.
 //
-// A value without clock or lock. Each subject has an allowance that a burst uses up and that time brings back. What exceeds it is left out
-// and counted; the count is told when it is due, a while after the first line that was left out.
+// A value without clock or lock: a LineAllowance for each subject.
 #pragma once
 
 #include <chrono>
@@ -11,15 +10,17 @@
 #include <string>
 #include <vector>
 
+#include "platform/linux/log/LineAllowance.h"
+
 namespace docuvend::linux_platform {
 
 class LogAllowance {
  public:
-  using Time = std::chrono::steady_clock::time_point;
+  using Time = LineAllowance::Time;
 
   static constexpr std::size_t kLinesAtOnce = 200;
-  static constexpr std::chrono::milliseconds kTimeForALine{100};
-  static constexpr std::chrono::seconds kTimeUntilCount{10};
+  // Who goes on at this rate, with the longest lines (kLongestLogText), writes 332 MB in a day.
+  static constexpr std::chrono::seconds kTimeForALine{1};
 
   // Whether one more may be written.
   [[nodiscard]] bool line(const std::string& subject, Time now);
@@ -32,13 +33,9 @@ class LogAllowance {
   [[nodiscard]] std::vector<LeftOut> dueCounts(Time now);
 
  private:
-  struct Account {
-    Time whole;  // when all lines are allowed again
-    std::size_t leftOut = 0;
-    Time firstLeftOut;
-  };
+  void noteCountOf(const LineAllowance& account);
 
-  std::map<std::string, Account> accounts_;  // of those who wrote lately, or whose count is not told
+  std::map<std::string, LineAllowance> accounts_;  // of those who wrote lately, or whose count is not told
   std::optional<Time> nextCount_;
 };
 

@@ -3,6 +3,9 @@
 //   pile PATH CONNECTIONS COUNT   asks over each connection so often for the string of a document, named as lengthily as it can be, and
 //                                 waits for all answers; "ok" when they came
 //   nag COUNT                     passes on what it has not to somebody with a long name, so often, and waits for all answers
+//   misread STRING COUNT          reads the document of a bookmarkable string in so many accesses, over connections that it ends without
+//   ending
+//                                 the accesses; how many could not begin
 //   gather SERVICE COUNT          makes connections whose makers have ended since, and keeps them
 //   survey PATH                   over each of these asks to wake the daemon and for the string of a document: how many were refused, and
 //                                 what the others were answered
@@ -11,7 +14,10 @@
 
 #include <atomic>
 #include <cstdint>
+#include <cstring>
 #include <map>
+#include <memory>
+#include <optional>
 #include <set>
 #include <thread>
 #include <utility>
@@ -19,6 +25,7 @@
 #include <vector>
 
 #include "platform/linux/wire/ConnectToSocket.h"
+#include "platform/linux/wire/FileCoordinationProtocol.h"
 #include "platform/rpc_errors.h"
 #include "tests/attacks/attacker/Acts.h"
 #include "tests/attacks/attacker/Requests.h"
@@ -99,6 +106,29 @@ std::string nag(Words& words) {
   return askForMany(connectTo(kDVServiceName), kPassOn, arguments, count) ? "ok" : "ended";
 }
 
+std::string misread(Words& words) {
+  constexpr int kAccessesOfAConnection = 50;
+  tests::Client daemon(publicSocket(kDVServiceName), std::nullopt);
+  const auto resolved = daemon.ask<&DVDaemon::documentURLFromBookmarkableString>(words.next());
+  if (const auto error = tests::errorOf(resolved)) return tests::told(*error);
+  const std::optional<QXURL> url = std::get<0>(std::get<0>(resolved));
+  const std::optional<QXData> token = std::get<1>(std::get<0>(resolved));
+  const int count = std::stoi(words.next());
+  int failed = 0;
+  std::unique_ptr<tests::Client> coordination;
+  for (int number = 0; number < count; ++number) {
+    if (number % kAccessesOfAConnection == 0) {
+      coordination = std::make_unique<tests::Client>(publicSocket(kFileCoordinationServiceName), std::nullopt);
+    }
+    QXUUID id;
+    std::memcpy(id.bytes.data(), &number, sizeof number);
+    const std::optional<std::int64_t> party = number;
+    const auto begun = coordination->ask<&QXFileCoordination::coordinateReadingItemAtURL>(url, token, std::optional(id), party);
+    failed += tests::errorOf(begun) ? 1 : 0;
+  }
+  return std::to_string(failed);
+}
+
 std::vector<RawPeer>& orphans() {
   static std::vector<RawPeer> all;
   return all;
@@ -143,6 +173,6 @@ std::string survey(Words& words) {
 
 }  // namespace
 
-Acts floodActs() { return {{"pile", pile}, {"nag", nag}, {"gather", gather}, {"survey", survey}}; }
+Acts floodActs() { return {{"pile", pile}, {"nag", nag}, {"misread", misread}, {"gather", gather}, {"survey", survey}}; }
 
 }  // namespace docuvend::attacker
