@@ -1,8 +1,10 @@
 #include "platform/linux/bundles/BundleParser.h"
 
+#include <fcntl.h>
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
 #include <sys/stat.h>
+#include <sys/sysmacros.h>
 
 #include "tests/bundles/BundleHouse.h"
 
@@ -11,7 +13,6 @@ namespace {
 
 using ::testing::ElementsAre;
 using ::testing::HasSubstr;
-using ::testing::MatchesRegex;
 
 class BundleParser : public ::testing::Test {
  protected:
@@ -173,7 +174,10 @@ TEST_F(BundleParser, GivesAnotherVersionAfterEachChange) {
 TEST_F(BundleParser, TellsItsDirectoryFromOthersOfItsNameWhateverChangesInIt) {
   BundleHouse::install(directory_, "org.a");
   const auto first = parse().bundle.incarnation;
-  EXPECT_THAT(first, MatchesRegex("[0-9]+\\.[0-9]+\\.[0-9]+\\.[0-9]+"));
+  struct statx status {};
+  ASSERT_EQ(::statx(AT_FDCWD, directory_.c_str(), 0, STATX_INO | STATX_BTIME, &status), 0);
+  EXPECT_EQ(first, std::to_string(::makedev(status.stx_dev_major, status.stx_dev_minor)) + "." + std::to_string(status.stx_ino) + "." +
+                       std::to_string(status.stx_btime.tv_sec) + "." + std::to_string(status.stx_btime.tv_nsec));
 
   BundleHouse::write(directory_ + "/Entitlements.plist", BundleHouse::propertyList(""));
   BundleHouse::write(directory_ + "/new-file", "");
