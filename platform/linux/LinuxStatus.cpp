@@ -11,7 +11,7 @@ namespace {
 
 std::vector<std::string> protectionsOfThisKernel() {
   const ProtectionLevels levels = protectionLevels(KernelFacilities::probe());
-  return {levels.peers, levels.namespaces, levels.tokens, levels.confinement};
+  return {levels.peers, levels.namespaces, levels.tokens, levels.descriptors, levels.confinement};
 }
 
 }  // namespace

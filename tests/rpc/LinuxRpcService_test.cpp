@@ -689,7 +689,9 @@ class SlowRequestTest : public LinuxRpcServiceTest {
   }
   LinuxDriver::Client connectAs(Standing standing, std::optional<std::string> bundle) {
     driver.peers.setNextPeer(standing, std::move(bundle), {});
-    return driver.connect();
+    auto client = driver.connect();
+    EXPECT_TRUE(delegate->connections.take()) << "it is looked at before the next peer is another";
+    return client;
   }
   static void ping(const LinuxDriver::Client& client, Mailbox<bool>& answered) {
     QXRemote<TestProtocol>(client.proxy([&answered](const QXError&) { answered.put(false); })).call<&TestProtocol::ping>([&answered] {

@@ -36,7 +36,7 @@ TEST_F(Doctor, FindsTheDaemonAndEveryProtectionThatThisKernelGives) {
   house_.install(kEditor);
   house_.startDaemon();
   const auto kernel = linux_platform::KernelFacilities::probe();
-  const bool isNewest = kernel.peerPidfd && kernel.pidfdNamespaces && kernel.uniquePidfdInodes && kernel.landlockLevel >= 6;
+  const bool isNewest = kernel.peerPidfd && kernel.pidfdNamespaces && kernel.uniquePidfdInodes && kernel.refusedDescriptors && kernel.landlockLevel >= 6;
   const Ending ending = house_.ctl({"doctor", "--json"});
   EXPECT_EQ(ending.status, isNewest ? kDone : kMissing) << ending.output;
   EXPECT_EQ(ending.errors, "");

@@ -15,7 +15,7 @@ constexpr int kNewestLevel = 7;
 
 std::vector<std::string> sentencesOf(const linux_platform::KernelFacilities& kernel) {
   const auto levels = protectionLevels(kernel);
-  return {levels.peers, levels.namespaces, levels.tokens, levels.confinement};
+  return {levels.peers, levels.namespaces, levels.tokens, levels.descriptors, levels.confinement};
 }
 
 // A machine where all is well.
@@ -24,7 +24,7 @@ MachineFacts soundMachine() {
   facts.runtimeDirectory = "/run/user/1000";
   facts.bubblewrap = "/usr/bin/bwrap";
   facts.helper = "/usr/libexec/docuvend/docuvend-confine";
-  facts.kernel = {true, true, true, kNewestLevel};
+  facts.kernel = {true, true, true, true, kNewestLevel};
   facts.daemon = DaemonFacts{42, sentencesOf(facts.kernel), ProcessPrivileges{true, false, false, true}};
   return facts;
 }
@@ -51,7 +51,7 @@ void expectOnly(const MachineFacts& facts, const std::string& protection, Verdic
 
 TEST(Findings, OnASoundMachineEverythingIsInForceAndTheStatusIsDone) {
   const auto findings = findingsFrom(soundMachine());
-  EXPECT_EQ(findings.size(), 20U);
+  EXPECT_EQ(findings.size(), 21U);
   for (const Finding& finding : findings) EXPECT_EQ(finding.verdict, Verdict::inForce) << finding.protection;
   EXPECT_EQ(reportOf(findings).status, ExitStatus::done);
 }
@@ -152,7 +152,8 @@ INSTANTIATE_TEST_SUITE_P(Findings, LandlockLevels,
 TEST(Findings, AnOlderKernelsIdentitiesAreWeaker) {
   for (const auto& [facility, protection] : {std::pair{&linux_platform::KernelFacilities::peerPidfd, "peers"},
                                              {&linux_platform::KernelFacilities::pidfdNamespaces, "namespaces"},
-                                             {&linux_platform::KernelFacilities::uniquePidfdInodes, "audit tokens"}}) {
+                                             {&linux_platform::KernelFacilities::uniquePidfdInodes, "audit tokens"},
+                                             {&linux_platform::KernelFacilities::refusedDescriptors, "sent descriptors"}}) {
     MachineFacts facts = soundMachine();
     facts.kernel.*facility = false;
     facts.daemon->protections = sentencesOf(facts.kernel);
@@ -185,7 +186,7 @@ TEST(Findings, WithoutADaemonWhatItHasIsNotKnown) {
 
 TEST(Findings, ADaemonThatFindsLessIsQuoted) {
   MachineFacts facts = soundMachine();
-  facts.daemon->protections = sentencesOf({false, true, true, kNewestLevel});
+  facts.daemon->protections = sentencesOf({false, true, true, true, kNewestLevel});
   expectOnly(facts, "daemon's kernel", Verdict::missing, facts.daemon->protections.front());
   facts.daemon->protections.clear();
   expectOnly(facts, "daemon's kernel", Verdict::missing, "does not say");

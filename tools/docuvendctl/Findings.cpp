@@ -70,7 +70,7 @@ Finding ofDaemon(const MachineFacts& facts) {
 
 Finding ofDaemonsKernel(const MachineFacts& facts, const ProtectionLevels& levels) {
   if (!facts.daemon) return {"daemon's kernel", Verdict::missing, "not known without a daemon"};
-  const std::vector<std::string> expected = {levels.peers, levels.namespaces, levels.tokens, levels.confinement};
+  const std::vector<std::string> expected = {levels.peers, levels.namespaces, levels.tokens, levels.descriptors, levels.confinement};
   const auto& told = facts.daemon->protections;
   const auto other = std::find_if(told.begin(), told.end(), [&expected](const std::string& sentence) {
     return std::find(expected.begin(), expected.end(), sentence) == expected.end();
@@ -117,6 +117,7 @@ std::vector<Finding> findingsFrom(const MachineFacts& facts) {
       ofKernel("peers", kernel.peerPidfd, levels.peers),
       ofKernel("namespaces", kernel.pidfdNamespaces, levels.namespaces),
       ofKernel("audit tokens", kernel.uniquePidfdInodes, levels.tokens),
+      ofKernel("sent descriptors", kernel.refusedDescriptors, levels.descriptors),
       judged("directories", facts.placesProblem, Verdict::fatal, "no application sees more than its own"),
       judged("bundles", facts.bundlesProblem, Verdict::missing, "nobody else can write where they lie"),
       judged("watches", facts.watchesProblem, Verdict::missing, "the kernel watches further sockets for this user"),

@@ -9,6 +9,9 @@
 #ifndef SO_PEERPIDFD
 #define SO_PEERPIDFD 77
 #endif
+#ifndef SO_PASSRIGHTS
+#define SO_PASSRIGHTS 83
+#endif
 
 namespace docuvend::linux_platform::kernel {
 
@@ -19,6 +22,9 @@ inline constexpr unsigned long kPidfdGetUserNamespace = _IO(0xFF, 9);
 // Requests on a namespace.
 inline constexpr unsigned long kNamespaceGetOwner = _IO(0xb7, 1);
 inline constexpr unsigned long kNamespaceGetParent = _IO(0xb7, 2);
+
+// A command of fcntl: a lease on a directory or file under another name (6.19).
+inline constexpr int kSetDelegation = 1024 + 16;
 
 // Landlock rights and scopes above those of the 6.1 headers.
 inline constexpr std::uint64_t kLandlockTruncate = 1ULL << 14U;

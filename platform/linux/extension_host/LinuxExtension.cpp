@@ -11,6 +11,7 @@
 #include <utility>
 
 #include "platform/linux/base/LogSubject.h"
+#include "platform/linux/base/PassedDescriptors.h"
 #include "platform/linux/extension_host/ExtensionConnection.h"
 #include "platform/linux/extension_host/ExtensionErrors.h"
 #include "platform/linux/extension_host/Matching.h"
@@ -186,6 +187,7 @@ std::variant<std::shared_ptr<ExtensionProcess>, QXError> LinuxExtension::makePro
   }
   UniqueDescriptor ourSocket(sockets[0]);
   UniqueDescriptor theirSocket(sockets[1]);
+  static_cast<void>(refusePassedDescriptors(ourSocket.get()));
   std::array<int, 2> pipes{};
   if (pipe2(pipes.data(), O_CLOEXEC) != 0) return QXError::system(errno, "a pipe for an extension could not be made");
   UniqueDescriptor ourPipe(pipes[0]);

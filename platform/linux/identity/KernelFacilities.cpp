@@ -7,6 +7,7 @@
 
 #include <array>
 
+#include "platform/linux/base/PassedDescriptors.h"
 #include "platform/linux/base/UniqueDescriptor.h"
 #include "platform/linux/base/kernel.h"
 #include "platform/linux/base/pidfd.h"
@@ -17,6 +18,11 @@ namespace docuvend::linux_platform {
 namespace {
 
 constexpr long kPidFileSystem = 0x50494446;
+
+bool probeRefusedDescriptors() {
+  const UniqueDescriptor socket(::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0));
+  return socket && refusePassedDescriptors(socket.get());
+}
 
 bool probePeerPidfd() {
   std::array<int, 2> ends{};
@@ -44,6 +50,7 @@ std::string describeConfinement(int level) {
 KernelFacilities KernelFacilities::probe() {
   KernelFacilities facilities;
   facilities.peerPidfd = probePeerPidfd();
+  facilities.refusedDescriptors = probeRefusedDescriptors();
   facilities.landlockLevel = docuvend::linux_platform::landlockLevel();
   const UniqueDescriptor self = openPidfd(::getpid());
   if (!self) return facilities;
@@ -65,6 +72,9 @@ ProtectionLevels protectionLevels(const KernelFacilities& facilities) {
   levels.tokens = facilities.uniquePidfdInodes
                       ? "Audit tokens never repeat while the machine runs."
                       : "Audit tokens hold start times: two processes with one number within one clock tick share one.";
+  levels.descriptors = facilities.refusedDescriptors
+                           ? "Descriptors that processes send are refused."
+                           : "Descriptors that processes send are closed here: one whose closing takes long keeps a thread busy.";
   levels.confinement = describeConfinement(facilities.landlockLevel);
   return levels;
 }

@@ -9,6 +9,7 @@ struct KernelFacilities {
   bool peerPidfd = false;          // a socket tells its peer's pidfd (6.5)
   bool pidfdNamespaces = false;    // a pidfd tells its process's namespaces (6.11)
   bool uniquePidfdInodes = false;  // a pidfd's inode is the process's own for as long as the machine runs (6.9)
+  bool refusedDescriptors = false;  // a socket takes no descriptors (6.16)
   int landlockLevel = 0;
 
   [[nodiscard]] static KernelFacilities probe();
@@ -19,6 +20,7 @@ struct ProtectionLevels {
   std::string peers;
   std::string namespaces;
   std::string tokens;
+  std::string descriptors;
   std::string confinement;
 };
 

@@ -9,6 +9,7 @@
 #include <optional>
 #include <utility>
 
+#include "platform/linux/base/PassedDescriptors.h"
 #include "platform/linux/wire/SocketAddress.h"
 
 namespace docuvend::linux_platform {
@@ -66,6 +67,8 @@ std::variant<std::unique_ptr<BoundSocket>, QXError> BoundSocket::create(const st
   bound->socket_ = std::get<UniqueDescriptor>(std::move(socket));
   const auto& to = std::get<SocketAddress>(address);
   if (::bind(bound->socket_.get(), to.address(), to.length()) != 0) return QXError::system(errno, "cannot bind " + directory + newName);
+
+  static_cast<void>(refusePassedDescriptors(bound->socket_.get()));  // as far as the kernel can: the start-up log says whether it does
 
   struct stat status {};
   std::optional<QXError> error;

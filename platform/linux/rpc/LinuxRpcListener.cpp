@@ -10,6 +10,8 @@
 #include <utility>
 #include <vector>
 
+#include "platform/linux/base/PassedDescriptors.h"
+
 namespace docuvend::linux_platform {
 namespace {
 
@@ -58,7 +60,9 @@ LinuxRpcListener::LinuxRpcListener(Surroundings surroundings, Service service, U
       service_(std::move(service)),
       passedSocket_(std::move(passedSocket)),
       socket_(passedSocket_.get()),
-      spare_(spareDescriptor()) {}
+      spare_(spareDescriptor()) {
+  static_cast<void>(refusePassedDescriptors(socket_));
+}
 
 LinuxRpcListener::~LinuxRpcListener() { registration_.reset(); }
 

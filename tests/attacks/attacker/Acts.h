@@ -33,6 +33,7 @@ using Acts = std::map<std::string, Act>;
 [[nodiscard]] Acts surroundingsActs();
 [[nodiscard]] Acts pressureActs();
 [[nodiscard]] Acts floodActs();
+[[nodiscard]] Acts burdenActs();
 [[nodiscard]] Acts pretenceActs();
 [[nodiscard]] Acts mountActs();
 

@@ -48,6 +48,7 @@ int main(int count, char** arguments) {
   add(acts, surroundingsActs());
   add(acts, pressureActs());
   add(acts, floodActs());
+  add(acts, burdenActs());
   add(acts, pretenceActs());
   add(acts, mountActs());
   const bool isExtension = count == 1;
