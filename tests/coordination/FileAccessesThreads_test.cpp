@@ -46,9 +46,10 @@ class AnsweringProvider final : public QXDocuvend {
 
   // When it returns, what it was asked and told before has been answered.
   void awaitAnswers() {
-    tests::Mailbox<bool> reached;
-    questions_.put([&reached](const std::optional<QXError>&) { reached.put(true); });
-    EXPECT_TRUE(reached.take());
+    // Held by the question, which may be answered twice.
+    const auto reached = std::make_shared<tests::Mailbox<bool>>();
+    questions_.put([reached](const std::optional<QXError>&) { reached->put(true); });
+    EXPECT_TRUE(reached->take());
   }
   // Nothing may be asked or told any more.
   void stop() {
