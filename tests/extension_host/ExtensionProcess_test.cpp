@@ -13,6 +13,7 @@
 
 #include "platform/fake/FakeLog.h"
 #include "platform/linux/extension_host/ExtensionErrors.h"
+#include "platform/rpc_errors.h"
 #include "providers/_QXDocuvendHostProtocol.h"
 #include "providers/_QXDocuvendVendor.h"
 #include "tests/wire/RawPeer.h"
@@ -67,14 +68,23 @@ class ExtensionProcessTest : public ::testing::Test {
     ASSERT_TRUE(peer->read<Hello>());
   }
 
-  // Sends start providing, which has no limit of its own.
-  std::future<QXError> sendMessage() {
+  // Start providing has no limit of its own.
+  std::future<QXError> sendMessage(const char* operationName = "_startProvidingItemAtURL:completion:") {
     const auto failed = std::make_shared<std::promise<QXError>>();
     const QXRpcInterface vendor = qxInterfaceOf<_QXDocuvendVendor>();
-    const auto& operation = vendor.operations()[vendor.indexOf("_startProvidingItemAtURL:completion:").value()];
+    const auto& operation = vendor.operations()[vendor.indexOf(operationName).value()];
+    QXArray arguments;
+    if (!operation.arguments.empty()) arguments.emplace_back(QXURL::fileURL("/item", QXURLKind::file));
     process->remoteObjectProxy([failed](const QXError& error) { failed->set_value(error); })
-        ->send(operation, {QXURL::fileURL("/item", QXURLKind::file)}, [this](QXArray values) { replies.put(std::move(values)); });
+        ->send(operation, std::move(arguments), [this](QXArray values) { replies.put(std::move(values)); });
     return failed->get_future();
+  }
+  static void expectNoRoom(std::future<QXError> failed) {
+    ASSERT_EQ(failed.wait_for(std::chrono::seconds(60)), std::future_status::ready);
+    const QXError error = failed.get();
+    EXPECT_EQ(error.domain, kQXRpcErrorDomain);
+    EXPECT_EQ(error.code, static_cast<std::int64_t>(QXRpcErrorCode::tooManyCalls));
+    EXPECT_NE(error.description().find("too many messages wait for their answers"), std::string::npos);
   }
 
   // What the reactor's one thread was about is over then.
@@ -180,6 +190,33 @@ TEST_F(ExtensionProcessTest, WithoutASignInTimeItIsEndedAndItsMessagesFail) {
   EXPECT_NE(error.description().find("The process of com.orvane.test did not answer a ping in time."), std::string::npos);
   EXPECT_THAT(log.texts(), ::testing::Contains("[NOTICE] The process of com.orvane.test did not answer a ping in time."));
   EXPECT_EQ(lost.count(), 0U);
+}
+
+TEST_F(ExtensionProcessTest, WhatApplicationsAskForLeavesRoomForNoticesAndTheSetup) {
+  constexpr const char* kName = "_identifierForItemAtURL:completion:";
+  constexpr const char* kNotice = "_itemChangedAtURL:completion:";
+  constexpr const char* kSetup = "_performInitialSetupWithCompletion:";
+  start(times(kLong, kLong));
+  std::vector<std::future<QXError>> waiting;
+  for (std::size_t i = 0; i < ExtensionProcess::kMaximumQuestions; ++i) {
+    waiting.push_back(sendMessage(i % 2 == 0 ? kName : "_startProvidingItemAtURL:completion:"));
+  }
+  for (std::size_t i = 0; i + 1 < ExtensionProcess::kMaximumQuestions; ++i) ASSERT_TRUE(peer->read<RequestFrame>());
+  const auto last = peer->read<RequestFrame>();
+  ASSERT_TRUE(last);
+  expectNoRoom(sendMessage());
+  expectNoRoom(sendMessage(kName));
+  for (std::size_t i = 0; i < ExtensionProcess::kRoomForNotices; ++i) {
+    waiting.push_back(sendMessage(i == 0 ? kSetup : kNotice));
+    ASSERT_TRUE(peer->read<RequestFrame>());
+  }
+  expectNoRoom(sendMessage(kNotice));
+  peer->write(Frame(ReplyFrame{last->callID, {QXValue()}}));
+  ASSERT_TRUE(replies.take());
+  waiting.push_back(sendMessage());
+  EXPECT_TRUE(peer->read<RequestFrame>());
+  process->endAtOnce();
+  EXPECT_TRUE(gone.take());
 }
 
 TEST_F(ExtensionProcessTest, ASignThatWasNotAskedForEndsIt) {

@@ -20,11 +20,15 @@
 #include <sys/wait.h>
 
 #include <chrono>
+#include <cstdint>
+#include <limits>
+#include <string_view>
 #include <utility>
 
 #include "platform/linux/base/pidfd.h"
 #include "platform/linux/extension_host/ExtensionErrors.h"
 #include "platform/linux/extension_host/ProcessTree.h"
+#include "platform/rpc_errors.h"
 
 namespace docuvend::linux_platform {
 namespace {
@@ -34,6 +38,16 @@ using Clock = std::chrono::steady_clock;
 std::string describeEnd(const siginfo_t& info) {
   if (info.si_code == CLD_EXITED) return "exited with status " + std::to_string(info.si_status);
   return "was ended by signal " + std::to_string(info.si_status);
+}
+
+// Which messages are sent because an application asks for something. It may do so any number of times, unlike what the others come of.
+bool isQuestion(std::string_view operationName) {
+  return operationName != "_itemChangedAtURL:completion:" && operationName != "_performInitialSetupWithCompletion:";
+}
+
+QXError tooManyQuestions() {
+  return QXError::make(kQXRpcErrorDomain, static_cast<std::int64_t>(QXRpcErrorCode::tooManyCalls),
+                       "too many messages wait for their answers");
 }
 
 }  // namespace
@@ -50,9 +64,26 @@ class ExtensionProcess::Proxy : public QXRpcProxy {
 
   void send(const QXRpcOperation& operation, QXArray arguments, QXRpcReply reply) override {
     const auto process = reply ? process_.lock() : nullptr;
-    if (process) process->watchLiveness();
+    if (!process) {
+      plain_->send(operation, std::move(arguments), std::move(reply));
+      return;
+    }
+    process->watchLiveness();
+    if (isQuestion(operation.name)) {
+      std::shared_ptr<CallBudget::Share> share = process->questions_->take(/*bytes=*/0);
+      if (!share) {
+        process->post_([errorHandler = errorHandler_] {
+          if (errorHandler) errorHandler(tooManyQuestions());
+        });
+        return;
+      }
+      reply = [share = std::move(share), reply = std::move(reply)](QXArray values) mutable {
+        share.reset();
+        reply(std::move(values));
+      };
+    }
     const auto line = answerLineOf(operation.name);
-    if (!process || !line) {
+    if (!line) {
       plain_->send(operation, std::move(arguments), std::move(reply));
       return;
     }
@@ -74,12 +105,15 @@ class ExtensionProcess::Proxy : public QXRpcProxy {
   std::shared_ptr<QXRpcProxy> plain_;
 };
 
-ExtensionProcess::ExtensionProcess(Ends ends, std::string identifier, const ExtensionTimes& times, QXLogHandle& log, Handlers handlers)
+ExtensionProcess::ExtensionProcess(Ends ends, std::string identifier, const ExtensionTimes& times, Reactor& reactor, QXLogHandle& log,
+                                   Handlers handlers)
     : identifier_(std::move(identifier)),
       times_(times),
       log_(log),
       handlers_(std::move(handlers)),
       process_(std::move(ends.process)),
+      post_(reactor.poster()),
+      questions_(std::make_shared<CallBudget>(CallLimits{kMaximumQuestions, std::numeric_limits<std::size_t>::max()})),
       deadlines_(times.answerLimit) {}
 
 std::shared_ptr<ExtensionProcess> ExtensionProcess::create(Ends ends, const std::string& identifier, const QXRpcInterface& exported,
@@ -87,7 +121,8 @@ std::shared_ptr<ExtensionProcess> ExtensionProcess::create(Ends ends, const std:
                                                            Handlers handlers) {
   UniqueDescriptor socket = std::move(ends.socket);
   UniqueDescriptor output = std::move(ends.output);
-  const std::shared_ptr<ExtensionProcess> process(new ExtensionProcess(std::move(ends), identifier, times, log, std::move(handlers)));
+  const std::shared_ptr<ExtensionProcess> process(
+      new ExtensionProcess(std::move(ends), identifier, times, reactor, log, std::move(handlers)));
   const std::weak_ptr<ExtensionProcess> weak = process;
   process->socketProbe_.reset(fcntl(socket.get(), F_DUPFD_CLOEXEC, 0));
 

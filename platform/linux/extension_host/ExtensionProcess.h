@@ -7,6 +7,7 @@
 #pragma once
 
 #include <atomic>
+#include <cstddef>
 #include <functional>
 #include <memory>
 #include <mutex>
@@ -21,7 +22,9 @@
 #include "platform/linux/extension_host/ProcessLifetime.h"
 #include "platform/linux/extension_host/ProcessSpawner.h"
 #include "platform/linux/extension_host/Timer.h"
+#include "platform/linux/wire/CallBudget.h"
 #include "platform/linux/wire/Endpoint.h"
+#include "platform/linux/wire/Limits.h"
 #include "platform/linux/wire/Reactor.h"
 #include "platform/log.h"
 #include "platform/rpc.h"
@@ -30,6 +33,11 @@ namespace docuvend::linux_platform {
 
 class ExtensionProcess : public std::enable_shared_from_this<ExtensionProcess> {
  public:
+  // Of the messages that may wait for an answer so many are kept for what applications do not ask for: that items have changed, and the
+  // setup. A message that finds no room fails like one that finds none on the connection.
+  static constexpr std::size_t kRoomForNotices = 128;
+  static constexpr std::size_t kMaximumQuestions = kMaximumPendingCalls - kRoomForNotices;
+
   struct Handlers {
     // The process is of no more use, though nobody asked for its end. At most once.
     std::function<void(ProcessLifetime::Cause)> onLost;
@@ -72,7 +80,7 @@ class ExtensionProcess : public std::enable_shared_from_this<ExtensionProcess> {
   class Proxy;
   enum class Stage { alive, closed, terminated, killed };
 
-  ExtensionProcess(Ends ends, std::string identifier, const ExtensionTimes& times, QXLogHandle& log, Handlers handlers);
+  ExtensionProcess(Ends ends, std::string identifier, const ExtensionTimes& times, Reactor& reactor, QXLogHandle& log, Handlers handlers);
 
   void connectionIsOver();
   // False: not dead yet.
@@ -98,6 +106,9 @@ class ExtensionProcess : public std::enable_shared_from_this<ExtensionProcess> {
   std::unique_ptr<Timer> graceTimer_;
   std::unique_ptr<Timer> answerTimer_;
   std::unique_ptr<Timer> livenessTimer_;
+
+  const Reactor::Poster post_;
+  const std::shared_ptr<CallBudget> questions_;
 
   std::atomic<bool> livenessTimerIsSet_ = false;
   std::atomic<bool> pingIsUnanswered_ = false;
