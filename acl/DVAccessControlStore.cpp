@@ -97,10 +97,13 @@ void DVAccessControlStore::writeUnwrittenChanges() {
   });
 }
 
-bool DVAccessControlStore::allowWhereThereIsRoom(const DVGrant& grant, DVGranter granter) {
+bool DVAccessControlStore::allowWhereThereIsRoom(const DVGrant& grant, const DVGranter& granter) {
   return qxSync(*syncQueue_, [&] {
     const DVGrantTree& tree = *syncQueueAccessControlDict_;
-    if (!tree.allows(grant.provider, grant.item, grant.consumer) && !dvHasRoomFor(tree, grant, granter)) return false;
+    if (!tree.allows(grant.provider, grant.item, grant.consumer)) {
+      if (!syncQueueLimits_.hasRoomFor(tree, grant, granter)) return false;
+      syncQueueLimits_.noteAdded(grant, granter);
+    }
     syncQueueAllow(grant);
     return true;
   });
@@ -128,6 +131,7 @@ void DVAccessControlStore::disallowProviderWithIdentifier(const ProviderID& prov
     if (!syncQueueAccessControlDict_->disallow(provider, fromProvidingItemWithID, toConsumerWithIdentifier)) return;
     dvLog("[INFO] No longer allowing provider ID %@ to provide item ID “%@” to consumer ID %@", provider, fromProvidingItemWithID,
           toConsumerWithIdentifier);
+    syncQueueLimits_.noteRemovals(*syncQueueAccessControlDict_);
     syncQueueCommitAccessControl();
   });
 }
@@ -153,6 +157,7 @@ void DVAccessControlStore::syncQueueReadAccessControl() {
     }
   }
   if (!syncQueueAccessControlDict_) syncQueueAccessControlDict_.emplace();
+  syncQueueLimits_.noteRemovals(*syncQueueAccessControlDict_);
 }
 
 void DVAccessControlStore::syncQueueCommitAccessControl() {

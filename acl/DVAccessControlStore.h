@@ -51,7 +51,7 @@ class DVAccessControlStore final : public DVAccessControl, public std::enable_sh
 
   // The same as `allow` for a grant that somebody else names, unless the list has no room for it (DVGrantLimits.h): then false, and
   // nothing is done. A grant that is there already needs no room.
-  [[nodiscard]] bool allowWhereThereIsRoom(const DVGrant& grant, DVGranter granter);
+  [[nodiscard]] bool allowWhereThereIsRoom(const DVGrant& grant, const DVGranter& granter);
 
   // These check nothing.
   void allowProviderWithIdentifier(const ProviderID& provider, const ItemID& toProvideItemID, const ConsumerID& toConsumerWithIdentifier);
@@ -71,6 +71,7 @@ class DVAccessControlStore final : public DVAccessControl, public std::enable_sh
 
   // Only on syncQueue; by the constructor before that. Absent only while the file is being read.
   std::optional<DVGrantTree> syncQueueAccessControlDict_;
+  DVGrantLimits syncQueueLimits_;
   // The file is a property list that is no access control list, and there is no copy of it yet: somebody's edit went wrong, and it is
   // not overwritten without one.
   bool syncQueueFileIsMisshapen_ = false;

@@ -7,6 +7,7 @@
 #include <set>
 #include <string>
 #include <string_view>
+#include <utility>
 
 #include "platform/xml_text.h"
 
@@ -39,21 +40,44 @@ class Share {
 
 }  // namespace
 
-bool dvHasRoomFor(const DVGrantTree& tree, const DVGrant& grant, DVGranter granter) {
+bool DVGrantLimits::hasRoomFor(const DVGrantTree& tree, const DVGrant& grant, const DVGranter& granter) const {
   if (grant.consumer.value.size() > kDVLongestGrantedConsumerID || grant.item.value.size() > kDVLongestGrantedItemID) return false;
   if (!qxIsXMLText(grant.provider.value) || !qxIsXMLText(grant.consumer.value) || !qxIsXMLText(grant.item.value)) return false;
 
+  const auto& writer = granter.writingBundle();
   Share share;
+  Share own;  // of that a writer's
   share.add(grant);
   std::size_t consumersOfItem = 1;
+  std::size_t ownConsumersOfItem = 0;
   for (const DVGrant& other : tree.grants()) {
     if (other.provider != grant.provider) continue;
     share.add(other);
     if (other.item == grant.item) ++consumersOfItem;
+    if (!writer || !isOf(*writer, other)) continue;
+    own.add(other);
+    if (other.item == grant.item) ++ownConsumersOfItem;
   }
-  const bool isEntitled = granter == DVGranter::entitled;
-  return share.bytes() <= kDVMaximumBytesOfProvider - (isEntitled ? 0 : kDVBytesKeptForEntitled) &&
-         consumersOfItem <= kDVMaximumConsumersOfItem - (isEntitled ? 0 : kDVConsumersKeptForEntitled);
+  return share.bytes() + own.bytes() <= kDVMaximumBytesOfProvider - (writer ? kDVBytesKeptForEntitled : 0) &&
+         consumersOfItem + ownConsumersOfItem <= kDVMaximumConsumersOfItem - (writer ? kDVConsumersKeptForEntitled : 0);
+}
+
+void DVGrantLimits::noteAdded(const DVGrant& grant, const DVGranter& granter) {
+  if (const auto& writer = granter.writingBundle()) writers_.insert_or_assign(grant, *writer);
+}
+
+void DVGrantLimits::noteRemovals(const DVGrantTree& tree) {
+  std::map<DVGrant, ConsumerID> left;
+  for (const DVGrant& grant : tree.grants()) {
+    const auto known = writers_.find(grant);
+    if (known != writers_.end()) left.insert(*known);
+  }
+  writers_ = std::move(left);
+}
+
+bool DVGrantLimits::isOf(const ConsumerID& writer, const DVGrant& grant) const {
+  const auto known = writers_.find(grant);
+  return known != writers_.end() && known->second == writer;
 }
 
 }  // namespace docuvend

@@ -5,6 +5,7 @@
 // dictionary, an item listed twice, a further key beside "AllowedItemIDs").
 #pragma once
 
+#include <compare>
 #include <cstdint>
 #include <variant>
 #include <vector>
@@ -24,7 +25,7 @@ struct DVGrant {
   ConsumerID consumer;
   ItemID item;
 
-  friend bool operator==(const DVGrant&, const DVGrant&) = default;
+  friend auto operator<=>(const DVGrant&, const DVGrant&) = default;
 };
 
 class DVGrantTree {

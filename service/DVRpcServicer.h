@@ -77,7 +77,7 @@ class DVRpcServicer final : public DVDaemon, public std::enable_shared_from_this
   // --- Grants
 
   // False, with a line, when the list cannot hold it.
-  [[nodiscard]] bool recordGrant(const DVGrant& grant, DVGranter granter) const;
+  [[nodiscard]] bool recordGrant(const DVGrant& grant, const DVGranter& granter) const;
   void recordGrantAndIssueTokens(const SandboxRequest& request, const std::optional<QXError>& error,
                                  const std::optional<ItemID>& itemID) const;
   void replyWithTokens(const SandboxRequest& request) const;

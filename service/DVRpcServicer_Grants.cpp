@@ -25,6 +25,7 @@ struct DVRpcServicer::SandboxRequest {
 
 struct DVRpcServicer::BookmarkRequest {
   QXURL url;
+  ConsumerID callerID;
   ConsumerID consumerID;
   Provider provider;
   StringReply reply;
@@ -60,7 +61,7 @@ void DVRpcServicer::extendSandboxForFileURL(std::optional<QXURL> url, std::optio
 }
 
 // A grant that no file can hold would keep all later ones off the disk as well.
-bool DVRpcServicer::recordGrant(const DVGrant& grant, DVGranter granter) const {
+bool DVRpcServicer::recordGrant(const DVGrant& grant, const DVGranter& granter) const {
   const auto store = accessControlStore();
   if (!store || store->allowWhereThereIsRoom(grant, granter)) return true;
   dvLog("[ERROR] The access control list cannot hold provider ID %@, item ID “%@” and consumer ID %@.", grant.provider, grant.item,
@@ -75,7 +76,7 @@ void DVRpcServicer::recordGrantAndIssueTokens(const SandboxRequest& request, con
     dvReplyWithError(request.reply, DVPluginOperationFailedError(error));
     return;
   }
-  if (!recordGrant({request.providerID, request.consumerID, *itemID}, DVGranter::entitled)) {
+  if (!recordGrant({request.providerID, request.consumerID, *itemID}, DVGranter::entitled())) {
     dvReplyWithError(request.reply, DVNotPermittedError());
     return;
   }
@@ -117,7 +118,7 @@ void DVRpcServicer::extendBookmarkForFileURL(std::optional<QXURL> url, std::opti
     return;
   }
 
-  BookmarkRequest request{*std::move(url), *std::move(toConsumerID), provider, std::move(completionHandler)};
+  BookmarkRequest request{*std::move(url), *caller, *std::move(toConsumerID), provider, std::move(completionHandler)};
   const QXURL itemURL = request.url;
   provider->itemIDForURL(itemURL, [strongSelf = shared_from_this(), request = std::move(request)](std::optional<QXError> failure,
                                                                                                   std::optional<ItemID> itemID) {
@@ -133,7 +134,7 @@ void DVRpcServicer::recordGrantAndReplyWithString(const BookmarkRequest& request
     dvReplyWithError(request.reply, DVPluginOperationFailedError(error));
     return;
   }
-  if (!recordGrant({*providerID, request.consumerID, *itemID}, DVGranter::writer)) {
+  if (!recordGrant({*providerID, request.consumerID, *itemID}, DVGranter::writer(request.callerID))) {
     dvReplyWithError(request.reply, DVNotPermittedError());
     return;
   }

@@ -350,7 +350,7 @@ TEST_F(DVAccessControlStoreTest, EveryLineOfASharedStoreIsLoggedOnItsQueue) {
   store().disallowProviderWithIdentifier(kCellar, kReport, kEditor);
   grant(kLetter);
   store().writeUnwrittenChanges();
-  EXPECT_TRUE(store().allowWhereThereIsRoom({kAttic, kEditor, kReport}, DVGranter::writer));
+  EXPECT_TRUE(store().allowWhereThereIsRoom({kAttic, kEditor, kReport}, DVGranter::writer(kEditor)));
   for (int i = 0; i < 2; ++i) {
     store().rereadAccessControl();
     platform_.queues.runAll();
@@ -638,25 +638,67 @@ TEST_F(DVAccessControlStoreTest, AGrantRecordedBeforeTheFileCouldBeReadIsCommitt
 
 TEST_F(DVAccessControlStoreTest, AllowsWhatItHasAlreadyAndWhatItsLimitsLeave) {
   const ItemID tooLong{std::string(kDVLongestGrantedItemID + 1, 'i')};
-  for (const DVGranter granter : {DVGranter::entitled, DVGranter::writer}) {
+  for (const DVGranter& granter : {DVGranter::entitled(), DVGranter::writer(kEditor)}) {
     EXPECT_FALSE(store().allowWhereThereIsRoom({kCellar, kEditor, tooLong}, granter));
   }
   EXPECT_FALSE(isGranted(tooLong));
   EXPECT_TRUE(platform_.log.entries().empty());
   EXPECT_TRUE(platform_.propertyLists.writes().empty());
-  EXPECT_TRUE(store().allowWhereThereIsRoom({kCellar, kEditor, kReport}, DVGranter::writer));
+  EXPECT_TRUE(store().allowWhereThereIsRoom({kCellar, kEditor, kReport}, DVGranter::writer(kEditor)));
   EXPECT_TRUE(isGranted(kReport));
   EXPECT_EQ(platform_.propertyLists.writes().size(), 1U);
   grant(tooLong);
-  EXPECT_TRUE(store().allowWhereThereIsRoom({kCellar, kEditor, tooLong}, DVGranter::writer));
+  EXPECT_TRUE(store().allowWhereThereIsRoom({kCellar, kEditor, tooLong}, DVGranter::writer(kEditor)));
 }
 
-TEST_F(DVAccessControlStoreTest, AWriterLeavesRoomForTheEntitled) {
+// Each a bundle of its own, which adds one.
+TEST_F(DVAccessControlStoreTest, WritersLeaveRoomForTheEntitled) {
   for (std::size_t i = 0; i < kDVMaximumConsumersOfItem - kDVConsumersKeptForEntitled; ++i) {
-    ASSERT_TRUE(store().allowWhereThereIsRoom({kCellar, ConsumerID{std::to_string(i)}, kReport}, DVGranter::writer)) << i;
+    const ConsumerID numbered{std::to_string(i)};
+    ASSERT_TRUE(store().allowWhereThereIsRoom({kCellar, numbered, kReport}, DVGranter::writer(numbered))) << i;
   }
-  EXPECT_FALSE(store().allowWhereThereIsRoom({kCellar, kEditor, kReport}, DVGranter::writer));
-  EXPECT_TRUE(store().allowWhereThereIsRoom({kCellar, kEditor, kReport}, DVGranter::entitled));
+  EXPECT_FALSE(store().allowWhereThereIsRoom({kCellar, kEditor, kReport}, DVGranter::writer(kEditor)));
+  EXPECT_TRUE(store().allowWhereThereIsRoom({kCellar, kEditor, kReport}, DVGranter::entitled()));
+}
+
+TEST_F(DVAccessControlStoreTest, AWriterLeavesRoomForOthersUntilItsGrantsAreTakenBack) {
+  constexpr std::size_t kMost = (kDVMaximumConsumersOfItem - kDVConsumersKeptForEntitled) / 2;
+  const DVGranter writer = DVGranter::writer(kEditor);
+  const auto numbered = [](std::size_t number) { return ConsumerID{std::to_string(number)}; };
+  for (std::size_t i = 0; i < kMost; ++i) ASSERT_TRUE(store().allowWhereThereIsRoom({kCellar, numbered(i), kReport}, writer)) << i;
+  EXPECT_FALSE(store().allowWhereThereIsRoom({kCellar, numbered(kMost), kReport}, writer));
+  EXPECT_TRUE(store().allowWhereThereIsRoom({kCellar, numbered(0), kReport}, DVGranter::writer(ConsumerID{"other"})))
+      << "that is there already, and stays the first one's";
+  EXPECT_FALSE(store().allowWhereThereIsRoom({kCellar, numbered(kMost), kReport}, writer));
+  store().disallowProviderWithIdentifier(kCellar, kReport, numbered(0));
+  EXPECT_TRUE(store().allowWhereThereIsRoom({kCellar, numbered(kMost), kReport}, writer));
+  EXPECT_FALSE(store().allowWhereThereIsRoom({kCellar, numbered(0), kReport}, writer));
+}
+
+TEST_F(DVAccessControlStoreTest, WhatAWriterWasRefusedIsNotItsOwnWhenTheEntitledAddIt) {
+  constexpr std::size_t kMost = (kDVMaximumConsumersOfItem - kDVConsumersKeptForEntitled) / 2;
+  const DVGranter writer = DVGranter::writer(kEditor);
+  const auto numbered = [](std::size_t number) { return DVGrant{kCellar, ConsumerID{std::to_string(number)}, kReport}; };
+  for (std::size_t i = 0; i < kMost; ++i) ASSERT_TRUE(store().allowWhereThereIsRoom(numbered(i), writer)) << i;
+  ASSERT_FALSE(store().allowWhereThereIsRoom(numbered(kMost), writer));
+  ASSERT_TRUE(store().allowWhereThereIsRoom(numbered(kMost), DVGranter::entitled()));
+  store().disallowProviderWithIdentifier(kCellar, kReport, ConsumerID{"0"});
+  EXPECT_TRUE(store().allowWhereThereIsRoom(numbered(0), writer));
+}
+
+TEST_F(DVAccessControlStoreTest, WhatIsGoneFromTheFileAtTheFirstUnlockIsNoWritersAnyMore) {
+  constexpr std::size_t kMost = (kDVMaximumConsumersOfItem - kDVConsumersKeptForEntitled) / 2;
+  const DVGranter writer = DVGranter::writer(kEditor);
+  const auto fill = [this, &writer] {
+    std::size_t count = 0;
+    while (store().allowWhereThereIsRoom({kCellar, ConsumerID{std::to_string(count)}, kReport}, writer)) ++count;
+    return count;
+  };
+  ASSERT_EQ(fill(), kMost);
+  platform_.propertyLists.setValue(kFile, QXDictionary());
+  announceFirstUnlock();
+  platform_.queues.runAll();
+  EXPECT_EQ(fill(), kMost);
 }
 
 TEST_F(DVAccessControlStoreTest, WithoutInfoLoggingOnlyFaultsAreWritten) {

@@ -16,8 +16,13 @@ const ProviderID kCellar{"com.orvane.cellar"};
 const ConsumerID kEditor{"com.example.editor"};
 const ItemID kItem{"1"};
 
-// For one who is entitled to grant.
-bool hasRoomFor(const DVGrantTree& tree, const DVGrant& grant) { return dvHasRoomFor(tree, grant, DVGranter::entitled); }
+const DVGranter kEntitled = DVGranter::entitled();
+const DVGranter kWriter = DVGranter::writer(ConsumerID{"com.example.writer"});
+const DVGranter kOtherWriter = DVGranter::writer(ConsumerID{"com.example.other-writer"});
+
+bool hasRoomFor(const DVGrantTree& tree, const DVGrant& grant) { return DVGrantLimits().hasRoomFor(tree, grant, kEntitled); }
+// For a writer who has added nothing.
+bool hasRoomForWriter(const DVGrantTree& tree, const DVGrant& grant) { return DVGrantLimits().hasRoomFor(tree, grant, kWriter); }
 
 bool isTaken(DVGrantTree& tree, const DVGrant& grant) {
   return hasRoomFor(tree, grant) && tree.allow(grant.provider, grant.item, grant.consumer);
@@ -58,12 +63,95 @@ TEST(DVGrantLimits, WhoeverMayWriteAnItemLeavesRoomForConsumersThatTheEntitledNa
   DVGrantTree tree;
   for (std::size_t i = 0; i < kDVMaximumConsumersOfItem - kDVConsumersKeptForEntitled; ++i) {
     const DVGrant grant{kCellar, ConsumerID{"com.example." + std::to_string(i)}, kItem};
-    EXPECT_TRUE(dvHasRoomFor(tree, grant, DVGranter::writer)) << i;
+    EXPECT_TRUE(hasRoomForWriter(tree, grant)) << i;
     ASSERT_TRUE(tree.allow(grant.provider, grant.item, grant.consumer));
   }
-  EXPECT_FALSE(dvHasRoomFor(tree, {kCellar, kEditor, kItem}, DVGranter::writer));
+  EXPECT_FALSE(hasRoomForWriter(tree, {kCellar, kEditor, kItem}));
   EXPECT_TRUE(hasRoomFor(tree, {kCellar, kEditor, kItem}));
-  EXPECT_TRUE(dvHasRoomFor(tree, {kCellar, kEditor, ItemID{"2"}}, DVGranter::writer));
+  EXPECT_TRUE(hasRoomForWriter(tree, {kCellar, kEditor, ItemID{"2"}}));
+}
+
+// A tree with its limits, to which writers and the entitled add.
+class DVGrantLimitsOfWriters : public ::testing::Test {
+ protected:
+  [[nodiscard]] bool isAdded(const DVGrant& grant, const DVGranter& granter) {
+    if (!limits.hasRoomFor(tree, grant, granter)) return false;
+    limits.noteAdded(grant, granter);
+    return tree.allow(grant.provider, grant.item, grant.consumer);
+  }
+  // How many consumers of the item come in until one is refused.
+  std::size_t fill(const DVGranter& granter, const ItemID& item = kItem) {
+    std::size_t count = 0;
+    while (isAdded({kCellar, ConsumerID{"com.example." + std::to_string(++number)}, item}, granter)) ++count;
+    return count;
+  }
+
+  static constexpr std::size_t kWritersRoom = kDVMaximumConsumersOfItem - kDVConsumersKeptForEntitled;
+  DVGrantLimits limits;
+  DVGrantTree tree;
+  int number = 0;
+};
+
+TEST_F(DVGrantLimitsOfWriters, EachLeavesHalfOfTheConsumersThatItFinds) {
+  EXPECT_EQ(fill(kWriter), kWritersRoom / 2);
+  EXPECT_EQ(fill(kOtherWriter), kWritersRoom / 4);
+  EXPECT_EQ(fill(DVGranter::writer(kEditor)), kWritersRoom / 8);
+  EXPECT_EQ(fill(kWriter), 0U) << "still";
+  EXPECT_EQ(fill(kWriter, ItemID{"2"}), kWritersRoom / 2) << "another item has its own";
+  EXPECT_EQ(fill(kEntitled), kDVMaximumConsumersOfItem - kWritersRoom * 7 / 8);
+}
+
+TEST_F(DVGrantLimitsOfWriters, ThereIsRoomForWhoeverHasAddedNothingUntilThereIsNoneAtAll) {
+  for (std::size_t i = 0; i + 1 < kWritersRoom; ++i) (void)tree.allow(kCellar, kItem, ConsumerID{std::to_string(i)});
+  EXPECT_EQ(fill(kWriter), 1U);
+  EXPECT_EQ(fill(kOtherWriter), 0U);
+}
+
+TEST_F(DVGrantLimitsOfWriters, WhatOthersAndTheEntitledHaveAddedIsNotTheWritersOwn) {
+  for (std::size_t i = 0; i < kWritersRoom / 2; ++i) ASSERT_TRUE(isAdded({kCellar, ConsumerID{std::to_string(i)}, kItem}, kEntitled));
+  EXPECT_EQ(fill(kWriter), kWritersRoom / 4);
+}
+
+TEST_F(DVGrantLimitsOfWriters, WhatHasGoneFromTheTreeCountsNoMore) {
+  ASSERT_EQ(fill(kWriter), kWritersRoom / 2);
+  ASSERT_TRUE(tree.disallow(kCellar, kItem, ConsumerID{"com.example.1"}));
+  limits.noteRemovals(tree);
+  EXPECT_EQ(fill(kWriter), 1U);
+  tree = {};
+  limits.noteRemovals(tree);
+  EXPECT_EQ(fill(kWriter), kWritersRoom / 2);
+}
+
+TEST_F(DVGrantLimitsOfWriters, AGrantThatHasGoneAndIsAddedByAnotherIsThatOnes) {
+  ASSERT_EQ(fill(kWriter), kWritersRoom / 2);
+  tree = {};
+  for (std::size_t i = 1; i <= kWritersRoom / 2; ++i) {
+    ASSERT_TRUE(isAdded({kCellar, ConsumerID{"com.example." + std::to_string(i)}, kItem}, kOtherWriter)) << i;
+  }
+  EXPECT_EQ(fill(kOtherWriter), 0U);
+  EXPECT_EQ(fill(kWriter), kWritersRoom / 4);
+}
+
+TEST_F(DVGrantLimitsOfWriters, EachLeavesHalfOfTheBytesOfAProvidersShareThatItFinds) {
+  constexpr std::size_t kRoom = kDVMaximumBytesOfProvider - kDVBytesKeptForEntitled;
+  const auto fillBytes = [this](const DVGranter& granter, const ProviderID& provider) {
+    std::size_t bytes = 0;
+    for (std::size_t length = kDVLongestGrantedItemID; length > 0;) {
+      std::string name = std::to_string(++number);
+      name.resize(length, 'i');
+      if (isAdded({provider, ConsumerID{""}, ItemID{name}}, granter)) {
+        bytes += length;
+      } else {
+        length /= 2;
+      }
+      if (length < name.size() && length < 16) break;
+    }
+    return bytes;
+  };
+  constexpr std::size_t kPart = 100;
+  EXPECT_NEAR(static_cast<double>(fillBytes(kWriter, kCellar)), kRoom / 2, kRoom / kPart);
+  EXPECT_NEAR(static_cast<double>(fillBytes(kOtherWriter, kCellar)), kRoom / 4, kRoom / kPart);
+  EXPECT_NEAR(static_cast<double>(fillBytes(kWriter, ProviderID{"com.orvane.attic"})), kRoom / 2, kRoom / kPart);
 }
 
 // As DVGrantLimits.cpp counts them.
@@ -99,9 +187,9 @@ TEST(DVGrantLimits, WhoeverMayWriteItemsLeavesHalfOfAProvidersShareToTheEntitled
     ASSERT_TRUE(tree.allow(kCellar, ItemID{name}, anyone));
   }
   const std::size_t rest = room - taken * kBytesOfItem - kBytesAroundItem;
-  EXPECT_TRUE(dvHasRoomFor(tree, {kCellar, anyone, ItemID{std::string(rest, 'r')}}, DVGranter::writer));
+  EXPECT_TRUE(hasRoomForWriter(tree, {kCellar, anyone, ItemID{std::string(rest, 'r')}}));
   const DVGrant oneMore{kCellar, anyone, ItemID{std::string(rest + 1, 'r')}};
-  EXPECT_FALSE(dvHasRoomFor(tree, oneMore, DVGranter::writer));
+  EXPECT_FALSE(hasRoomForWriter(tree, oneMore));
   EXPECT_TRUE(hasRoomFor(tree, oneMore));
 }
 

@@ -8,11 +8,13 @@
 namespace docuvend::tests {
 namespace {
 
+using ::testing::Contains;
 using ::testing::Each;
 using ::testing::HasSubstr;
 using ::testing::Not;
 
 constexpr const char* kRefused = "DVErrorDomain 2";
+const std::string kAccomplice = "com.orvane.accomplice";
 
 class LimitAttacks : public AttackTest {
  protected:
@@ -20,17 +22,23 @@ class LimitAttacks : public AttackTest {
     AttackTest::SetUp();
     for (const auto& bundle : {kCellar, kEditor, kPicker}) house_.install(bundle);
     installAttacker();
+    house_.install(kAccomplice, "docuvend-attacker", stringEntry("QXBundleIdentifier", kAccomplice), {});
     letter_ = house_.putInCloud("letter.txt", "Dear all\n");
     other_ = house_.putInCloud("other.txt", "Another one\n");
     house_.startDaemon();
     string_ = house_.granted(letter_, kAttacker);
   }
 
+  static std::vector<std::string> numberedNames(const std::string& beginning, std::size_t count) {
+    std::vector<std::string> names;
+    for (std::size_t i = 1; i <= count; ++i) names.push_back(beginning + std::to_string(i));
+    return names;
+  }
   // What the attacker, who may write the letter, is told as it passes it on to each of those names.
-  [[nodiscard]] std::vector<std::string> passOn(const std::vector<std::string>& consumers) const {
+  [[nodiscard]] std::vector<std::string> passOn(const std::vector<std::string>& consumers, const std::string& as = kAttacker) const {
     std::vector<std::string> words = {"redeem-for", "writing", string_};
     for (const std::string& consumer : consumers) words.insert(words.end(), {"pass-on", letter_, consumer});
-    std::vector<std::string> outcomes = attack(words);
+    std::vector<std::string> outcomes = linesOf(house_.confined(as, words).output);
     if (outcomes.size() != consumers.size() + 1) {
       ADD_FAILURE() << outcomes.size() << " outcomes";
       return {};
@@ -60,12 +68,11 @@ TEST_F(LimitAttacks, ANameOfGreatLengthDoesNotFillTheList) {
 }
 
 TEST_F(LimitAttacks, OneDocumentPassedOnToManyNamesDoesNotFillTheList) {
-  std::vector<std::string> names;
-  for (std::size_t i = 1; i < kDVMaximumConsumersOfItem + 3; ++i) names.push_back("com.example." + std::to_string(i));
+  const auto names = numberedNames("com.example.", kDVMaximumConsumersOfItem + 3);
   auto outcomes = passOn(names);
   ASSERT_EQ(outcomes.size(), names.size());
-  // The attacker is one of the letter's consumers itself.
-  constexpr std::size_t kRoom = kDVMaximumConsumersOfItem - kDVConsumersKeptForEntitled - 1;
+  // Half of what there is for those who may write; the attacker is one of the letter's consumers itself.
+  constexpr std::size_t kRoom = (kDVMaximumConsumersOfItem - kDVConsumersKeptForEntitled) / 2;
   const auto first = outcomes.begin() + static_cast<std::ptrdiff_t>(kRoom);
   EXPECT_THAT(std::vector<std::string>(outcomes.begin(), first), Each("ok"));
   EXPECT_THAT(std::vector<std::string>(first, outcomes.end()), Each(kRefused));
@@ -73,6 +80,17 @@ TEST_F(LimitAttacks, OneDocumentPassedOnToManyNamesDoesNotFillTheList) {
   expectRoomForOthers();
   // Neither is the letter lost to those whom the picker names.
   (void)house_.granted(letter_, kEditor);
+}
+
+TEST_F(LimitAttacks, OneOfSeveralWhoMayWriteADocumentCannotUseUpTheRoomOfTheOthers) {
+  (void)house_.granted(letter_, kAccomplice);
+  const auto first = passOn(numberedNames("com.example.", kDVMaximumConsumersOfItem));
+  EXPECT_THAT(first, Contains("ok"));
+  EXPECT_THAT(first, Contains(kRefused));
+  EXPECT_THAT(passOn(numberedNames("com.orvane.friend.", 3), kAccomplice), Each("ok"));
+  // However often it comes back.
+  EXPECT_THAT(passOn(numberedNames("com.example.more.", 3)), Each(kRefused));
+  EXPECT_THAT(passOn({"com.orvane.friend.4"}, kAccomplice), Each("ok"));
 }
 
 }  // namespace

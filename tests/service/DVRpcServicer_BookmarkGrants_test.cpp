@@ -185,6 +185,20 @@ TEST_F(DVRpcServicerBookmarkGrantsTest, WhoMayWriteADocumentCannotUseUpTheRoomOf
   EXPECT_FALSE(isGranted(kStranger));
 }
 
+TEST_F(DVRpcServicerBookmarkGrantsTest, WhoMayWriteADocumentCannotUseUpTheRoomOfOthersWhoMay) {
+  constexpr std::size_t kRoom = kDVMaximumConsumersOfItem - kDVConsumersKeptForEntitled;
+  const auto answerTo = [this](const ConsumerID& consumer) {
+    answers_.clear();
+    extend(kReport, consumer);
+    return lateAnswer().error;
+  };
+  for (std::size_t i = 0; i < kRoom / 2; ++i) ASSERT_EQ(answerTo(ConsumerID{std::to_string(i)}), std::nullopt) << i;
+  EXPECT_EQ(answerTo(kStranger), DVNotPermittedError());
+  platform_.applicationRegistry.setBundleIdentifier(token_, "com.example.other");
+  EXPECT_EQ(answerTo(kStranger), std::nullopt);
+  EXPECT_TRUE(isGranted(kStranger));
+}
+
 TEST_F(DVRpcServicerBookmarkGrantsTest, AnItemThatTheListCannotHoldIsNotPermitted) {
   answerItemID(*cellar_, /*error=*/std::nullopt, "\x01");
   extend(kReport, kStranger);
