@@ -19,6 +19,7 @@ TEST(ConfinePolicy, IsReadAsItWasWritten) {
   command.policy.processes = 7;
   command.policy.memory = 1ULL << 40U;
   command.policy.openFiles = 9;
+  command.policy.leases = Leases::taken;
   command.command = {"/bin/x", "--", "--read", ""};
   const auto parsed = parseConfineArguments(confineArguments(command));
   ASSERT_TRUE(std::holds_alternative<ConfineCommand>(parsed)) << std::get<std::string>(parsed);
@@ -26,10 +27,11 @@ TEST(ConfinePolicy, IsReadAsItWasWritten) {
 }
 
 TEST(ConfinePolicy, IsWrittenAsWords) {
-  EXPECT_THAT(confineArguments({{{{PathAccess::readWrite, "/a"}}, 3, std::nullopt, std::nullopt, std::nullopt}, {"/b", "c"}}),
-              ElementsAre("--read-write", "/a", "--descriptors", "3", "--", "/b", "c"));
-  EXPECT_THAT(confineArguments({{{}, 4, 1, 2, 3}, {"/b"}}),
-              ElementsAre("--descriptors", "4", "--processes", "1", "--memory", "2", "--open-files", "3", "--", "/b"));
+  EXPECT_THAT(
+      confineArguments({{{{PathAccess::readWrite, "/a"}}, 3, std::nullopt, std::nullopt, std::nullopt, Leases::refused}, {"/b", "c"}}),
+      ElementsAre("--read-write", "/a", "--descriptors", "3", "--", "/b", "c"));
+  EXPECT_THAT(confineArguments({{{}, 4, 1, 2, 3, Leases::taken}, {"/b"}}),
+              ElementsAre("--descriptors", "4", "--processes", "1", "--memory", "2", "--open-files", "3", "--leases", "taken", "--", "/b"));
 }
 
 TEST(ConfinePolicy, IsNotGuessed) {
@@ -53,6 +55,7 @@ TEST(ConfinePolicy, IsNotGuessed) {
            {{"--descriptors", "3", "--processes", "0", "--", "/sh"}, "--processes cannot be \"0\""},
            {{"--descriptors", "3", "--memory", "99999999999999999999", "--", "/sh"}, "--memory cannot be \"99999999999999999999\""},
            {{"--descriptors", "3", "--open-files", "many", "--", "/sh"}, "--open-files cannot be \"many\""},
+           {{"--descriptors", "3", "--leases", "refused", "--", "/sh"}, "--leases cannot be \"refused\""},
            {{"--descriptors", "3", "--all", "/", "--", "/sh"}, "unknown option \"--all\""},
        }) {
     const auto parsed = parseConfineArguments(words);

@@ -69,6 +69,8 @@ class ConfinedHouse : public BundleHouse {
   [[nodiscard]] static Outcomes outcomes(RunningProcess process);
   // Runs an application to its end.
   [[nodiscard]] Outcomes run(const Bundle& bundle, const std::vector<std::string>& attempts, int standardInput = -1);
+  // The same of the probe alone, outside of every confinement, in this house's root.
+  [[nodiscard]] Outcomes runUnconfined(const std::vector<std::string>& attempts, int standardInput = -1) const;
 };
 
 // A test that means nothing when root runs it says so instead.

@@ -19,6 +19,7 @@
 #include "platform/linux/launch/LaunchArguments.h"
 #include "platform/linux/launch/LaunchDescription.h"
 #include "tests/launch/ConfinedHouse.h"
+#include "tests/support/KeyQuota.h"
 
 namespace docuvend::linux_platform {
 namespace {
@@ -241,11 +242,15 @@ TEST_F(ConfinedApplication, GetsTheStandardDescriptorsAlone) {
   ::close(50);
 }
 
+// A key that is for its possessors alone is listed for nobody else.
 TEST_F(ConfinedApplication, HasNoneOfTheLaunchersKeys) {
-  ASSERT_GE(::syscall(SYS_keyctl, KEYCTL_JOIN_SESSION_KEYRING, nullptr), 0);
-  ASSERT_GE(::syscall(SYS_add_key, "user", "docuvend-test", "x", 1, KEY_SPEC_SESSION_KEYRING), 0);
-  ASSERT_GE(::syscall(SYS_keyctl, KEYCTL_SEARCH, KEY_SPEC_SESSION_KEYRING, "user", "docuvend-test", 0), 0);
-  EXPECT_EQ(attempt(house_.installProbe("org.a"), "key", "docuvend-test"), "ENOKEY");
+  constexpr std::uint32_t kEverythingToPossessors = 0x3F000000U;
+  const tests::KeyQuota quota;
+  const long key = tests::KeyQuota::add("docuvend-test", 1);
+  ASSERT_GE(key, 0);
+  ASSERT_EQ(::syscall(SYS_keyctl, KEYCTL_SETPERM, key, kEverythingToPossessors), 0);
+  EXPECT_EQ(house_.runUnconfined({"key", "docuvend-test"}).at("key docuvend-test"), "listed");
+  EXPECT_EQ(attempt(house_.installProbe("org.a"), "key", "docuvend-test"), "not listed");
 }
 
 TEST_F(ConfinedApplication, ReopensNoPassedDescriptorForWriting) {

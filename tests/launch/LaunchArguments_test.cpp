@@ -126,6 +126,13 @@ TEST_F(LaunchArguments, ShowAnExtensionNoSockets) {
   EXPECT_THAT(all(), Not(Contains("/run/docuvend/public")));
 }
 
+// What a provider needs to take the contents from a file that nobody has open.
+TEST_F(LaunchArguments, LeaveLeasesToExtensionsAlone) {
+  EXPECT_EQ(confinePolicy(subject_, host_).leases, Leases::refused);
+  subject_.kind = LaunchKind::extension;
+  EXPECT_EQ(confinePolicy(subject_, host_).leases, Leases::taken);
+}
+
 TEST_F(LaunchArguments, LimitAnExtensionAndAnApplication) {
   const auto application = confinePolicy(subject_, host_);
   EXPECT_EQ(application.descriptors, 3);

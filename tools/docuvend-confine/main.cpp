@@ -15,6 +15,7 @@
 
 #include "platform/linux/launch/policy/ConfinePolicy.h"
 #include "platform/linux/launch/policy/Landlock.h"
+#include "platform/linux/launch/policy/SystemCalls.h"
 
 namespace docuvend::linux_platform {
 namespace {
@@ -37,9 +38,11 @@ std::optional<QXError> limit(__rlimit_resource resource, std::optional<std::uint
   return std::nullopt;
 }
 
-// The launcher's session keyring is inherited by everything it starts, with the keys in it. A kernel without keyrings has none to hide.
+// The launcher's session keyring is inherited by everything it starts, with the keys in it. A kernel without keyrings has none to hide. A
+// new keyring counts against the quota of the user's keys: where others have used that up the inherited one stays, and it is out of reach
+// all the same, since the filter on system calls lets nobody inside use a key.
 std::optional<QXError> leaveKeyring() {
-  if (::syscall(SYS_keyctl, KEYCTL_JOIN_SESSION_KEYRING, nullptr) >= 0 || errno == ENOSYS) return std::nullopt;
+  if (::syscall(SYS_keyctl, KEYCTL_JOIN_SESSION_KEYRING, nullptr) >= 0 || errno == ENOSYS || errno == EDQUOT) return std::nullopt;
   return QXError::system(errno, "cannot leave the session keyring");
 }
 
@@ -53,6 +56,7 @@ int run(const std::vector<std::string>& arguments) {
   if (const auto error = limit(RLIMIT_DATA, policy.memory)) return fail(error->description());
   if (const auto error = limit(RLIMIT_NOFILE, policy.openFiles)) return fail(error->description());
   if (const auto error = restrictToRules(policy.rules, landlockLevel())) return fail(error->description());
+  if (const auto error = refuseSystemCalls(policy.leases)) return fail(error->description());
   if (::close_range(static_cast<unsigned>(policy.descriptors), UINT_MAX, 0) != 0) return fail("cannot close the other descriptors");
 
   std::vector<char*> words;

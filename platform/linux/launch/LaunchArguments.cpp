@@ -100,7 +100,11 @@ ConfinePolicy confinePolicy(const LaunchSubject& subject, const HostLayout& host
   allow(PathAccess::readWrite, subject.container);
   for (const auto& path : subject.groups) allow(PathAccess::readWrite, path);
   if (subject.kind == LaunchKind::application) allow(PathAccess::read, subject.publicSockets);
-  if (subject.kind == LaunchKind::extension) policy.descriptors = kExtensionSocketNumber + 1;
+  if (subject.kind == LaunchKind::extension) {
+    policy.descriptors = kExtensionSocketNumber + 1;
+    // Of a file that is leased to it a provider knows that nobody has it open, and may take its contents away.
+    policy.leases = Leases::taken;
+  }
   setLimits(policy, subject.kind, host);
   return policy;
 }

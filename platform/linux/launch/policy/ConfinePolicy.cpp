@@ -20,6 +20,8 @@ constexpr std::array<std::pair<std::string_view, std::optional<std::uint64_t> Co
     {"--memory", &ConfinePolicy::memory},
     {"--open-files", &ConfinePolicy::openFiles},
 }};
+constexpr std::string_view kLeasesOption = "--leases";
+constexpr std::string_view kLeasesTaken = "taken";
 constexpr std::string_view kEndOfOptions = "--";
 constexpr std::uint64_t kFewestDescriptors = 3;
 constexpr std::uint64_t kMostDescriptors = 4;
@@ -43,6 +45,11 @@ std::optional<std::string> takeOption(const std::string& option, const std::stri
   if (const auto access = accessNamed(option)) {
     if (value.empty() || value[0] != '/') return option + " needs an absolute path, not \"" + value + "\"";
     policy.rules.push_back({*access, value});
+    return std::nullopt;
+  }
+  if (option == kLeasesOption) {
+    if (value != kLeasesTaken) return option + " cannot be \"" + value + "\"";
+    policy.leases = Leases::taken;
     return std::nullopt;
   }
   const auto number = parseNumber(value);
@@ -77,6 +84,7 @@ std::vector<std::string> confineArguments(const ConfineCommand& command) {
   for (const auto& [name, limit] : kLimitOptions) {
     if (const auto& most = command.policy.*limit) add(name, std::to_string(*most));
   }
+  if (command.policy.leases == Leases::taken) add(kLeasesOption, std::string(kLeasesTaken));
   arguments.emplace_back(kEndOfOptions);
   arguments.insert(arguments.end(), command.command.begin(), command.command.end());
   return arguments;

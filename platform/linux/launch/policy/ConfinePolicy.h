@@ -1,7 +1,7 @@
 // What docuvend-confine is told to do, as its arguments say it. The launcher writes them, docuvend-confine reads them.
 //
 //   docuvend-confine [--read-execute PATH | --read PATH | --read-write PATH | --device PATH]... --descriptors COUNT
-//                    [--processes COUNT] [--memory BYTES] [--open-files COUNT] -- EXECUTABLE [ARGUMENT...]
+//                    [--processes COUNT] [--memory BYTES] [--open-files COUNT] [--leases taken] -- EXECUTABLE [ARGUMENT...]
 #pragma once
 
 #include <cstdint>
@@ -19,6 +19,9 @@ enum class PathAccess {
   device,     // one device file: reading and writing
 };
 
+// Whether a process may take leases on files, which hold up everybody else who opens them.
+enum class Leases { refused, taken };
+
 struct ConfinePolicy {
   struct Rule {
     PathAccess access;
@@ -31,6 +34,7 @@ struct ConfinePolicy {
   std::optional<std::uint64_t> processes;
   std::optional<std::uint64_t> memory;     // bytes of private writable memory per process
   std::optional<std::uint64_t> openFiles;  // descriptors per process
+  Leases leases = Leases::refused;
 
   friend bool operator==(const ConfinePolicy&, const ConfinePolicy&) = default;
 };
