@@ -675,6 +675,19 @@ TEST_F(DVAccessControlStoreTest, AWriterLeavesRoomForOthersUntilItsGrantsAreTake
   EXPECT_FALSE(store().allowWhereThereIsRoom({kCellar, numbered(0), kReport}, writer));
 }
 
+TEST_F(DVAccessControlStoreTest, WhatIsTakenBackFromAWriterAndAddedByTheEntitledIsNotTheWritersOwn) {
+  constexpr std::size_t kMost = (kDVMaximumConsumersOfItem - kDVConsumersKeptForEntitled) / 2;
+  const DVGranter writer = DVGranter::writer(kEditor);
+  const auto numbered = [](std::size_t number) { return DVGrant{kCellar, ConsumerID{std::to_string(number)}, kReport}; };
+  for (std::size_t i = 0; i < kMost; ++i) ASSERT_TRUE(store().allowWhereThereIsRoom(numbered(i), writer)) << i;
+  store().disallowProviderWithIdentifier(kCellar, kReport, ConsumerID{"0"});
+  ASSERT_TRUE(store().allowWhereThereIsRoom(numbered(0), DVGranter::entitled()));
+  store().disallowProviderWithIdentifier(kCellar, kReport, ConsumerID{"1"});
+  EXPECT_TRUE(store().allowWhereThereIsRoom(numbered(1), writer));
+  EXPECT_TRUE(store().allowWhereThereIsRoom(numbered(kMost), writer));
+  EXPECT_FALSE(store().allowWhereThereIsRoom(numbered(kMost + 1), writer));
+}
+
 TEST_F(DVAccessControlStoreTest, WhatAWriterWasRefusedIsNotItsOwnWhenTheEntitledAddIt) {
   constexpr std::size_t kMost = (kDVMaximumConsumersOfItem - kDVConsumersKeptForEntitled) / 2;
   const DVGranter writer = DVGranter::writer(kEditor);
@@ -689,16 +702,14 @@ TEST_F(DVAccessControlStoreTest, WhatAWriterWasRefusedIsNotItsOwnWhenTheEntitled
 TEST_F(DVAccessControlStoreTest, WhatIsGoneFromTheFileAtTheFirstUnlockIsNoWritersAnyMore) {
   constexpr std::size_t kMost = (kDVMaximumConsumersOfItem - kDVConsumersKeptForEntitled) / 2;
   const DVGranter writer = DVGranter::writer(kEditor);
-  const auto fill = [this, &writer] {
-    std::size_t count = 0;
-    while (store().allowWhereThereIsRoom({kCellar, ConsumerID{std::to_string(count)}, kReport}, writer)) ++count;
-    return count;
-  };
-  ASSERT_EQ(fill(), kMost);
+  const auto numbered = [](std::size_t number) { return DVGrant{kCellar, ConsumerID{std::to_string(number)}, kReport}; };
+  for (std::size_t i = 0; i < kMost; ++i) ASSERT_TRUE(store().allowWhereThereIsRoom(numbered(i), writer)) << i;
+  ASSERT_FALSE(store().allowWhereThereIsRoom(numbered(kMost), writer));
   platform_.propertyLists.setValue(kFile, QXDictionary());
   announceFirstUnlock();
   platform_.queues.runAll();
-  EXPECT_EQ(fill(), kMost);
+  for (std::size_t i = 0; i < kMost; ++i) ASSERT_TRUE(store().allowWhereThereIsRoom(numbered(i), DVGranter::entitled())) << i;
+  EXPECT_TRUE(store().allowWhereThereIsRoom(numbered(kMost), writer));
 }
 
 TEST_F(DVAccessControlStoreTest, WithoutInfoLoggingOnlyFaultsAreWritten) {

@@ -132,6 +132,16 @@ TEST_F(DVGrantLimitsOfWriters, AGrantThatHasGoneAndIsAddedByAnotherIsThatOnes) {
   EXPECT_EQ(fill(kWriter), kWritersRoom / 4);
 }
 
+TEST_F(DVGrantLimitsOfWriters, AGrantThatHasGoneAndIsAddedByTheEntitledIsNoWriters) {
+  ASSERT_EQ(fill(kWriter), kWritersRoom / 2);
+  tree = {};
+  limits.noteRemovals(tree);
+  for (std::size_t i = 1; i <= kWritersRoom / 2; ++i) {
+    ASSERT_TRUE(isAdded({kCellar, ConsumerID{"com.example." + std::to_string(i)}, kItem}, kEntitled)) << i;
+  }
+  EXPECT_EQ(fill(kWriter), kWritersRoom / 4);
+}
+
 TEST_F(DVGrantLimitsOfWriters, EachLeavesHalfOfTheBytesOfAProvidersShareThatItFinds) {
   constexpr std::size_t kRoom = kDVMaximumBytesOfProvider - kDVBytesKeptForEntitled;
   const auto fillBytes = [this](const DVGranter& granter, const ProviderID& provider) {
