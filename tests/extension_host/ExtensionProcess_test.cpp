@@ -5,11 +5,13 @@
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
 #include <poll.h>
+#include <sys/resource.h>
 #include <unistd.h>
 
 #include <array>
 #include <atomic>
 #include <future>
+#include <vector>
 
 #include "platform/fake/FakeLog.h"
 #include "platform/linux/extension_host/ExtensionErrors.h"
@@ -66,6 +68,32 @@ class ExtensionProcessTest : public ::testing::Test {
     peer->sayHello();
     process->resume();
     ASSERT_TRUE(peer->read<Hello>());
+  }
+
+  // Null, or a process, when only so many descriptors can be had.
+  std::shared_ptr<ExtensionProcess> createWith(std::size_t freeDescriptors) {
+    auto [ours, theirs] = tests::socketPair();
+    std::array<int, 2> pipe{};
+    EXPECT_EQ(pipe2(pipe.data(), O_CLOEXEC | O_NONBLOCK), 0);
+    EXPECT_EQ(fcntl(ours.get(), F_SETFL, O_NONBLOCK), 0);
+    UniqueDescriptor reading(pipe[0]);
+    const UniqueDescriptor writing(pipe[1]);
+    ExtensionProcess::Handlers handlers;
+    handlers.onLost = [](ProcessLifetime::Cause) {};
+    handlers.onGone = [] {};
+    handlers.hasRequests = [] { return false; };
+    ExtensionProcess::Ends ends{spawn(writing), std::move(ours), std::move(reading)};
+    rlimit usual{};
+    EXPECT_EQ(getrlimit(RLIMIT_NOFILE, &usual), 0);
+    const rlimit few{200, usual.rlim_max};
+    EXPECT_EQ(setrlimit(RLIMIT_NOFILE, &few), 0);
+    std::vector<UniqueDescriptor> taken;
+    for (int copy = dup(writing.get()); copy >= 0; copy = dup(writing.get())) taken.emplace_back(copy);
+    taken.resize(taken.size() - freeDescriptors);
+    auto made = ExtensionProcess::create(std::move(ends), "com.orvane.test", qxInterfaceOf<_QXDocuvendHostProtocol>(), times(kLong, kLong),
+                                         *reactor, log.defaultLog(), std::move(handlers));
+    EXPECT_EQ(setrlimit(RLIMIT_NOFILE, &usual), 0);
+    return made;
   }
 
   // Start providing has no limit of its own.
@@ -217,6 +245,12 @@ TEST_F(ExtensionProcessTest, WhatApplicationsAskForLeavesRoomForNoticesAndTheSet
   EXPECT_TRUE(peer->read<RequestFrame>());
   process->endAtOnce();
   EXPECT_TRUE(gone.take());
+}
+
+TEST_F(ExtensionProcessTest, OneOfWhichNotAllCanBeKnownIsNoneAndItsProcessIsEnded) {
+  constexpr std::size_t kNeeded = 4;  // a look at the socket and three timers
+  for (std::size_t i = 0; i < kNeeded; ++i) EXPECT_FALSE(createWith(i)) << i;
+  EXPECT_TRUE(createWith(kNeeded));
 }
 
 TEST_F(ExtensionProcessTest, ASignThatWasNotAskedForEndsIt) {

@@ -151,7 +151,11 @@ std::shared_ptr<ExtensionProcess> ExtensionProcess::create(Ends ends, const std:
     });
     if (!process->death_) return nullptr;
   }
-  return process;
+  return process->isWatched() ? process : nullptr;
+}
+
+bool ExtensionProcess::isWatched() const {
+  return socketProbe_ && output_->isUsable() && graceTimer_->isUsable() && answerTimer_->isUsable() && livenessTimer_->isUsable();
 }
 
 ExtensionProcess::~ExtensionProcess() {

@@ -78,6 +78,9 @@ class ExtensionProcess : public std::enable_shared_from_this<ExtensionProcess> {
 
  private:
   class Proxy;
+  // All that is to be known of it can be known.
+  [[nodiscard]] bool isWatched() const;
+
   enum class Stage { alive, closed, terminated, killed };
 
   ExtensionProcess(Ends ends, std::string identifier, const ExtensionTimes& times, Reactor& reactor, QXLogHandle& log, Handlers handlers);

@@ -53,6 +53,8 @@ const char* describe(ProcessLifetime::Phase phase) {
   return "";
 }
 
+QXError couldNotBeWatched() { return QXError::system(ENOMEM, "a new process could not be watched"); }
+
 QXError hostIsStopping() { return extensionHostError(ExtensionHostErrorCode::stopped, "The extension host is stopping."); }
 
 }  // namespace
@@ -62,11 +64,7 @@ LinuxExtension::LinuxExtension(Bundle bundle, QXExtensionContextClass contextCla
 
 std::shared_ptr<LinuxExtension> LinuxExtension::create(Bundle bundle, QXExtensionContextClass contextClass,
                                                        std::shared_ptr<ExtensionServices> services) {
-  const std::shared_ptr<LinuxExtension> extension(new LinuxExtension(std::move(bundle), contextClass, std::move(services)));
-  extension->idleTimer_ = std::make_unique<Timer>(extension->services_->reactor, [weak = std::weak_ptr(extension)] {
-    if (const auto strongSelf = weak.lock()) strongSelf->endWhenIdleForLong();
-  });
-  return extension;
+  return std::shared_ptr<LinuxExtension>(new LinuxExtension(std::move(bundle), contextClass, std::move(services)));
 }
 
 LinuxExtension::~LinuxExtension() {
@@ -112,15 +110,10 @@ void LinuxExtension::beginExtensionRequest(BeginCompletion completion) {
 }
 
 void LinuxExtension::cancelExtensionRequest(const QXUUID& request) {
-  std::optional<ProcessLifetime::Time> deadline;
-  {
-    const std::lock_guard lock(mutex_);
-    lifetime_.finish(request, Clock::now());
-    // A timer that is set looks at the deadline of its time and is set again if that lies ahead.
-    if (!idleTimerIsSet_) deadline = lifetime_.idleDeadline();
-    idleTimerIsSet_ = idleTimerIsSet_ || deadline.has_value();
-  }
-  if (deadline) idleTimer_->setFor(*deadline);
+  const std::lock_guard lock(mutex_);
+  lifetime_.finish(request, Clock::now());
+  // A timer that is set looks at the deadline of its time and is set again if that lies ahead.
+  if (!idleTimerIsSet_) setIdleTimer(lifetime_.idleDeadline());
 }
 
 std::shared_ptr<QXExtensionContext> LinuxExtension::extensionContextForRequest(const QXUUID& request) {
@@ -135,14 +128,24 @@ std::shared_ptr<QXExtensionContext> LinuxExtension::extensionContextForRequest(c
 }
 
 void LinuxExtension::retire() {
-  std::optional<ProcessLifetime::Time> deadline;
-  {
-    const std::lock_guard lock(mutex_);
-    lifetime_.retire();
-    deadline = lifetime_.idleDeadline();
-    idleTimerIsSet_ = deadline.has_value();
-  }
+  const std::lock_guard lock(mutex_);
+  lifetime_.retire();
+  setIdleTimer(lifetime_.idleDeadline());
+}
+
+void LinuxExtension::setIdleTimer(const std::optional<ProcessLifetime::Time>& deadline) {
+  idleTimerIsSet_ = deadline.has_value();
   if (deadline) idleTimer_->setFor(*deadline);
+}
+
+bool LinuxExtension::hasIdleTimer() {
+  const std::lock_guard lock(mutex_);
+  if (!idleTimer_ || !idleTimer_->isUsable()) {
+    idleTimer_ = std::make_unique<Timer>(services_->reactor, [weak = weak_from_this()] {
+      if (const auto strongSelf = weak.lock()) strongSelf->endWhenIdleForLong();
+    });
+  }
+  return idleTimer_->isUsable();
 }
 
 void LinuxExtension::stop() {
@@ -181,6 +184,7 @@ std::variant<std::shared_ptr<ExtensionProcess>, QXError> LinuxExtension::makePro
   // A confinement that root makes keeps far too little out.
   if (geteuid() == 0) return QXError::system(EPERM, "extensions are not started by root");
 
+  if (!hasIdleTimer()) return couldNotBeWatched();
   std::array<int, 2> sockets{};
   if (socketpair(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC | SOCK_NONBLOCK, 0, sockets.data()) != 0) {
     return QXError::system(errno, "a socket for an extension could not be made");
@@ -213,7 +217,7 @@ std::variant<std::shared_ptr<ExtensionProcess>, QXError> LinuxExtension::makePro
   auto process =
       ExtensionProcess::create({std::move(std::get<SpawnedProcess>(spawned)), std::move(ourSocket), std::move(ourPipe)}, bundle_.identifier,
                                contextClass_.hostInterface, services_->times, services_->reactor, services_->log, std::move(handlers));
-  if (!process) return QXError::system(ENOMEM, "a new process could not be watched");
+  if (!process) return couldNotBeWatched();
   return process;
 }
 
@@ -266,19 +270,15 @@ void LinuxExtension::processIsGone() {
 
 void LinuxExtension::endWhenIdleForLong() {
   std::shared_ptr<ExtensionProcess> idle;
-  std::optional<ProcessLifetime::Time> later;
   {
     const std::lock_guard lock(mutex_);
     const std::optional<ProcessLifetime::Time> deadline = lifetime_.idleDeadline();
     if (deadline && *deadline <= Clock::now()) {
       lifetime_.endedIdle();
       idle = process_;
-    } else {
-      later = deadline;
     }
-    idleTimerIsSet_ = later.has_value();
+    setIdleTimer(idle ? std::nullopt : deadline);
   }
-  if (later) idleTimer_->setFor(*later);
   if (idle) idle->end();
 }
 

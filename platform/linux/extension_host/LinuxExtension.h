@@ -73,6 +73,8 @@ class LinuxExtension : public QXExtension, public std::enable_shared_from_this<L
   LinuxExtension(Bundle bundle, QXExtensionContextClass contextClass, std::shared_ptr<ExtensionServices> services);
 
   [[nodiscard]] std::shared_ptr<ExtensionProcess> presentProcess() const;
+  // False: there is none to be had, and a process would never be let go.
+  [[nodiscard]] bool hasIdleTimer();
   void startOnSpawner();
   void start();
   [[nodiscard]] std::variant<std::shared_ptr<ExtensionProcess>, QXError> makeProcess();
@@ -82,6 +84,8 @@ class LinuxExtension : public QXExtension, public std::enable_shared_from_this<L
   void processIsLost(ProcessLifetime::Cause cause);
   void processIsGone();
   void endWhenIdleForLong();
+  // With the lock.
+  void setIdleTimer(const std::optional<ProcessLifetime::Time>& deadline);
   [[nodiscard]] std::chrono::milliseconds backOffLeft() const;
   [[nodiscard]] QXError backingOffError() const;
 
@@ -89,9 +93,8 @@ class LinuxExtension : public QXExtension, public std::enable_shared_from_this<L
   const Bundle bundle_;
   const QXExtensionContextClass contextClass_;
   const std::shared_ptr<ExtensionServices> services_;
-  std::unique_ptr<Timer> idleTimer_;
-
-  mutable std::mutex mutex_;  // guards all below; no handler and no operation of a process is called with it
+  mutable std::mutex mutex_;          // guards all below; no handler and no operation of a process is called with it
+  std::unique_ptr<Timer> idleTimer_;  // none before the first process
   ProcessLifetime lifetime_;
   std::vector<Waiting> waiting_;
   std::shared_ptr<ExtensionProcess> process_;

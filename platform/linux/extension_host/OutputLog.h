@@ -24,6 +24,10 @@ class OutputLog {
   OutputLog(Reactor& reactor, QXLogHandle& log, std::string name, UniqueDescriptor pipe);
   // Logs what is in the pipe.
   ~OutputLog();
+
+  // False: nothing is read before the end.
+  [[nodiscard]] bool isUsable() const { return registration_ != nullptr; }
+
   OutputLog(const OutputLog&) = delete;
   OutputLog& operator=(const OutputLog&) = delete;
 

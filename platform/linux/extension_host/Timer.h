@@ -17,6 +17,9 @@ class Timer {
   Timer& operator=(const Timer&) = delete;
   ~Timer();
 
+  // False: the system gave it nothing to wait with, and the handler never runs.
+  [[nodiscard]] bool isUsable() const { return registration_ != nullptr; }
+
   // The handler runs once, at or after that time. Replaces the time that was set before. May be called from any thread.
   void setFor(std::chrono::steady_clock::time_point time);
 
