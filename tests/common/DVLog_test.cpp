@@ -62,6 +62,11 @@ TEST_F(DVLogTest, OfALongValueTheBeginningIsShown) {
                                                 "[NOTICE] " + whole.substr(2) + "é"));
 }
 
+TEST_F(DVLogTest, OfALongValueInWhichNoCharacterBeginsNothingIsShown) {
+  dvLog("[NOTICE] %@", std::string(kDVLongestLoggedValue + 1, '\x80'));
+  EXPECT_THAT(platform.log.texts(), ElementsAre("[NOTICE] …"));
+}
+
 TEST_F(DVLogTest, AbsentValuesPrintAsNull) {
   dvLog("[INFO] %@ %@ %@ %@", std::optional<std::string>(), std::optional<QXError>(), std::optional<QXURL>(),
         std::shared_ptr<SelfDescribing>());
