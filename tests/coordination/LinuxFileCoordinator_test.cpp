@@ -10,6 +10,7 @@
 #include <vector>
 
 #include "platform/fake/FakeFileSystem.h"
+#include "platform/fake/FakeLog.h"
 #include "platform/fake/FakeQueues.h"
 #include "tests/coordination/RecordingProvider.h"
 
@@ -165,7 +166,11 @@ struct AwaitedProviderTest : ::testing::Test {
   std::vector<InstalledStorage> installed = {{"com.example.a", directoryURL("/a/storage")}, {"com.example.b", directoryURL("/b/storage")}};
   bool isInPlace = true;
   fake_platform::FakeFileSystem fileSystem;
-  LinuxFileCoordinator coordinator{fileSystem, {[this] { return installed; }, [this](const KeyedFile&) { return isInPlace; }}};
+  fake_platform::FakeLog log;
+  LinuxFileCoordinator coordinator{fileSystem,
+                                   {.installedStorages = [this] { return installed; },
+                                    .isInPlace = [this](const KeyedFile&) { return isInPlace; },
+                                    .log = &log.defaultLog()}};
   const std::shared_ptr<RecordingProvider> provider = std::make_shared<RecordingProvider>(directoryURL("/b/storage"));
   const KeyedFile item = fileNamed("/b/storage/x.txt");
   int toldCount = 0;
@@ -225,6 +230,18 @@ TEST_F(AwaitedProviderTest, AFileThatIsNotInItsPlaceAnyMoreIsNobodys) {
   finishWriting(item);
   EXPECT_EQ(toldCount, 1);
   EXPECT_TRUE(provider->told.empty());
+}
+
+TEST_F(AwaitedProviderTest, OfAWriteOfAFileThatIsNotInItsPlaceAnyMoreTheLogSaysThatNobodyIsTold) {
+  coordinator._addDocuvend(provider);
+  finishWriting(item);
+  isInPlace = false;
+  finishWriting(fileNamed("/c/nobodys.txt"));
+  EXPECT_TRUE(log.texts().empty());
+  finishWriting(item);
+  EXPECT_EQ(log.texts(), (std::vector<std::string>{"[ERROR] Nobody can be told that the item at URL " + item.url.absoluteString() +
+                                                   " has changed: it is not where it was."}));
+  EXPECT_EQ(provider->told.size(), 1U);
 }
 
 TEST_F(AwaitedProviderTest, WhatCannotBeKnownOfAFileIsAFailureAndWhatCannotBeKnownOfADirectoryIsNone) {

@@ -180,7 +180,11 @@ FileOwner LinuxFileCoordinator::ownerOf(const KeyedFile& file, DirectoryItself i
     return owner;
   }
   // Looked at last: the way to the file may have been changed into a way to somebody's file.
-  if (outside_.isInPlace && !outside_.isInPlace(file)) return {};
+  if (outside_.isInPlace && !outside_.isInPlace(file)) {
+    FileOwner nobody;
+    nobody.isLost = true;
+    return nobody;
+  }
   return owner;
 }
 
@@ -220,6 +224,10 @@ void LinuxFileCoordinator::tellFinishedWriting(const FileOwner& owner, const Acc
     return;
   }
   if (known && hasChangedSince(owner)) tellUntold();
+  if (owner.isLost) {
+    const LogSubject subject(subjectOf(writer));
+    logError("Nobody can be told that the item at URL " + file.url.absoluteString() + " has changed: it is not where it was.");
+  }
   if (told) told();
 }
 

@@ -40,6 +40,7 @@ struct FileOwner {
   std::shared_ptr<QXDocuvend> provider;
   std::optional<std::string> awaited;  // the bundle of a provider that is installed and not registered
   std::optional<QXError> failure;      // it cannot be known; or it is nobody's, and its contents are not there
+  bool isLost = false;                 // it would be somebody's, but is not where it was when it was given its key: so it is nobody's
   std::uint64_t changes = 0;           // of registrations and installed providers, up to when the look began
 
   // None for a file of nobody's, or of one that cannot be known.
@@ -99,8 +100,8 @@ class LinuxFileCoordinator final : public QXFileCoordinator {
   // Why nobody of that application may write the file now: its owner is still to be told of as much as one application may have written.
   [[nodiscard]] std::optional<QXError> refusalOfWrite(const FileOwner& owner, const AccessHolder& writer, const KeyedFile& file) const;
   // Tells the file's owner that a writer has finished with it, under an identifier that no other writer has; `told` runs after that, and
-  // at once when there is no owner, or when it will be told later: one that is awaited or is being told already. It hears of several writes
-  // to one file once then.
+  // at once when there is no owner (which is logged of a file that is not where it was), or when it will be told later: one that is awaited
+  // or is being told already. It hears of several writes to one file once then.
   void tellFinishedWriting(const FileOwner& owner, const AccessHolder& writer, const KeyedFile& file, std::function<void()> told);
 
  private:
