@@ -3,9 +3,12 @@
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
 
+#include <chrono>
+
 #include "common/DVErrors.h"
 #include "platform/linux/coordination/AccessSession.h"
 #include "platform/linux/coordination/ChangeNotices.h"
+#include "platform/linux/extension_host/ExtensionTimes.h"
 #include "platform/linux/rpc/ConnectionLimiter.h"
 #include "platform/linux/wire/FileCoordinationProtocol.h"
 #include "platform/linux/wire/Limits.h"
@@ -176,6 +179,36 @@ TEST_F(Pressure, WritesThatASlowProviderIsToldOfLeaveRoomForEverybodyElse) {
     return true;
   });
   eventually("and of the last write of the first one", [&told] { return told("laggard-alone0") == 2; });
+}
+
+// All of them take longer than one answer may.
+TEST_F(Pressure, AProviderThatIsAskedForManyNamesAtOnceIsNotEndedWhileItAnswersOneAfterAnother) {
+  ASSERT_EQ(grantItem("honest"), std::nullopt);
+  const auto before = house_.processesOf("docuvend-trickster");
+  ASSERT_EQ(before.size(), 1U);
+  const auto began = std::chrono::steady_clock::now();
+  EXPECT_THAT(attack({"name", item("weary").fileSystemPath(), std::to_string(kMaximumCallsPerPeer)}), ElementsAre("ok"));
+  EXPECT_GT(std::chrono::steady_clock::now() - began, linux_platform::ExtensionTimes().answerLimit);
+  EXPECT_EQ(house_.processesOf("docuvend-trickster"), before);
+  EXPECT_EQ(house_.loggedContaining(" in time."), 0);
+  EXPECT_EQ(grantItem("honest"), std::nullopt);
+}
+
+TEST_F(Pressure, WhatAProviderWasBeingToldWhenAnApplicationMadeItEndItIsToldAgain) {
+  ASSERT_EQ(grantItem("bomb"), std::nullopt);
+  const auto told = [this](const std::string& name) {
+    return house_.loggedBeginning("[INFO] QXFileCoordinator is telling us the item at URL " + item(name).absoluteString() +
+                                  " was changed by");
+  };
+  EXPECT_EQ(house_.ctl({"write", item("laggard").fileSystemPath()}, "new").status, 0);
+  EXPECT_EQ(house_.ctl({"write", item("heard").fileSystemPath()}, "new").status, 0);
+  const auto outcomes = attack({"start", item("bomb").fileSystemPath(), kTrickster, kAttacker, "1"});
+  ASSERT_EQ(outcomes.size(), 1U);
+  EXPECT_TRUE(house_.awaitLog("[ERROR] Cannot tell extension " + kTrickster + " that item at URL " + item("laggard").absoluteString()));
+  eventually("it is told again", [&told] { return told("laggard") >= 2; });
+  EXPECT_EQ(told("heard"), 1) << "what it had answered it is not";
+  writeFile(house_.container(kTrickster) + "/free", "");
+  expectOthersAreServed();
 }
 
 class FaultyProvider : public Pressure, public ::testing::WithParamInterface<const char*> {};

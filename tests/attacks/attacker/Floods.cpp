@@ -2,6 +2,7 @@
 //
 //   pile PATH CONNECTIONS COUNT   asks over each connection so often for the string of a document, named as lengthily as it can be, and
 //                                 waits for all answers; "ok" when they came
+//   name PATH COUNT               asks so often at once for the string of a document, and waits for all answers; "ok" when they came
 //   nag COUNT                     passes on what it has not to somebody with a long name, so often, and waits for all answers
 //   misread STRING COUNT          reads the document of a bookmarkable string in so many accesses, over connections that it ends without
 //   ending
@@ -100,6 +101,11 @@ std::string pile(Words& words) {
   return answered == connections ? "ok" : "only " + std::to_string(answered) + " were answered";
 }
 
+std::string name(Words& words) {
+  const QXURL url = QXURL::fileURL(words.next(), QXURLKind::file);
+  return askForMany(connectTo(kDVServiceName), kStringOf, {url}, std::stoull(words.next())) ? "ok" : "ended";
+}
+
 std::string nag(Words& words) {
   const std::uint64_t count = std::stoull(words.next());
   const QXArray arguments = {QXValue(), QXValue(std::string(kLengthyName, 'x'))};
@@ -173,6 +179,6 @@ std::string survey(Words& words) {
 
 }  // namespace
 
-Acts floodActs() { return {{"pile", pile}, {"nag", nag}, {"misread", misread}, {"gather", gather}, {"survey", survey}}; }
+Acts floodActs() { return {{"pile", pile}, {"name", name}, {"nag", nag}, {"misread", misread}, {"gather", gather}, {"survey", survey}}; }
 
 }  // namespace docuvend::attacker

@@ -12,6 +12,7 @@
 //                      abort     abort()
 //                      knock     what the administration answers at the socket "door" in its group's container
 //                      hoard     has as many descriptors on their way as the kernel allows it, and says so
+//                      weary     the name, after a while
 //                      anything  the name
 //   startProviding     stuck     says so, and waits until the file "free" lies in its container
 //                      forks     starts as many processes as it may, says so, and waits in the same way
@@ -60,6 +61,7 @@ using linux_platform::ReplyFrame;
 
 constexpr int kDaemonSocket = 3;
 constexpr int kManyLines = 20'000;
+constexpr std::chrono::milliseconds kWhile{200};
 constexpr std::uint64_t kNeverAsked = 1'000'000'000;
 
 std::string contentsOf(const char* path, std::string otherwise) {
@@ -113,6 +115,7 @@ class Trickster : public Provider {
 
   [[nodiscard]] Result<ItemID> identifierForItem(const QXURL& url) override {
     const std::string name = nameOf(url);
+    if (name == "weary") std::this_thread::sleep_for(kWhile);
     if (name == "control") return ItemID{"one\x01two"};
     if (name == "refused") return refusal();
     if (name == "abort") std::abort();
