@@ -42,7 +42,7 @@ TEST_F(Doctor, FindsTheDaemonAndEveryProtectionThatThisKernelGives) {
   EXPECT_EQ(ending.errors, "");
   const JSON findings = JSON::parse(ending.output);
   EXPECT_EQ(findingOf(findings, "daemon").second, "process " + std::to_string(house_.daemon().pid()) + " answers");
-  for (const char* protection : {"ordinary user", "run-time directory", "user namespaces", "bubblewrap", "docuvend-confine", "Landlock",
+  for (const char* protection : {"ordinary user", "run-time directory", "user namespaces", "bubblewrap", "docuvend-confine", "Landlock", "system calls",
                                  "confinement", "directories", "bundles", "watches", "daemon", "daemon's kernel", "daemon's privileges"}) {
     EXPECT_EQ(findingOf(findings, protection).first, "in force") << protection << ": " << findingOf(findings, protection).second;
   }

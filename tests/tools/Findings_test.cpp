@@ -51,7 +51,7 @@ void expectOnly(const MachineFacts& facts, const std::string& protection, Verdic
 
 TEST(Findings, OnASoundMachineEverythingIsInForceAndTheStatusIsDone) {
   const auto findings = findingsFrom(soundMachine());
-  EXPECT_EQ(findings.size(), 21U);
+  EXPECT_EQ(findings.size(), 22U);
   for (const Finding& finding : findings) EXPECT_EQ(finding.verdict, Verdict::inForce) << finding.protection;
   EXPECT_EQ(reportOf(findings).status, ExitStatus::done);
 }
@@ -107,6 +107,12 @@ TEST(Findings, NothingStartsWhereALaunchFails) {
   MachineFacts facts = soundMachine();
   facts.launchProblem = "bwrap: out of luck";
   expectOnly(facts, "confinement", Verdict::fatal, "bwrap: out of luck");
+}
+
+TEST(Findings, NothingStartsWhereSystemCallsAreNotRefused) {
+  MachineFacts facts = soundMachine();
+  facts.systemCallsProblem = "the kernel does not filter them";
+  expectOnly(facts, "system calls", Verdict::fatal, "does not filter them");
 }
 
 TEST(Findings, NothingStartsWhereLandlockDoesNotRestrict) {

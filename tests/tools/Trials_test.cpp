@@ -4,8 +4,12 @@
 #include <fcntl.h>
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
+#include <sys/ioctl.h>
 #include <sys/resource.h>
+#include <sys/socket.h>
 #include <unistd.h>
+
+#include <cerrno>
 
 #include "platform/linux/base/UniqueDescriptor.h"
 #include "platform/linux/launch/policy/Landlock.h"
@@ -19,6 +23,7 @@ using ::testing::Optional;
 TEST(Trials, WhatTheKernelGivesWorks) {
   EXPECT_EQ(tryUserNamespace(), std::nullopt);
   EXPECT_EQ(tryLandlock(linux_platform::landlockLevel()), std::nullopt);
+  EXPECT_EQ(trySystemCalls(), std::nullopt);
   EXPECT_EQ(tryWatch(), std::nullopt);
 }
 
@@ -45,6 +50,10 @@ TEST(Trials, ALaunchIsThatOfAnOrdinaryUser) {
 // This process is none the worse for it.
 TEST(Trials, RestrictNobodyElse) {
   ASSERT_EQ(tryLandlock(linux_platform::landlockLevel()), std::nullopt);
+  ASSERT_EQ(trySystemCalls(), std::nullopt);
+  const linux_platform::UniqueDescriptor socket(::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0));
+  EXPECT_EQ(::ioctl(socket.get(), TIOCSTI, "x"), -1);
+  EXPECT_EQ(errno, ENOTTY) << "the call is made, and the socket is no terminal";
   EXPECT_TRUE(linux_platform::UniqueDescriptor(::open("/", O_RDONLY | O_DIRECTORY | O_CLOEXEC)));
   EXPECT_EQ(tryUserNamespace(), std::nullopt);
 }

@@ -80,6 +80,7 @@ Result<Answer> doctor(const Call& call) {
   facts.helper = host.helper;
   facts.userNamespaceProblem = tryUserNamespace();
   if (facts.kernel.landlockLevel > 0) facts.landlockProblem = tryLandlock(facts.kernel.landlockLevel);
+  facts.systemCallsProblem = trySystemCalls();
   facts.launchProblem = tryLaunch();
   lookAtPlaces(paths, host, facts);
   facts.watchesProblem = tryWatch();

@@ -105,6 +105,7 @@ std::vector<Finding> findingsFrom(const MachineFacts& facts) {
       ofProgram("bubblewrap", facts.bubblewrap, "it is not installed"),
       ofProgram("docuvend-confine", facts.helper, "it is neither beside this program nor in ../libexec/docuvend"),
       ofLandlock(facts),
+      judged("system calls", facts.systemCallsProblem, Verdict::fatal, "a process was refused those that reach what all of a user share"),
       judged("confinement", facts.launchProblem, Verdict::fatal, "a confined process was started"),
       fromLevel("truncation", linux_platform::kLandlockTruncateLevel, facts, "Landlock holds it",
                 "the read-only mounts alone hold it (6.2)"),

@@ -29,11 +29,12 @@ struct MachineFacts {
   std::string bubblewrap;        // its path, empty when it is not installed
   std::string helper;            // the same of docuvend-confine
   linux_platform::KernelFacilities kernel;
-  Problem landlockProblem;  // restricting a process with it
-  Problem launchProblem;    // starting a confined process
-  Problem placesProblem;    // what of the user's every application sees
-  Problem bundlesProblem;   // who else can change what lies there
-  Problem watchesProblem;   // having sockets watched by the kernel
+  Problem landlockProblem;     // restricting a process with it
+  Problem systemCallsProblem;  // refusing a process some
+  Problem launchProblem;       // starting a confined process
+  Problem placesProblem;       // what of the user's every application sees
+  Problem bundlesProblem;      // who else can change what lies there
+  Problem watchesProblem;      // having sockets watched by the kernel
   std::optional<DaemonFacts> daemon;
   std::string daemonProblem;  // why there are no facts about it
 };

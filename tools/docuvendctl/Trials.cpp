@@ -3,6 +3,7 @@
 #include <fcntl.h>
 #include <linux/sched.h>
 #include <poll.h>
+#include <sys/ioctl.h>
 #include <sys/mman.h>
 #include <sys/socket.h>
 #include <sys/syscall.h>
@@ -24,6 +25,7 @@
 #include "platform/linux/base/pidfd.h"
 #include "platform/linux/launch/ConfinedLaunch.h"
 #include "platform/linux/launch/policy/Landlock.h"
+#include "platform/linux/launch/policy/SystemCalls.h"
 #include "platform/linux/wire/EpollSet.h"
 
 namespace docuvend::ctl {
@@ -125,6 +127,20 @@ TrialFailure tryLandlock(int level) {
   const auto status = statusOfChild(child);
   if (status == kWorked) return std::nullopt;
   return status == kStillOpen ? "a restricted process still opens files" : "a process could not be restricted with it";
+}
+
+TrialFailure trySystemCalls() {
+  const pid_t child = ::fork();
+  if (child < 0) return "no process can be started: " + textOf(errno);
+  if (child == 0) {
+    if (linux_platform::refuseSystemCalls(linux_platform::Leases::refused)) ::_exit(kNotRestricted);
+    // A socket is no terminal, which its own answer would be.
+    const int socket = ::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0);
+    ::_exit(socket >= 0 && ::ioctl(socket, TIOCSTI, "x") != 0 && errno == EPERM ? kWorked : kStillOpen);
+  }
+  const auto status = statusOfChild(child);
+  if (status == kWorked) return std::nullopt;
+  return status == kStillOpen ? "a filtered process still makes the calls" : "the kernel does not filter them";
 }
 
 TrialFailure tryLaunch() {

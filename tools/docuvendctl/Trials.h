@@ -16,6 +16,9 @@ using TrialFailure = std::optional<std::string>;
 // A process gives up all files with Landlock at that level, and is refused one.
 [[nodiscard]] TrialFailure tryLandlock(int level);
 
+// A process gives up the calls that no confined process may make, is refused one and makes another.
+[[nodiscard]] TrialFailure trySystemCalls();
+
 // A program of the system's is started as an extension is: with bubblewrap, docuvend-confine, and an extension's limits. Leaves nothing
 // behind.
 [[nodiscard]] TrialFailure tryLaunch();
