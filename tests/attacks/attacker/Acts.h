@@ -36,5 +36,6 @@ using Acts = std::map<std::string, Act>;
 [[nodiscard]] Acts burdenActs();
 [[nodiscard]] Acts pretenceActs();
 [[nodiscard]] Acts mountActs();
+[[nodiscard]] Acts sharedThingsActs();
 
 }  // namespace docuvend::attacker

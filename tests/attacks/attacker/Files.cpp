@@ -13,6 +13,7 @@
 //   shrink                     truncates it through the same
 //   link PATH                  gives it another name, by the descriptor; link-proc PATH: through the process's own descriptor
 //   mode MODE                  gives it another mode, in octal digits
+//   lease-it                   keeps others from opening it, as long as it is held
 //   upgrade                    asks for writing through the descriptor, then writes
 //   read PATH                  opens a path for reading
 //   climb PATH                 the same, from the directory that the standard input is
@@ -220,6 +221,7 @@ Acts descriptorActs(const std::shared_ptr<Hands>& hands) {
          return outcome(::linkat(AT_FDCWD, hands->heldPath().c_str(), AT_FDCWD, words.next().c_str(), AT_SYMLINK_FOLLOW));
        }},
       {"mode", [hands](Words& words) { return outcome(::fchmod(hands->held(), std::stoul(words.next(), nullptr, 8))); }},
+      {"lease-it", [hands](Words&) { return outcome(::fcntl(hands->held(), F_SETLEASE, F_WRLCK)); }},
       {"upgrade",
        [hands](Words&) {
          static_cast<void>(::fcntl(hands->held(), F_SETFL, O_RDWR));
