@@ -16,6 +16,7 @@
 #include "platform/linux/coordination/FileAccesses.h"
 #include "platform/linux/coordination/FileCoordinationServicer.h"
 #include "platform/linux/coordination/Provisions.h"
+#include "platform/linux/extension_host/ExtensionProcess.h"
 #include "platform/linux/extension_host/OutputLines.h"
 #include "platform/linux/extension_host/OutputLog.h"
 #include "platform/linux/files/property_list_scalars.h"
@@ -72,6 +73,7 @@ std::vector<Limit> limits() {
           {"ChangeNotices::kMaximumUntoldBytes", ChangeNotices::kMaximumUntoldBytes},
           {"ChangeNotices::kMaximumUnconfinedUntoldFiles", ChangeNotices::kMaximumUnconfinedUntoldFiles},
           {"ChangeNotices::kMaximumUnconfinedUntoldBytes", ChangeNotices::kMaximumUnconfinedUntoldBytes},
+          {"ChangeNotices::kMaximumFailures", ChangeNotices::kMaximumFailures},
           {"kMaximumHoldersNamed", FileCoordinationServicer::kMaximumHoldersNamed},
           {"kDVMaximumGrantsOfPage", kDVMaximumGrantsOfPage},
           {"kDVMaximumTextBytesOfPage", kDVMaximumTextBytesOfPage},
@@ -98,6 +100,7 @@ std::vector<Limit> limits() {
           {"kExtensionProcesses", kExtensionProcesses},
           {"kExtensionOpenFiles", kExtensionOpenFiles},
           {"kExtensionMemory", kExtensionMemory.value_or(kMemoryWithoutSanitizer)},
+          {"ExtensionProcess::kMaximumQuestions", ExtensionProcess::kMaximumQuestions},
           {"OutputLines::kLongestLine", OutputLines::kLongestLine},
           {"OutputLog::kLinesAtOnce", OutputLog::kLinesAtOnce},
           {"kLongestLogText", kLongestLogText},
