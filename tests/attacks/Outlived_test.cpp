@@ -62,7 +62,7 @@ class Outlived : public TwoApplications {
     replace();
     eventually("the next one is known", [this] { return attack({"providers"}) == Lines{"ok"}; });
     eventually("the first one's connection has ended", [this, &connection] { return whoIsAt(connection) != kIsAttacker; });
-    EXPECT_GT(house_.loggedContaining(": its bundle " + kAttacker + " was removed or replaced."), 0);
+    EXPECT_TRUE(house_.awaitLog(": its bundle " + kAttacker + " was removed or replaced."));
     const std::string string = house_.granted(later_, kAttacker);
     EXPECT_EQ(attack({"ask", string}), Lines{"ok"});
     EXPECT_THAT(whoIsAt(connection), Each(StartsWith("QXRpcErrorDomain ")));

@@ -173,9 +173,9 @@ void LinuxRpcListener::endOutdated() {
 void LinuxRpcListener::end(LinuxRpcConnection& connection, const PeerIdentity& peer) const {
   const LogSubject subject(logSubjectFor(peer));
   const std::string reason = "its bundle " + countedAs(peer) + " was removed or replaced";
+  connection.close(refusal(reason));
   surroundings_.log.write(QXLogType::defaultType,
                           "[NOTICE] Closing the connection of PID " + std::to_string(peer.pid) + ": " + reason + ".");
-  connection.close(refusal(reason));
 }
 
 // A declared bundle changes nothing here: it comes later, and only from an unconfined process.
