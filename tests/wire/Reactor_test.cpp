@@ -8,6 +8,7 @@
 
 #include <atomic>
 #include <cstdlib>
+#include <ostream>
 #include <string>
 #include <thread>
 #include <utility>
@@ -17,6 +18,11 @@
 #include "tests/wire/Waiting.h"
 
 namespace docuvend::linux_platform {
+
+static void PrintTo(Reactor::Waiting waiting, std::ostream* stream) {
+  *stream << (waiting == Reactor::Waiting::byEpoll ? "by epoll" : "by poll alone");
+}
+
 namespace {
 
 using tests::Mailbox;

@@ -220,15 +220,13 @@ void Reactor::State::syncRunLater(Ready ready, const std::shared_ptr<Lane>& lane
   }
 }
 
+// One that was dropped meanwhile is found out when its turn comes.
 void Reactor::State::syncLeave(const std::shared_ptr<Lane>& lane) {
-  while (!lane->line.empty()) {
-    const Ready next = lane->line.front();
-    lane->line.pop_front();
-    if (!watches.contains(next.key)) continue;
-    syncPost([this, next, lane] { runTaken(next, lane); });
-    return;
-  }
-  lane->isBusy = false;
+  lane->isBusy = !lane->line.empty();
+  if (!lane->isBusy) return;
+  const Ready next = lane->line.front();
+  lane->line.pop_front();
+  syncPost([this, next, lane] { runTaken(next, lane); });
 }
 
 void Reactor::State::post(std::function<void()> task) {
