@@ -463,6 +463,78 @@ TEST_F(BundleInstallerTest, UninstallingABundleWithDirectoriesThatItsOwnerMayNot
   EXPECT_THAT(entries(), IsEmpty());
 }
 
+// A process of the bundle's can have one, as long as it runs.
+class Lease {
+ public:
+  explicit Lease(const std::string& path) : file_(::open(path.c_str(), O_RDONLY | O_NONBLOCK | O_CLOEXEC)) {
+    // By default who has a lease is ended when somebody wants the file.
+    isTaken_ = file_ && ::fcntl(file_.get(), F_SETSIG, SIGURG) == 0 && ::fcntl(file_.get(), F_SETLEASE, F_WRLCK) == 0;
+  }
+  [[nodiscard]] bool isTaken() const { return isTaken_; }
+  [[nodiscard]] int file() const { return file_.get(); }
+
+ private:
+  const UniqueDescriptor file_;
+  bool isTaken_ = false;
+};
+
+TEST_F(BundleInstallerTest, UninstallingRemovesABundleWhosePropertyListsAreLeased) {
+  for (const char* name : {"/Info.plist", "/Entitlements.plist"}) {
+    installed(source_);
+    BundleHouse::write(user("org.a") + "/Entitlements.plist", BundleHouse::propertyList(""));
+    const Lease lease(user("org.a") + name);
+    ASSERT_TRUE(lease.isTaken()) << name;
+    EXPECT_EQ(uninstall("org.b"), bundleError(BundleErrorCode::notFound, "No bundle org.b is installed."));
+    EXPECT_EQ(uninstall("org.a"), std::nullopt) << name;
+    EXPECT_THAT(entries(), IsEmpty()) << name;
+  }
+}
+
+TEST_F(BundleInstallerTest, UninstallingRemovesALeasedBundleWithItsOtherCopies) {
+  installed(source_);
+  BundleHouse::install(user("other"), "org.a");
+  const Lease lease(user("org.a") + "/Info.plist");
+  ASSERT_TRUE(lease.isTaken());
+  EXPECT_EQ(uninstall("org.a"), std::nullopt);
+  EXPECT_THAT(entries(), IsEmpty());
+}
+
+int leasedFile = -1;
+void giveTheLeaseBack(int /*signal*/) { ::fcntl(leasedFile, F_SETLEASE, F_UNLCK); }
+
+TEST_F(BundleInstallerTest, UninstallingRemovesABundleWhoseLeaseEndsWhenItIsLookedAt) {
+  installed(source_);
+  const Lease lease(user("org.a") + "/Info.plist");
+  ASSERT_TRUE(lease.isTaken());
+  leasedFile = lease.file();
+  ASSERT_NE(::signal(SIGURG, giveTheLeaseBack), SIG_ERR);
+  EXPECT_EQ(uninstall("org.a"), std::nullopt);
+  EXPECT_EQ(::fcntl(lease.file(), F_GETLEASE), F_UNLCK);
+  EXPECT_THAT(entries(), IsEmpty());
+}
+
+// Somebody tries to have a lease at the very moment when a property list is to be read.
+class LeasedPropertyLists : public LinuxPropertyLists {
+ public:
+  std::unique_ptr<std::istream> openStream(const std::string& path) override {
+    const Lease lease(path);
+    return LinuxPropertyLists::openStream(path);
+  }
+};
+
+TEST_F(BundleInstallerTest, UninstallingLetsNobodyTakeALeaseMeanwhile) {
+  installed(source_);
+  LeasedPropertyLists leased;
+  EXPECT_EQ(uninstallBundle("org.a", house_.paths, leased), std::nullopt);
+  EXPECT_THAT(entries(), IsEmpty());
+}
+
+TEST_F(BundleInstallerTest, UninstallingLeavesWhatIsNoBundleThoughItsNameIsAnIdentifier) {
+  BundleHouse::write(user("org.a") + "/Info.plist", "x");
+  EXPECT_EQ(uninstall("org.a"), bundleError(BundleErrorCode::notFound, "No bundle org.a is installed."));
+  EXPECT_THAT(entries(), ElementsAre("org.a"));
+}
+
 TEST_F(BundleInstallerTest, UninstallingFollowsNoLink) {
   installed(source_);
   const std::string outside = house_.root() + "/outside";

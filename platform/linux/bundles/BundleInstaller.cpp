@@ -16,6 +16,7 @@
 
 #include "platform/linux/bundles/BundleCopy.h"
 #include "platform/linux/bundles/BundleErrors.h"
+#include "platform/linux/bundles/BundleIdentifier.h"
 #include "platform/linux/bundles/BundleParser.h"
 #include "platform/linux/bundles/BundleScan.h"
 #include "platform/linux/bundles/GroupMembership.h"
@@ -120,6 +121,27 @@ std::optional<QXError> removeCopy(const UserBundleDirectory& place, const std::s
 
 enum class Occupant { none, brokenBundle };
 
+// The property lists of the bundle that lies at an identifier's name. A process that can read them, the bundle's own extension for one, may
+// have a lease on them, which keeps everybody else from opening them. What is open to this object is leased to nobody while it is there.
+class HeldLists {
+ public:
+  HeldLists(const UserBundleDirectory& place, const std::string& identifier) {
+    if (!isBundleIdentifier(identifier)) return;
+    for (const char* name : {"/Info.plist", "/Entitlements.plist"}) {
+      const std::string path = identifier + name;
+      UniqueDescriptor list(::openat(place.descriptor(), path.c_str(), O_RDONLY | O_NONBLOCK | O_NOCTTY | O_NOFOLLOW | O_CLOEXEC));
+      areLeased_ = areLeased_ || (!list && errno == EWOULDBLOCK);
+      lists_.push_back(std::move(list));
+    }
+  }
+
+  [[nodiscard]] bool areLeased() const { return areLeased_; }
+
+ private:
+  std::vector<UniqueDescriptor> lists_;
+  bool areLeased_ = false;
+};
+
 // What lies at the bundle's own name without being one of its copies, put there by other means. A broken bundle is replaced, anything that
 // means something stays.
 std::variant<Occupant, QXError> occupantOf(const std::string& path, QXPropertyLists& propertyLists) {
@@ -180,7 +202,10 @@ std::optional<QXError> uninstallBundle(const std::string& identifier, const Path
   auto opened = UserBundleDirectory::open(paths, UserBundleDirectory::Absence::isAnError);
   if (auto* failure = std::get_if<QXError>(&opened)) return std::move(*failure);
   const auto& place = std::get<UserBundleDirectory>(opened);
+  const HeldLists lists(place, identifier);
   auto copies = copiesOf(identifier, place.path(), propertyLists);
+  const bool isNamed = std::find(copies.begin(), copies.end(), identifier) != copies.end();
+  if (lists.areLeased() && !isNamed) copies.push_back(identifier);
   if (copies.empty()) return unknown;
   std::reverse(copies.begin(), copies.end());
   for (const std::string& name : copies) {

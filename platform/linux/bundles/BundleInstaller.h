@@ -44,7 +44,8 @@ struct InstalledBundle {
 [[nodiscard]] std::variant<InstalledBundle, QXError> installBundle(const std::string& directory, const Paths& paths,
                                                                    QXPropertyLists& propertyLists);
 
-// Removes every copy of the identifier from the user's directory. Likewise an error; notFound when there is none.
+// Removes every copy of the identifier from the user's directory, and what lies there under that name while a lease keeps its property
+// lists from being read. Likewise an error; notFound when there is none.
 [[nodiscard]] std::optional<QXError> uninstallBundle(const std::string& identifier, const Paths& paths, QXPropertyLists& propertyLists);
 
 }  // namespace docuvend::linux_platform
