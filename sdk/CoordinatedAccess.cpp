@@ -1,8 +1,10 @@
 #include "sdk/CoordinatedAccess.h"
 
+#include <thread>
 #include <utility>
 
 #include "platform/linux/wire/FileCoordinationProtocol.h"
+#include "platform/rpc_errors.h"
 #include "sdk/ConsumerErrors.h"
 #include "sdk/ServiceConnections.h"
 
@@ -21,6 +23,14 @@ bool isOfConnection(const QXError& error) {
   const auto code = static_cast<ConsumerErrorCode>(error.code);
   return code == ConsumerErrorCode::unreachable || code == ConsumerErrorCode::connectionLost;
 }
+
+// This process's other requests leave no room on the connection: the daemon was not asked.
+bool isForWantOfRoom(const QXError& error) {
+  return error.domain == kQXRpcErrorDomain && error.code == static_cast<std::int64_t>(QXRpcErrorCode::tooManyCalls);
+}
+
+constexpr int kMostTries = 100;
+constexpr std::chrono::milliseconds kPause{10};
 
 }  // namespace
 
@@ -48,7 +58,14 @@ bool CoordinatedAccess::isHeld() const { return connection_ && !connection_->has
 Failure CoordinatedAccess::end() {
   const auto connection = std::exchange(connection_, nullptr);
   if (!connection) return std::nullopt;
-  auto failure = errorOf(ServiceConnections::askOver<&QXFileCoordination::endAccess>(*connection, {after(deadline_)}, accessID_));
+  const auto until = after(deadline_);
+  const auto ask = [&] { return errorOf(ServiceConnections::askOver<&QXFileCoordination::endAccess>(*connection, {until}, accessID_)); };
+  auto failure = ask();
+  for (int tries = 1; tries < kMostTries && failure && isForWantOfRoom(*failure); ++tries) {
+    std::this_thread::sleep_for(kPause);
+    failure = ask();
+  }
+  if (failure && isForWantOfRoom(*failure)) connection->endpoint->close(*failure);
   if (!failure || !isOfConnection(*failure)) return failure;
   QXError lost = makeConsumerError(ConsumerErrorCode::connectionLost, "The access ended with its connection to the Docuvend daemon.");
   lost.underlying = failure->underlying;

@@ -93,6 +93,8 @@ class CoordinatedAccess {
   //
   // Failures. `connectionLost`: the daemon ended meanwhile and took the access with it; others may have had the file before this one was
   // done, and of a write the provider may not have been told: finishedWriting tells it. `deadlinePassed`: the access still ends.
+  // An error of the wire, when this process's other requests leave no room for this one for a second: then the connection ends, and
+  // with it this access and all others over it.
   [[nodiscard]] Failure end();
 
  private:

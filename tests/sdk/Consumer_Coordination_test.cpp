@@ -14,6 +14,7 @@
 #include <vector>
 
 #include "common/DVErrors.h"
+#include "platform/rpc_errors.h"
 #include "sdk/Consumer.h"
 #include "tests/sdk/ScriptedDaemon.h"
 #include "tests/support/Eventually.h"
@@ -46,6 +47,9 @@ class ConsumerCoordinationTest : public ConsumerTest {
   ~ConsumerCoordinationTest() override {
     consumer_.reset();
     stopServices();
+  }
+  [[nodiscard]] static QXError noRoom() {
+    return QXError::make(kQXRpcErrorDomain, static_cast<std::int64_t>(QXRpcErrorCode::tooManyCalls), "too much waits");
   }
   [[nodiscard]] const QXURL& url() const { return *script_.url; }
   // Nothing but a test's own deadline ends a wait, and a daemon that is gone is missed at once.
@@ -267,6 +271,23 @@ TEST_F(ConsumerCoordinationTest, WhatBecameOfTheEndIsTold) {
   auto access = taken(patient().coordinateWriting(url()));
   script_.endError = coordinationError(FileCoordinationErrorCode::invalidAccessID);
   EXPECT_EQ(access.end(), script_.endError);
+}
+
+TEST_F(ConsumerCoordinationTest, AnEndForWhichThereIsNoRoomIsTriedAgain) {
+  startServices();
+  auto access = taken(patient().coordinateWriting(url()));
+  script_.ending = [this](QXFileCoordination::ErrorReply reply) { reply(count("end") < 3 ? std::optional(noRoom()) : std::nullopt); };
+  EXPECT_EQ(access.end(), std::nullopt);
+  EXPECT_EQ(count("end"), 3U);
+}
+
+TEST_F(ConsumerCoordinationTest, AnEndForWhichThereIsNoRoomForLongEndsTheConnection) {
+  startServices();
+  auto access = taken(patient().coordinateWriting(url()));
+  const auto other = taken(consumer_->coordinateReading(url()));
+  script_.endError = noRoom();
+  EXPECT_EQ(access.end(), noRoom());
+  eventually("what was taken over the connection has ended with it", [&other] { return !other.isHeld(); });
 }
 
 TEST_F(ConsumerCoordinationTest, AnAccessMovesWithItsEnd) {
