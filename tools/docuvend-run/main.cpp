@@ -11,6 +11,8 @@
 #include "platform/linux/files/LinuxPropertyLists.h"
 #include "platform/linux/launch/ConfinedLaunch.h"
 #include "tools/docuvend-run/HeldLog.h"
+#include "tools/docuvend-run/OwnTerminal.h"
+#include "tools/docuvend-run/UserTerminal.h"
 
 namespace docuvend::linux_platform {
 namespace {
@@ -25,7 +27,8 @@ constexpr const char* kHelp =
     "\n"
     "Starts the installed application BUNDLE-ID, confined to its bundle, its container and its group containers.\n"
     "It gets descriptors 0 to 2, a cleared environment and its container as working directory and HOME, and ends\n"
-    "with the process that started it.\n"
+    "with the process that started it. In place of those that are a terminal it gets a terminal of its own: what is\n"
+    "typed reaches it only while it is in the foreground. ^C ends it, ^Z stops docuvend-run.\n"
     "\n"
     "Exit status: the application's own, 128 and its number when a signal ended it, or\n"
     "    1  bubblewrap could not build the confinement\n"
@@ -71,7 +74,11 @@ int run(const std::vector<std::string>& arguments) {
   auto plan = planLaunch(bundle->second, {arguments.begin() + 1, arguments.end()}, LaunchKind::application,
                          /*extensionSocket=*/std::nullopt, std::get<Paths>(paths));
   if (const auto* error = std::get_if<QXError>(&plan)) return fail(kCannotLaunch, error->description());
-  return fail(kCannotLaunch, execute(std::get<LaunchPlan>(std::move(plan))).description());
+  UserTerminal terminal;
+  if (terminal.replaced().empty()) return fail(kCannotLaunch, execute(std::get<LaunchPlan>(std::move(plan))).description());
+  const auto ending = OwnTerminal(terminal).run(std::get<LaunchPlan>(std::move(plan)));
+  if (const auto* error = std::get_if<QXError>(&ending)) return fail(kCannotLaunch, error->description());
+  return std::get<int>(ending);
 }
 
 }  // namespace

@@ -4,12 +4,14 @@
 #include <fcntl.h>
 #include <sched.h>
 #include <signal.h>
+#include <sys/ioctl.h>
 #include <sys/mount.h>
 #include <sys/resource.h>
 #include <sys/socket.h>
 #include <sys/stat.h>
 #include <sys/un.h>
 #include <sys/wait.h>
+#include <termios.h>
 #include <unistd.h>
 
 #include <algorithm>
@@ -194,6 +196,40 @@ bool isListedKey(const std::string& description) {
   return false;
 }
 
+std::string nextLine(int file) {
+  std::string line;
+  for (char byte = 0; ::read(file, &byte, 1) == 1 && byte != '\n';) line += byte;
+  return line;
+}
+
+std::string makeRaw() {
+  termios modes{};
+  if (::tcgetattr(STDIN_FILENO, &modes) != 0) return outcome(-1);
+  ::cfmakeraw(&modes);
+  modes.c_oflag |= OPOST;
+  return outcome(::tcsetattr(STDIN_FILENO, TCSANOW, &modes));
+}
+
+std::string sizeOf(int terminal) {
+  winsize size{};
+  if (::ioctl(terminal, TIOCGWINSZ, &size) != 0) return outcome(-1);
+  return std::to_string(size.ws_row) + "x" + std::to_string(size.ws_col);
+}
+
+std::string awaitSize(const std::string& size) {
+  constexpr int kMostLooks = 6000;
+  for (int i = 0; i < kMostLooks; ++i) {
+    if (sizeOf(STDIN_FILENO) == size) return "ok";
+    ::usleep(10'000);
+  }
+  return sizeOf(STDIN_FILENO);
+}
+
+std::string flood(int lines) {
+  for (int i = 1; i <= lines; ++i) std::printf("line %d\n", i);
+  return "ok";
+}
+
 std::string attempt(const std::string& what, const std::string& subject) {
   int socket = -1;
   if (what == "read") return openAndClose(subject, O_RDONLY);
@@ -247,6 +283,11 @@ std::string attempt(const std::string& what, const std::string& subject) {
     char path[4096];
     return ::getcwd(path, sizeof(path)) == nullptr ? outcome(-1) : path;
   }
+  if (what == "line") return nextLine(std::atoi(subject.c_str()));
+  if (what == "settings") return makeRaw();
+  if (what == "size") return sizeOf(std::atoi(subject.c_str()));
+  if (what == "await-size") return awaitSize(subject);
+  if (what == "flood") return flood(std::atoi(subject.c_str()));
   if (what == "exit") std::exit(std::atoi(subject.c_str()));
   if (what == "die") ::raise(std::atoi(subject.c_str()));
   return "unknown";
