@@ -144,13 +144,14 @@ void OwnTerminal::relay() {
 
 void OwnTerminal::await() {
   const bool isInFront = own_ && !isEnding_ && user_.isInFront();
-  if (isInFront) user_.enterRawMode();
+  if (isInFront && !wasInFront_) user_.enterRawMode();
+  wasInFront_ = isInFront;
   const auto when = [](bool isWanted, int descriptor, short events) { return pollfd{isWanted ? descriptor : -1, events, 0}; };
   std::array<pollfd, 5> waits = {when(true, signals_.get(), POLLIN), when(isInFront && input_.empty(), user_.input(), POLLIN),
                                  when(own_ && !input_.empty(), own_.get(), POLLOUT), when(own_ && output_.empty(), own_.get(), POLLIN),
                                  when(!output_.empty(), user_.output(), POLLOUT)};
   int patience = own_ && user_.input() >= 0 && !isInFront && !isEnding_ ? kLookForFront : -1;
-  if (ended_ && output_.empty()) patience = 0;
+  if (ended_ && (output_.empty() || isEnding_)) patience = 0;
   if (::poll(waits.data(), waits.size(), patience) < 0) return;
 
   // A stop comes before what was typed after it.
@@ -159,6 +160,8 @@ void OwnTerminal::await() {
   if (waits[2].revents != 0) giveInput();
   if (waits[3].revents != 0 || (ended_ && output_.empty())) takeOutput();
   if (waits[4].revents != 0) giveOutput();
+  // Whoever ends it does not wait until a terminal that was held up goes on.
+  if (ended_ && isEnding_ && waits[4].fd >= 0 && waits[4].revents == 0) hangUp();
   if ((waits[1].revents & POLLHUP) != 0) hangUp();
 }
 
@@ -169,6 +172,7 @@ void OwnTerminal::takeSignals() {
 
 void OwnTerminal::takeSignal(int number) {
   if (number == SIGTSTP) return stop();
+  if (number == SIGCONT) wasInFront_ = false;  // others may have set the terminal meanwhile
   if (number == SIGCONT || number == SIGWINCH) return giveSize();
   if (number != SIGCHLD) return pass(number == starterEnded() ? SIGKILL : number);
   int status = 0;
@@ -186,6 +190,7 @@ void OwnTerminal::pass(int number) {
 // By the signal's own action, which the kernel leaves out where nobody could continue this process.
 void OwnTerminal::stop() {
   user_.leaveRawMode();
+  wasInFront_ = false;
   const sigset_t one = setOf(SIGTSTP);
   ::raise(SIGTSTP);
   ::sigprocmask(SIG_UNBLOCK, &one, nullptr);

@@ -51,6 +51,7 @@ class OwnTerminal {
   linux_platform::UniqueDescriptor signals_;
   sigset_t maskBefore_{};
   pid_t child_ = -1;
+  bool wasInFront_ = false;   // at the last look, and in raw mode since
   bool isEnding_ = false;     // a signal that ends it was passed on
   std::optional<int> ended_;  // as waitpid says it
   std::string input_;         // typed, and not yet passed on

@@ -13,12 +13,15 @@
 //
 //   type TEXT               as if somebody had typed it at the terminal that is its standard input
 //   take-terminal           makes that terminal the controlling one of a session of its own
-//   terminal                has its session one? What the console's own controls ask before they insert its selection
+//   upset-terminal          takes echo, lines and the signals' characters from it
+//   overhear NAME           makes the file NAME.holding, and reads that terminal until NAME.go is there; what it has read so far is in
+//   NAME.heard terminal                has its session one? What the console's own controls ask before they insert its selection
 //
 //   descriptors             the numbers that are open
 //   variables               the names in its environment
 //   status FIELD            of its own process
 #include <fcntl.h>
+#include <poll.h>
 #include <signal.h>
 #include <sys/ioctl.h>
 #include <sys/prctl.h>
@@ -28,11 +31,13 @@
 #include <sys/uio.h>
 #include <sys/un.h>
 #include <sys/wait.h>
+#include <termios.h>
 #include <unistd.h>
 
 #include <algorithm>
 #include <cerrno>
 #include <charconv>
+#include <chrono>
 #include <cstddef>
 #include <cstring>
 #include <filesystem>
@@ -43,6 +48,7 @@
 
 #include "platform/linux/base/UniqueDescriptor.h"
 #include "tests/attacks/attacker/Acts.h"
+#include "tests/wire/Waiting.h"
 
 extern char** environ;
 
@@ -156,6 +162,31 @@ std::string takeTerminal(Words& /*words*/) {
   return outcome(errno == 0 ? 0 : -1);
 }
 
+std::string upsetTerminal(Words& /*words*/) {
+  termios modes{};
+  if (::tcgetattr(STDIN_FILENO, &modes) != 0) return outcome(-1);
+  modes.c_lflag &= ~static_cast<tcflag_t>(ECHO | ICANON | ISIG);
+  return outcome(::tcsetattr(STDIN_FILENO, TCSANOW, &modes));
+}
+
+std::string overhear(Words& words) {
+  constexpr int kBetweenLooks = 10;
+  const std::string name = words.next();
+  std::ofstream heard(name + ".heard");
+  std::ofstream(name + ".holding").close();
+  const auto deadline = std::chrono::steady_clock::now() + tests::kPatience;
+  while (!std::filesystem::exists(name + ".go")) {
+    if (std::chrono::steady_clock::now() > deadline) return "nobody came";
+    pollfd waiting{STDIN_FILENO, POLLIN, 0};
+    if (::poll(&waiting, 1, kBetweenLooks) != 1) continue;
+    char bytes[256];
+    const ssize_t count = ::read(STDIN_FILENO, bytes, sizeof(bytes));
+    if (count <= 0) return outcome(count);
+    heard.write(bytes, count).flush();
+  }
+  return "ok";
+}
+
 // The number of the controlling terminal, the fifth field after the program's name, is 0 without one.
 bool hasTerminal() {
   std::string stat;
@@ -218,6 +249,8 @@ Acts surroundingsActs() {
       {"type", type},
       {"terminal", [](Words&) { return hasTerminal() ? "there" : "none"; }},
       {"take-terminal", takeTerminal},
+      {"upset-terminal", upsetTerminal},
+      {"overhear", overhear},
       {"descriptors", descriptors},
       {"variables", variables},
       {"status", status},
