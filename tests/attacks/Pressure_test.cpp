@@ -89,12 +89,6 @@ TEST_F(Pressure, HalfFramesOccupyTheirOwnConnectionsAlone) {
   EXPECT_THAT(letGo(*attacker, "halves"), ElementsAre("ok", "ok"));
 }
 
-TEST_F(Pressure, WhoReadsNoAnswersIsDroppedAndTheNextRequestIsServed) {
-  EXPECT_THAT(attack({"deaf", kDVServiceName, "crowd", kDVServiceName, "1"}), ElementsAre("ended", "1 served, 0 refused"));
-  EXPECT_TRUE(house_.awaitLog(": the peer does not read what is sent to it"));
-  expectOthersAreServed();
-}
-
 TEST_F(Pressure, TurnsThatAreNeverEndedAreTheirOwnersAndOfALimitedNumber) {
   ASSERT_THAT(attack({"terminal"}), ElementsAre("none"));  // now its container is there
   const std::string own = house_.container(kAttacker) + "/own";

@@ -446,7 +446,7 @@ TEST_F(Administration, TheStatusSaysHowTheDaemonIs) {
 
   const auto* protections = qxFind<QXArray>(status, "protections");
   ASSERT_NE(protections, nullptr);
-  EXPECT_EQ(protections->size(), 4U);
+  EXPECT_EQ(protections->size(), 5U);
   for (const QXValue& sentence : *protections) EXPECT_EQ(house_.logged("[NOTICE] " + *sentence.as<std::string>()), 1);
 
   const auto* providers = qxFind<QXDictionary>(status, "providers");

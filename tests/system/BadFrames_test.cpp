@@ -9,9 +9,11 @@
 #include <unistd.h>
 
 #include <algorithm>
+#include <cerrno>
 #include <ostream>
 #include <vector>
 
+#include "platform/linux/identity/KernelFacilities.h"
 #include "platform/linux/wire/ConnectToSocket.h"
 #include "platform/linux/wire/Limits.h"
 #include "platform/linux/wire/SandboxProtocol.h"
@@ -229,16 +231,27 @@ TEST_F(BadFrames, ValuesWithinValuesHaveABound) {
   expectDropped(peer, QXRpcErrorCode::malformedFrame, "values nested too deeply");
 }
 
-TEST_F(BadFrames, DescriptorsThatNothingDeclaresEndTheConnectionAndAreClosed) {
+// The kernel refuses them to their sender, where it can: then nothing has been said, and the connection is as it was.
+TEST_F(BadFrames, DescriptorsAreRefusedOrEndTheConnectionAndAreClosed) {
   std::array<int, 2> pipe{-1, -1};
   ASSERT_EQ(::pipe2(pipe.data(), O_CLOEXEC), 0);
   const UniqueDescriptor reading(pipe[0]);
   UniqueDescriptor writing(pipe[1]);
   const RawPeer peer = connect();
   const std::array<int, 1> passed{writing.get()};
-  ASSERT_TRUE(peer.write(hello() + wakeUp(1), passed));
+  const bool isPassed = peer.write(hello() + wakeUp(1), passed);
+  const int problem = errno;
   writing.reset();
-  expectDropped(peer, QXRpcErrorCode::malformedFrame, "descriptors that no frame declares");
+  if (linux_platform::KernelFacilities::probe().refusedDescriptors) {
+    EXPECT_FALSE(isPassed);
+    EXPECT_EQ(problem, EPERM);
+    ASSERT_TRUE(peer.write(hello() + wakeUp(1)));
+    EXPECT_TRUE(peer.read<Hello>());
+    EXPECT_TRUE(peer.read<ReplyFrame>());
+  } else {
+    ASSERT_TRUE(isPassed);
+    expectDropped(peer, QXRpcErrorCode::malformedFrame, "descriptors that no frame declares");
+  }
   // The pipe's end comes when nobody has the passed copy any more.
   pollfd waiting{reading.get(), POLLIN, 0};
   ASSERT_EQ(::poll(&waiting, 1, static_cast<int>(std::chrono::milliseconds(kPatience).count())), 1);

@@ -3,7 +3,6 @@
 //   crowd SERVICE COUNT     opens connections and has each answered; how many were served, how many refused
 //   garble SERVICE          sends, each over a connection of its own, what is no frame; how many of these connections were ended for it
 //   half SERVICE COUNT      opens connections and sends each the beginning of a frame
-//   deaf SERVICE            sends requests and reads no answer, until the connection ends
 //   turns URL COUNT         takes turns at a file and does not end them; how many it got, and the error of the first that it did not get
 //   scribble PATH PROVIDER CONSUMER FILES WRITES
 //                           grants itself so many files, PATH with a number behind it, and writes each so often in a turn of its own; how
@@ -55,7 +54,6 @@ using Bytes = std::vector<std::uint8_t>;
 
 constexpr const char* kWakeUp = "wakeUpCompletion:";
 constexpr const char* kStart = "startProvidingItemAtURL:fromProviderID:forConsumerID:completionHandler:";
-constexpr std::uint64_t kMostRequests = 2'000'000;
 // More than any limit of a confinement, less than what a machine could not bear.
 constexpr int kMostProcesses = 3'000;
 constexpr int kMostMessages = 2'000;
@@ -148,18 +146,6 @@ std::string sendHalves(Words& words) {
     if (!hoard().peers.back().write(std::span(whole).first(whole.size() - 1))) return "ended";
   }
   return "ok";
-}
-
-std::string stayDeaf(Words& words) {
-  const RawPeer peer = connectTo(words.next());
-  if (!peer.sayHello()) return "ended at once";
-  Bytes batch;
-  for (std::uint64_t number = 0; number < kMostRequests;) {
-    batch.clear();
-    for (int i = 0; i < 200; ++i) batch = std::move(batch) + bytesOf(RequestFrame{++number, true, std::string(250, 'x'), {}});
-    if (!peer.write(batch)) return "ended";
-  }
-  return "served for ever";
 }
 
 // An access's identifier is the connection's own matter.
@@ -296,7 +282,6 @@ Acts pressureActs() {
   return {{"crowd", crowd},
           {"garble", garble},
           {"half", sendHalves},
-          {"deaf", stayDeaf},
           {"turns", takeTurns},
           {"scribble", scribble},
           {"start", [](Words& words) { return startAgainAndAgain(words, Answers::wanted); }},
