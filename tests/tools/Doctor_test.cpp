@@ -36,14 +36,16 @@ TEST_F(Doctor, FindsTheDaemonAndEveryProtectionThatThisKernelGives) {
   house_.install(kEditor);
   house_.startDaemon();
   const auto kernel = linux_platform::KernelFacilities::probe();
-  const bool isNewest = kernel.peerPidfd && kernel.pidfdNamespaces && kernel.uniquePidfdInodes && kernel.refusedDescriptors && kernel.landlockLevel >= 6;
+  const bool isNewest =
+      kernel.peerPidfd && kernel.pidfdNamespaces && kernel.uniquePidfdInodes && kernel.refusedDescriptors && kernel.landlockLevel >= 6;
   const Ending ending = house_.ctl({"doctor", "--json"});
   EXPECT_EQ(ending.status, isNewest ? kDone : kMissing) << ending.output;
   EXPECT_EQ(ending.errors, "");
   const JSON findings = JSON::parse(ending.output);
   EXPECT_EQ(findingOf(findings, "daemon").second, "process " + std::to_string(house_.daemon().pid()) + " answers");
-  for (const char* protection : {"ordinary user", "run-time directory", "user namespaces", "bubblewrap", "docuvend-confine", "Landlock", "system calls",
-                                 "confinement", "directories", "bundles", "watches", "daemon", "daemon's kernel", "daemon's privileges"}) {
+  for (const char* protection :
+       {"ordinary user", "run-time directory", "user namespaces", "bubblewrap", "docuvend-confine", "Landlock", "system calls",
+        "confinement", "directories", "bundles", "watches", "daemon", "daemon's kernel", "daemon's privileges"}) {
     EXPECT_EQ(findingOf(findings, protection).first, "in force") << protection << ": " << findingOf(findings, protection).second;
   }
 }
