@@ -48,6 +48,10 @@ class OwnTerminal : public ConfinedTest {
     shell_->type("read x; echo \"shell: $x\"\n" + text + "\n");
     shell_->await("shell: " + text);
   }
+  void expectItEnds(const UniqueDescriptor& process) {
+    pollfd waiting{process.get(), POLLIN, 0};
+    EXPECT_EQ(::poll(&waiting, 1, static_cast<int>(std::chrono::milliseconds(tests::kPatience).count())), 1) << "it goes on";
+  }
   std::string contents(const std::string& name) const {
     std::ifstream file(house_.root() + "/" + name);
     return {std::istreambuf_iterator<char>(file), {}};
@@ -142,8 +146,18 @@ TEST_F(OwnTerminal, EndsWithTheProcessThatStartedIt) {
   const auto process = openPidfd(std::stoi(contents("number")));
   ASSERT_TRUE(process);
   shell_->end();
-  pollfd waiting{process.get(), POLLIN, 0};
-  EXPECT_EQ(::poll(&waiting, 1, static_cast<int>(std::chrono::milliseconds(tests::kPatience).count())), 1) << "it goes on";
+  expectItEnds(process);
+}
+
+TEST_F(OwnTerminal, TerminatedItDoesNotWaitForATerminalThatIsHeldUp) {
+  shell_->type("sh -c 'echo $$ >" + house_.root() + "/number; exec docuvend-run org.a flood 100000000'; echo status $?\n");
+  shell_->await("line 1000\r");
+  const auto process = openPidfd(std::stoi(contents("number")));
+  ASSERT_TRUE(process);
+  eventually("it is held up", [this] { return shell_->isFull(); });
+  signalPidfd(process, SIGTERM);
+  expectItEnds(process);
+  shell_->await("status 143");
 }
 
 TEST_F(OwnTerminal, ItsSizeFollowsTheUsers) {

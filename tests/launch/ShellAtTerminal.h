@@ -1,6 +1,7 @@
 // A shell with job control at a terminal of its own, at which a test types and looks. It leaves the terminal's modes to what it starts.
 #pragma once
 
+#include <fcntl.h>
 #include <gtest/gtest.h>
 #include <poll.h>
 #include <pty.h>
@@ -71,6 +72,12 @@ class ShellAtTerminal {
   }
   // Are the characters passed on as they are typed?
   [[nodiscard]] bool isRaw() const { return (modes().c_lflag & (ICANON | ECHO)) == 0; }
+  // It takes nothing more until the test reads.
+  [[nodiscard]] bool isFull() const {
+    const linux_platform::UniqueDescriptor side(::ioctl(terminal_.get(), TIOCGPTPEER, O_RDWR | O_NOCTTY | O_CLOEXEC));
+    pollfd waiting{side.get(), POLLOUT, 0};
+    return side && ::poll(&waiting, 1, 0) == 0;
+  }
   void resize(unsigned short rows, unsigned short columns) const {
     const winsize size{rows, columns, 0, 0};
     EXPECT_EQ(::ioctl(terminal_.get(), TIOCSWINSZ, &size), 0);
