@@ -28,6 +28,13 @@ bool isTaken(DVGrantTree& tree, const DVGrant& grant) {
   return hasRoomFor(tree, grant) && tree.allow(grant.provider, grant.item, grant.consumer);
 }
 
+TEST(DVGrantLimits, HalfOfWhatAProviderMayHaveIsKeptAndEightThatTakeAllFitTheFile) {
+  constexpr std::size_t kFile = std::size_t{16} << 20U;
+  EXPECT_EQ(kDVBytesKeptForEntitled + kDVBytesKeptForEntitled, kDVMaximumBytesOfProvider);
+  EXPECT_EQ(kDVConsumersKeptForEntitled + kDVConsumersKeptForEntitled, kDVMaximumConsumersOfItem);
+  EXPECT_EQ(8 * kDVMaximumBytesOfProvider, kFile / 2) << "what is edited in by hand has room beside them";
+}
+
 TEST(DVGrantLimits, AConsumersIdentifierIsNoLongerThanItsLimit) {
   const std::string longest(kDVLongestGrantedConsumerID, 'c');
   EXPECT_TRUE(hasRoomFor({}, {kCellar, ConsumerID{longest}, kItem}));
