@@ -124,7 +124,7 @@ TEST_F(AccessProgress, IsAbsentWhileTheAccessWaitsForItsTurnAndAfterItsEndThereI
 }
 
 TEST_F(AccessProgress, IsOfARegularFileThatIsStillWhereTheURLLed) {
-  const auto known = [this](const QXURL& url) {
+  const auto known = [](const QXURL& url) {
     const auto placed = KeyedFile::of(url);
     EXPECT_TRUE(std::holds_alternative<KeyedFile>(placed));
     return std::get<KeyedFile>(placed).key;

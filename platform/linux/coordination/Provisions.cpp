@@ -23,14 +23,14 @@ Provisions::Joined Provisions::join(const Provider& provider, const FileKey& fil
 void Provisions::leave(AccessNumber number) {
   const auto left = waiting_.extract(number);
   if (left.empty()) return;
-  const auto& [wanted, application] = left.mapped();
-  const auto found = requests_.find(wanted);
+  const Waiting& gone = left.mapped();
+  const auto found = requests_.find(gone.request);
   Request& request = found->second;
   std::erase(request.state.waiting, number);
   if (request.underWay) return;
   const bool isLast = std::none_of(request.state.waiting.begin(), request.state.waiting.end(),
-                                   [this, &application](AccessNumber other) { return waiting_.at(other).application == application; });
-  if (isLast) lines_.leave(request.state.provider, application, request.state.file);
+                                   [this, &gone](AccessNumber other) { return waiting_.at(other).application == gone.application; });
+  if (isLast) lines_.leave(request.state.provider, gone.application, request.state.file);
   if (!request.state.waiting.empty()) return;
   numbers_.erase({request.state.provider, request.state.file});
   requests_.erase(found);
