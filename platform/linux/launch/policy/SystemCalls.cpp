@@ -3,10 +3,9 @@
 //   keys                 are found by the user, not by a path: /proc/keys names those of all sessions of the user, and the quota is one for
 //                        all of them, so that one process could keep every other from making a key.
 //   io_uring             makes calls without making them: what it does passes no filter. Libraries fall back to ordinary calls.
-//   leases, delegations  of a file hold up everybody else who opens it, who may only read it though; a bundle can read its own bundle, and
-//   a
-//                        consumer its documents. EINVAL is what file systems without leases say. A provider's documents are its own, and
-//                        a lease tells it that nobody has one open: it may have them.
+//   leases, delegations  of a file hold up everybody else who opens it, and who may only read it may take one: a bundle of itself, a
+//                        consumer of its documents. EINVAL is what file systems without leases say. A provider's documents are its own,
+//                        and a lease tells it that nobody has one open: it may have them.
 //   SO_LINGER            makes the close of a TCP socket wait, in whatever process that happens: the socket can be sent away.
 //   AF_VSOCK             is another way out than the network: it leads to the host of a virtual machine, or to its guests.
 //   TIOCSTI, TIOCLINUX   type into the terminal that a launcher left open.
