@@ -72,11 +72,10 @@ class ShellAtTerminal {
   }
   // Are the characters passed on as they are typed?
   [[nodiscard]] bool isRaw() const { return (modes().c_lflag & (ICANON | ECHO)) == 0; }
-  // It takes nothing more until the test reads.
-  [[nodiscard]] bool isFull() const {
+  // TCOOFF: it takes nothing more, until TCOON.
+  void flow(int action) const {
     const linux_platform::UniqueDescriptor side(::ioctl(terminal_.get(), TIOCGPTPEER, O_RDWR | O_NOCTTY | O_CLOEXEC));
-    pollfd waiting{side.get(), POLLOUT, 0};
-    return side && ::poll(&waiting, 1, 0) == 0;
+    EXPECT_EQ(::tcflow(side.get(), action), 0);
   }
   void resize(unsigned short rows, unsigned short columns) const {
     const winsize size{rows, columns, 0, 0};
