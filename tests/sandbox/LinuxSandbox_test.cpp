@@ -201,6 +201,14 @@ TEST_F(LeavingGroups, EndsThemWhenTheBundleIsRemovedAndInstalledAgain) {
   EXPECT_NE(sandbox->checkWithoutReport(editor, kQXSandboxFileWriteData, document), 0);
 }
 
+TEST_F(LeavingGroups, TakesFromNobodyWhatIsOfOtherGroups) {
+  ASSERT_TRUE(opens(other_));
+  ASSERT_EQ(sandbox->checkWithoutReport(editor, kQXSandboxFileWriteData, otherDocument), 0);
+  bundles.remove(provider_.identifier);
+  changed();
+  EXPECT_EQ(sandbox->checkWithoutReport(editor, kQXSandboxFileWriteData, otherDocument), 0);
+}
+
 TEST_F(LeavingGroups, IsHeldToAfterARestart) {
   bundles.remove(provider_.identifier);
   changed();

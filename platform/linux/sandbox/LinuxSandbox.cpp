@@ -99,7 +99,7 @@ std::variant<UniqueDescriptor, QXError> LinuxSandbox::redeem(const QXAuditToken&
   auto redeemed = redeemer_.redeem(token, use);
   if (auto* error = std::get_if<QXError>(&redeemed)) return std::move(*error);
   auto& file = std::get<RedeemedFile>(redeemed);
-  if (use == TokenUse::writing) ledger_.enter(peer->instance, file.identity);
+  if (use == TokenUse::writing) ledger_.enter(peer->instance, {file.identity, file.path});
   return std::move(file.file);
 }
 
@@ -121,7 +121,7 @@ std::optional<QXError> LinuxSandbox::replaceItemNow(const std::string& instance,
   if (auto* error = std::get_if<QXError>(&replaced)) return std::move(*error);
   auto& item = std::get<ReplacedItem>(replaced);
   // The item is another object now, and the one who put it there may say that it has written it.
-  ledger_.enter(instance, item.identity);
+  ledger_.enter(instance, {item.identity, item.path});
   return TokenRedeemer::forceToDisk(std::move(item));
 }
 

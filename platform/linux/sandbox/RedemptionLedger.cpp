@@ -1,10 +1,11 @@
 #include "platform/linux/sandbox/RedemptionLedger.h"
 
 #include <algorithm>
+#include <utility>
 
 namespace docuvend::linux_platform {
 
-void RedemptionLedger::enter(const std::string& instance, const ObjectIdentity& object) {
+void RedemptionLedger::enter(const std::string& instance, Written written) {
   if (instance.empty()) return;
   const std::lock_guard lock(mutex_);
   const auto found = std::find_if(entries_.begin(), entries_.end(), [&](const Entry& entry) { return entry.instance == instance; });
@@ -15,9 +16,19 @@ void RedemptionLedger::enter(const std::string& instance, const ObjectIdentity& 
     std::rotate(found, found + 1, entries_.end());
   }
   auto& objects = entries_.back().objects;
-  objects.erase(std::remove(objects.begin(), objects.end(), object), objects.end());
+  std::erase_if(objects, [&written](const Written& other) { return other.object == written.object; });
   if (objects.size() == kMaximumObjectsPerInstance) objects.pop_front();
-  objects.push_back(object);
+  objects.push_back(std::move(written));
+}
+
+void RedemptionLedger::forgetBelow(const std::vector<std::string>& directories) {
+  const auto liesBelow = [&directories](const Written& written) {
+    return std::any_of(directories.begin(), directories.end(),
+                       [&written](const std::string& directory) { return written.path.starts_with(directory); });
+  };
+  const std::lock_guard lock(mutex_);
+  for (Entry& entry : entries_) std::erase_if(entry.objects, liesBelow);
+  std::erase_if(entries_, [](const Entry& entry) { return entry.objects.empty(); });
 }
 
 void RedemptionLedger::forgetAll() {
@@ -29,7 +40,8 @@ bool RedemptionLedger::holds(const std::string& instance, const ObjectIdentity& 
   if (instance.empty()) return false;
   const std::lock_guard lock(mutex_);
   const auto found = std::find_if(entries_.begin(), entries_.end(), [&](const Entry& entry) { return entry.instance == instance; });
-  return found != entries_.end() && std::find(found->objects.begin(), found->objects.end(), object) != found->objects.end();
+  return found != entries_.end() &&
+         std::any_of(found->objects.begin(), found->objects.end(), [&object](const Written& written) { return written.object == object; });
 }
 
 }  // namespace docuvend::linux_platform

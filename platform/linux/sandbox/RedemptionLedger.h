@@ -19,15 +19,22 @@ class RedemptionLedger {
   static constexpr std::size_t kMaximumObjectsPerInstance = 256;
   static constexpr std::size_t kMaximumInstances = 256;
 
+  struct Written {
+    ObjectIdentity object;
+    std::string path;  // by which it was named
+  };
+
   // An empty instance names nobody's launch and is not entered.
-  void enter(const std::string& instance, const ObjectIdentity& object);
+  void enter(const std::string& instance, Written written);
+  // What was named by a path that begins with one of these; they end in "/".
+  void forgetBelow(const std::vector<std::string>& directories);
   void forgetAll();
   [[nodiscard]] bool holds(const std::string& instance, const ObjectIdentity& object) const;
 
  private:
   struct Entry {
     std::string instance;
-    std::deque<ObjectIdentity> objects;  // oldest first
+    std::deque<Written> objects;  // oldest first, each once
   };
 
   mutable std::mutex mutex_;

@@ -46,7 +46,7 @@ std::optional<QXError> TokenPlaces::follow() {
   const auto left = leftSince(now);
   auto error = session_.changePlaces(described(now), left);
   // Nobody is in the middle of entering what he redeemed with an old token: the change has waited for that.
-  if (!left.empty()) ledger_.forgetAll();
+  ledger_.forgetBelow(left);
   known_ = std::move(now);
   return error;
 }

@@ -183,12 +183,14 @@ std::variant<RedeemedFile, QXError> TokenRedeemer::redeem(std::string_view token
       if (auto* error = std::get_if<QXError>(&opened)) return std::move(*error);
       if (std::holds_alternative<Exchanged>(opened)) continue;
       auto& [file, identity] = std::get<OpenFile>(opened);
-      return RedeemedFile{std::move(file), identity, std::move(use)};
+      return RedeemedFile{std::move(file), identity, item.path, std::move(use)};
     }
     if (tokenUse != TokenUse::writing || !itemOfSiblingExists(item)) return goneError();
     auto created = createSibling(item);
     if (auto* error = std::get_if<QXError>(&created)) return std::move(*error);
-    if (auto* made = std::get_if<OpenFile>(&created)) return RedeemedFile{std::move(made->file), made->identity, std::move(use)};
+    if (auto* made = std::get_if<OpenFile>(&created)) {
+      return RedeemedFile{std::move(made->file), made->identity, item.path, std::move(use)};
+    }
   }
   return sandboxErrorFor(PathRefusal::unsteady);
 }
@@ -249,7 +251,7 @@ std::variant<ReplacedItem, QXError> TokenRedeemer::replaceItem(std::string_view 
   if (const auto* refusal = std::get_if<PathRefusal>(&after)) return sandboxErrorFor(*refusal);
   const auto& now = std::get<std::optional<PlacedFile>>(after);
   if (!now || now->identity != source->identity) return sandboxError(SandboxErrorCode::gone, "the item was exchanged meanwhile");
-  return ReplacedItem{source->identity, std::move(use), std::move(item.directory)};
+  return ReplacedItem{source->identity, item.path, std::move(use), std::move(item.directory)};
 }
 
 std::optional<QXError> TokenRedeemer::forceToDisk(ReplacedItem replaced) {

@@ -18,11 +18,13 @@ enum class TokenUse { reading, writing };
 struct RedeemedFile {
   UniqueDescriptor file;  // open for reading, or for reading and writing; blocking
   ObjectIdentity identity;
+  std::string path;       // for which the token was
   UsesInFlight::Use use;  // a cut waits for whoever holds it
 };
 
 struct ReplacedItem {
   ObjectIdentity identity;  // what is the item now; its contents and mode are on disk
+  std::string path;         // of the item
   UsesInFlight::Use use;
   UniqueDescriptor directory;  // of the item; that it is the item is not on disk yet
 };
