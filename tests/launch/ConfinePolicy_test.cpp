@@ -19,6 +19,7 @@ TEST(ConfinePolicy, IsReadAsItWasWritten) {
   command.policy.processes = 7;
   command.policy.memory = 1ULL << 40U;
   command.policy.openFiles = 9;
+  command.policy.pendingSignals = 11;
   command.policy.leases = Leases::taken;
   command.command = {"/bin/x", "--", "--read", ""};
   const auto parsed = parseConfineArguments(confineArguments(command));
@@ -28,10 +29,12 @@ TEST(ConfinePolicy, IsReadAsItWasWritten) {
 
 TEST(ConfinePolicy, IsWrittenAsWords) {
   EXPECT_THAT(
-      confineArguments({{{{PathAccess::readWrite, "/a"}}, 3, std::nullopt, std::nullopt, std::nullopt, Leases::refused}, {"/b", "c"}}),
+      confineArguments(
+          {{{{PathAccess::readWrite, "/a"}}, 3, std::nullopt, std::nullopt, std::nullopt, std::nullopt, Leases::refused}, {"/b", "c"}}),
       ElementsAre("--read-write", "/a", "--descriptors", "3", "--", "/b", "c"));
-  EXPECT_THAT(confineArguments({{{}, 4, 1, 2, 3, Leases::taken}, {"/b"}}),
-              ElementsAre("--descriptors", "4", "--processes", "1", "--memory", "2", "--open-files", "3", "--leases", "taken", "--", "/b"));
+  EXPECT_THAT(confineArguments({{{}, 4, 1, 2, 3, 5, Leases::taken}, {"/b"}}),
+              ElementsAre("--descriptors", "4", "--processes", "1", "--memory", "2", "--open-files", "3", "--pending-signals", "5",
+                          "--leases", "taken", "--", "/b"));
 }
 
 TEST(ConfinePolicy, IsNotGuessed) {

@@ -323,6 +323,7 @@ TEST_F(ConfinedApplication, IsLimited) {
   EXPECT_EQ(attempt(bundle, "limit", "open files"), "300 of " + openFiles) << "what is asked for by default stays";
   EXPECT_EQ(attempt(bundle, "limit", "processes"), std::to_string(std::min<rlim_t>(processes.rlim_cur / 2, kApplicationProcesses)));
   EXPECT_EQ(attempt(bundle, "limit", "memory"), std::to_string(RLIM_INFINITY));
+  EXPECT_EQ(attempt(bundle, "limit", "pending signals"), std::to_string(kConfinedPendingSignals));
 }
 
 class ConfinedExtension : public ConfinedTest {
@@ -359,10 +360,11 @@ TEST_F(ConfinedExtension, SeesNoSocketDirectory) {
 }
 
 TEST_F(ConfinedExtension, IsLimited) {
-  const auto outcomes = run({"limit", "processes", "limit", "memory", "limit", "open files"});
+  const auto outcomes = run({"limit", "processes", "limit", "memory", "limit", "open files", "limit", "pending signals"});
   EXPECT_EQ(outcomes.at("limit processes"), std::to_string(kExtensionProcesses));
   EXPECT_EQ(outcomes.at("limit memory"), std::to_string(kExtensionMemory.value_or(RLIM_INFINITY)));
   EXPECT_EQ(outcomes.at("limit open files"), std::to_string(kExtensionOpenFiles));
+  EXPECT_EQ(outcomes.at("limit pending signals"), std::to_string(kConfinedPendingSignals));
 }
 
 // Counted within its own confinement: the user's other processes take nothing away.

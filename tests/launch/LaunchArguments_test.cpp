@@ -139,6 +139,7 @@ TEST_F(LaunchArguments, LimitAnExtensionAndAnApplication) {
   EXPECT_EQ(application.processes, kApplicationProcesses);
   EXPECT_FALSE(application.memory);
   EXPECT_EQ(application.openFiles, kApplicationOpenFiles);
+  EXPECT_EQ(application.pendingSignals, kConfinedPendingSignals);
 
   subject_.kind = LaunchKind::extension;
   const auto extension = confinePolicy(subject_, host_);
@@ -146,6 +147,7 @@ TEST_F(LaunchArguments, LimitAnExtensionAndAnApplication) {
   EXPECT_EQ(extension.processes, kExtensionProcesses);
   EXPECT_EQ(extension.memory, kExtensionMemory);
   EXPECT_EQ(extension.openFiles, kExtensionOpenFiles);
+  EXPECT_EQ(extension.pendingSignals, kConfinedPendingSignals);
 
   host_.landlockLevel = kProcessLimitLevel - 1;
   for (const LaunchKind kind : {LaunchKind::application, LaunchKind::extension}) {

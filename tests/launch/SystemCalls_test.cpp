@@ -115,6 +115,22 @@ TEST_F(SystemCalls, TypeIntoNoTerminalAndAskOneWhatItIs) {
   EXPECT_EQ(inside({"terminal-state"}, shell.get()), all({"terminal-state"}, "ok"));
 }
 
+// A file system has these, whatever Landlock knows of devices. No socket has: outside they are not refused, but unknown.
+TEST_F(SystemCalls, ChangeNothingOfAFileSystemThatOthersShare) {
+  const Names sharing = {"add-encryption-key", "remove-encryption-key", "remove-encryption-key-of-all",
+                         "enable-verity",      "make-snapshot",         "make-snapshot-2"};
+  EXPECT_EQ(outside(sharing), all(sharing, "ENOTTY"));
+  EXPECT_EQ(inside(sharing), all(sharing, "EPERM"));
+  EXPECT_EQ(insideAnExtension(sharing), all(sharing, "EPERM"));
+  EXPECT_EQ(inside({"read-version"}), all({"read-version"}, "ENOTTY"));
+}
+
+TEST_F(SystemCalls, WatchNoFilesForAllOfTheUsersProcesses) {
+  EXPECT_EQ(outside({"fanotify_init"}), all({"fanotify_init"}, "EINVAL")) << "asked for with flags that do not exist";
+  EXPECT_EQ(inside({"fanotify_init"}), all({"fanotify_init"}, "ENOSYS"));
+  EXPECT_EQ(insideAnExtension({"fanotify_init"}), all({"fanotify_init"}, "ENOSYS"));
+}
+
 // Their numbers mean other calls.
 TEST_F(SystemCalls, OfAnotherArchitectureEndTheProcess) {
   const Names others = {"i386", "x32"};

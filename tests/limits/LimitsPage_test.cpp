@@ -24,6 +24,7 @@
 #include "platform/linux/launch/LaunchDescription.h"
 #include "platform/linux/log/LogAllowance.h"
 #include "platform/linux/log/LogText.h"
+#include "platform/linux/rpc/BoundSocket.h"
 #include "platform/linux/rpc/ConnectionLimiter.h"
 #include "platform/linux/sandbox/DiskWork.h"
 #include "platform/linux/sandbox/RedemptionLedger.h"
@@ -56,6 +57,7 @@ std::vector<Limit> limits() {
           {"kMaximumOutputBeforeRequest", kMaximumOutputBeforeRequest},
           {"kMaximumOutputBeforeFrame", kMaximumOutputBeforeFrame},
           {"kTurn", static_cast<std::uint64_t>(kTurn.count())},
+          {"kMaximumWaitingConnections", kMaximumWaitingConnections},
           {"kMaximumConnectionsPerPeer", kMaximumConnectionsPerPeer},
           {"kMaximumUnconfinedConnections", kMaximumUnconfinedConnections},
           {"kMaximumConnectionsOfNobody", kMaximumConnectionsOfNobody},
@@ -96,6 +98,7 @@ std::vector<Limit> limits() {
           {"kLongestDescription", kLongestDescription},
           {"kApplicationProcesses", kApplicationProcesses},
           {"kApplicationOpenFiles", kApplicationOpenFiles},
+          {"kConfinedPendingSignals", kConfinedPendingSignals},
           {"DiskWork::kMostThreads", DiskWork::kMostThreads},
           {"kExtensionProcesses", kExtensionProcesses},
           {"kExtensionOpenFiles", kExtensionOpenFiles},

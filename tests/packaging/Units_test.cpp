@@ -9,6 +9,7 @@
 #include <utility>
 #include <vector>
 
+#include "platform/linux/rpc/BoundSocket.h"
 #include "platform/linux/wire/FileCoordinationProtocol.h"
 #include "platform/linux/wire/SandboxProtocol.h"
 #include "service/DVAdministration.h"
@@ -119,7 +120,8 @@ TEST(SocketUnit, ListensWhereClientsLookAndForTheUserAlone) {
                                    Pair("ListenStream", place + "public/" + linux_platform::kSandboxServiceName),
                                    Pair("ListenStream", place + "public/" + linux_platform::kFileCoordinationServiceName),
                                    Pair("ListenStream", place + kDVAdministrationServiceName), Pair("DirectoryMode", "0700"),
-                                   Pair("SocketMode", "0600"), Pair("WantedBy", "sockets.target")));
+                                   Pair("SocketMode", "0600"), Pair("Backlog", std::to_string(linux_platform::kMaximumWaitingConnections)),
+                                   Pair("WantedBy", "sockets.target")));
 }
 
 // With this build's daemon in place of the installed one.

@@ -671,6 +671,43 @@ TEST_F(UnconfinedServiceTest, APassedSocketIsForTheSameAudience) {
   EXPECT_TRUE(roundTrip(driver.connect()));
 }
 
+// Connects without waiting until there is no room in the line; how many found some. They leave when the sockets go.
+int connectionsThatWait(const std::string& path) {
+  auto found = SocketAddress::forPath(path);
+  const auto& address = std::get<SocketAddress>(found);
+  std::vector<UniqueDescriptor> waiting;
+  constexpr int kMany = 10 * kMaximumWaitingConnections;
+  while (static_cast<int>(waiting.size()) < kMany) {
+    UniqueDescriptor socket(::socket(AF_UNIX, SOCK_STREAM | SOCK_NONBLOCK | SOCK_CLOEXEC, 0));
+    if (::connect(socket.get(), address.address(), address.length()) != 0) break;
+    waiting.push_back(std::move(socket));
+  }
+  return static_cast<int>(waiting.size());
+}
+
+// Of the kernel's own line, which holds one more than it is told. Nobody accepts any, for nothing has been resumed.
+TEST(LinuxRpcServicePublishingTest, NoMoreConnectionsWaitThanItsLineHolds) {
+  const tests::TemporaryDirectory directory;
+  const std::string path = directory.path() + "/" + kServiceName;
+  auto made = BoundSocket::create(path);
+  ASSERT_TRUE(std::holds_alternative<std::unique_ptr<BoundSocket>>(made));
+  EXPECT_EQ(connectionsThatWait(path), kMaximumWaitingConnections + 1);
+}
+
+TEST_F(UnconfinedServiceTest, APassedSocketsLineIsCutToThatLength) {
+  auto found = SocketAddress::forPath(driver.socketPath);
+  const auto& address = std::get<SocketAddress>(found);
+  UniqueDescriptor passed(::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0));
+  ASSERT_EQ(::bind(passed.get(), address.address(), address.length()), 0);
+  ASSERT_EQ(::listen(passed.get(), SOMAXCONN), 0);
+  std::vector<ActivatedSocket> sockets;
+  sockets.push_back({kServiceName, "", std::move(passed)});
+  LinuxRpcService passing(driver.reactor, driver.peers, driver.log.defaultLog(),
+                          NamedServices{{kServiceName, {driver.socketPath, Audience::everyone}}}, std::move(sockets));
+  const auto unresumed = passing.listenerForService(kServiceName);
+  EXPECT_EQ(connectionsThatWait(driver.socketPath), kMaximumWaitingConnections + 1);
+}
+
 TEST(LinuxRpcServicePublishingTest, APassedSocketDoesNotMakeItsNameAService) {
   const tests::TemporaryDirectory directory;
   EXPECT_THAT(publish(directory.path() + "/" + kServiceName, "com.example.Other", PassedSocket::ofThatName),

@@ -42,6 +42,9 @@ inline constexpr std::uint64_t kExtensionOpenFiles = 512;
 // together leave no more than this unread (and what they send at the same moment), since whoever is at his limit may send no more.
 inline constexpr std::uint64_t kApplicationOpenFiles = 4096;
 
+// Signals and timers that a launch may have pending: the user's other processes have the rest.
+inline constexpr std::uint64_t kConfinedPendingSignals = 4096;
+
 // Where docuvend-confine is found inside.
 inline constexpr const char* kHelperPath = "/.docuvend-confine";
 

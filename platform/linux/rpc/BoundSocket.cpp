@@ -73,7 +73,7 @@ std::variant<std::unique_ptr<BoundSocket>, QXError> BoundSocket::create(const st
   struct stat status {};
   std::optional<QXError> error;
   if (::fchmodat(at, newName.c_str(), kOwnerOnly, 0) != 0 || ::fstatat(at, newName.c_str(), &status, AT_SYMLINK_NOFOLLOW) != 0 ||
-      ::listen(bound->socket_.get(), SOMAXCONN) != 0 || ::renameat(at, newName.c_str(), at, bound->name_.c_str()) != 0) {
+      ::listen(bound->socket_.get(), kMaximumWaitingConnections) != 0 || ::renameat(at, newName.c_str(), at, bound->name_.c_str()) != 0) {
     error = QXError::system(errno, "cannot publish " + path);
     ::unlinkat(at, newName.c_str(), 0);
     return *std::move(error);

@@ -15,6 +15,10 @@
 
 namespace docuvend::linux_platform {
 
+// Connections that wait to be accepted, those of everybody: who comes next stands in line behind them, and each costs a look at its maker.
+// Those for whom there is no room wait outside, and nobody's number of tries puts him in front.
+inline constexpr int kMaximumWaitingConnections = 32;
+
 class BoundSocket {
  public:
   // The path is absolute and may be longer than a socket address. Mode 600.

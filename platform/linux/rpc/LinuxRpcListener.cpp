@@ -62,6 +62,7 @@ LinuxRpcListener::LinuxRpcListener(Surroundings surroundings, Service service, U
       socket_(passedSocket_.get()),
       spare_(spareDescriptor()) {
   static_cast<void>(refusePassedDescriptors(socket_));
+  static_cast<void>(::listen(socket_, kMaximumWaitingConnections));  // it listens already, perhaps with a longer line
 }
 
 LinuxRpcListener::~LinuxRpcListener() { registration_.reset(); }

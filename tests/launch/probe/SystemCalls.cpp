@@ -2,6 +2,10 @@
 
 #include <asm/ioctls.h>
 #include <fcntl.h>
+#include <linux/btrfs.h>
+#include <linux/fs.h>
+#include <linux/fscrypt.h>
+#include <linux/fsverity.h>
 #include <linux/io_uring.h>
 #include <linux/keyctl.h>
 #include <linux/vm_sockets.h>
@@ -138,6 +142,14 @@ const Calls& calls() {
       {"paste", [] { return askSocket(TIOCLINUX); }},
       {"paste-with-a-high-half", [] { return askSocket(static_cast<unsigned long>(kHighHalf) | TIOCLINUX); }},
       {"terminal-state", askTerminal},
+      {"add-encryption-key", [] { return askSocket(FS_IOC_ADD_ENCRYPTION_KEY); }},
+      {"remove-encryption-key", [] { return askSocket(FS_IOC_REMOVE_ENCRYPTION_KEY); }},
+      {"remove-encryption-key-of-all", [] { return askSocket(FS_IOC_REMOVE_ENCRYPTION_KEY_ALL_USERS); }},
+      {"enable-verity", [] { return askSocket(FS_IOC_ENABLE_VERITY); }},
+      {"make-snapshot", [] { return askSocket(BTRFS_IOC_SNAP_CREATE); }},
+      {"make-snapshot-2", [] { return askSocket(BTRFS_IOC_SNAP_CREATE_V2); }},
+      {"read-version", [] { return askSocket(FS_IOC_GETVERSION); }},
+      {"fanotify_init", [] { return ::syscall(SYS_fanotify_init, ~0U, 0); }},
       {"no-call", [] { return ::syscall(-1L); }},
       {"unknown-call", [] { return ::syscall(0x3FFFFFFFL); }},
   };

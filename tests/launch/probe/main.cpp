@@ -264,7 +264,7 @@ std::string attempt(const std::string& what, const std::string& subject) {
   if (what == "call") return docuvend::probe::call(subject);
   if (what == "limit") {
     const std::map<std::string, __rlimit_resource> resources = {
-        {"processes", RLIMIT_NPROC}, {"memory", RLIMIT_DATA}, {"open files", RLIMIT_NOFILE}};
+        {"processes", RLIMIT_NPROC}, {"memory", RLIMIT_DATA}, {"open files", RLIMIT_NOFILE}, {"pending signals", RLIMIT_SIGPENDING}};
     return limitOf(resources.at(subject));
   }
   if (what == "fork") return forkUntilRefused();

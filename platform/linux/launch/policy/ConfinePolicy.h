@@ -1,7 +1,8 @@
 // What docuvend-confine is told to do, as its arguments say it. The launcher writes them, docuvend-confine reads them.
 //
 //   docuvend-confine [--read-execute PATH | --read PATH | --read-write PATH | --device PATH]... --descriptors COUNT
-//                    [--processes COUNT] [--memory BYTES] [--open-files COUNT] [--leases taken] -- EXECUTABLE [ARGUMENT...]
+//                    [--processes COUNT] [--memory BYTES] [--open-files COUNT] [--pending-signals COUNT] [--leases taken] -- EXECUTABLE
+//                    [ARGUMENT...]
 #pragma once
 
 #include <cstdint>
@@ -34,6 +35,7 @@ struct ConfinePolicy {
   std::optional<std::uint64_t> processes;
   std::optional<std::uint64_t> memory;     // bytes of private writable memory per process
   std::optional<std::uint64_t> openFiles;  // descriptors per process
+  std::optional<std::uint64_t> pendingSignals;
   Leases leases = Leases::refused;
 
   friend bool operator==(const ConfinePolicy&, const ConfinePolicy&) = default;

@@ -8,6 +8,10 @@
 //                        and a lease tells it that nobody has one open: it may have them.
 //   SO_LINGER            makes the close of a TCP socket wait, in whatever process that happens: the socket can be sent away.
 //   AF_VSOCK             is another way out than the network: it leads to the host of a virtual machine, or to its guests.
+//   ioctls of files      Landlock knows those of devices alone. A key of an encrypted directory opens and closes it for all of the user's
+//                        processes, and counts as one of his keys; verity makes a file unwritable for ever, for whoever may read it; and
+//                        a snapshot is of what lies beside what a confinement shows.
+//   fanotify             groups are counted for all processes of the user together.
 //   TIOCSTI, TIOCLINUX   type into the terminal that a launcher left open.
 //
 // A call of another architecture, or of the x32 kind, has other numbers: it ends the process, for nothing that is installed makes any. The
@@ -20,7 +24,10 @@
 #include <asm/ioctls.h>
 #include <fcntl.h>
 #include <linux/audit.h>
+#include <linux/btrfs.h>
 #include <linux/filter.h>
+#include <linux/fscrypt.h>
+#include <linux/fsverity.h>
 #include <linux/seccomp.h>
 #include <sys/prctl.h>
 #include <sys/socket.h>
@@ -61,6 +68,17 @@ struct Refusal {
   std::vector<Argument> when;  // all of them; always, when there is none
 };
 
+constexpr std::array<std::uint32_t, 8> kRefusedRequests = {
+    TIOCSTI,
+    TIOCLINUX,
+    FS_IOC_ADD_ENCRYPTION_KEY,
+    FS_IOC_REMOVE_ENCRYPTION_KEY,
+    FS_IOC_REMOVE_ENCRYPTION_KEY_ALL_USERS,
+    FS_IOC_ENABLE_VERITY,
+    BTRFS_IOC_SNAP_CREATE,
+    BTRFS_IOC_SNAP_CREATE_V2,
+};
+
 std::vector<Refusal> refusals(Leases leases) {
   std::vector<Refusal> all = {
       {SYS_add_key, ENOSYS, {}},
@@ -69,11 +87,11 @@ std::vector<Refusal> refusals(Leases leases) {
       {SYS_io_uring_setup, ENOSYS, {}},
       {SYS_io_uring_enter, ENOSYS, {}},
       {SYS_io_uring_register, ENOSYS, {}},
+      {SYS_fanotify_init, ENOSYS, {}},
       {SYS_setsockopt, ENOPROTOOPT, {{1, SOL_SOCKET}, {2, SO_LINGER}}},
       {SYS_socket, EAFNOSUPPORT, {{0, AF_VSOCK}}},
-      {SYS_ioctl, EPERM, {{1, TIOCSTI}}},
-      {SYS_ioctl, EPERM, {{1, TIOCLINUX}}},
   };
+  for (const std::uint32_t request : kRefusedRequests) all.push_back({SYS_ioctl, EPERM, {{1, request}}});
   if (leases == Leases::refused) {
     all.push_back({SYS_fcntl, EINVAL, {{1, F_SETLEASE}}});
     all.push_back({SYS_fcntl, EINVAL, {{1, kernel::kSetDelegation}}});
