@@ -12,6 +12,7 @@
 #include <netinet/in.h>
 #include <signal.h>
 #include <stdlib.h>
+#include <sys/fanotify.h>
 #include <sys/ioctl.h>
 #include <sys/socket.h>
 #include <sys/syscall.h>
@@ -149,7 +150,7 @@ const Calls& calls() {
       {"make-snapshot", [] { return askSocket(BTRFS_IOC_SNAP_CREATE); }},
       {"make-snapshot-2", [] { return askSocket(BTRFS_IOC_SNAP_CREATE_V2); }},
       {"read-version", [] { return askSocket(FS_IOC_GETVERSION); }},
-      {"fanotify_init", [] { return ::syscall(SYS_fanotify_init, ~0U, 0); }},
+      {"fanotify_init", [] { return ::syscall(SYS_fanotify_init, FAN_CLASS_NOTIF | FAN_REPORT_FID, O_RDONLY); }},
       {"no-call", [] { return ::syscall(-1L); }},
       {"unknown-call", [] { return ::syscall(0x3FFFFFFFL); }},
   };
