@@ -20,12 +20,14 @@
 #include <sys/resource.h>
 #include <sys/socket.h>
 #include <sys/time.h>
+#include <sys/wait.h>
 #include <unistd.h>
 
 #include <array>
 #include <cerrno>
 #include <chrono>
 #include <cstdint>
+#include <cstdlib>
 #include <cstring>
 #include <filesystem>
 #include <fstream>
@@ -215,11 +217,27 @@ std::string startAgainAndAgain(Words& words, Answers answers) {
   return "no answer";
 }
 
+// The processes that it started go before it does: a sanitizer starts one at the end.
+std::vector<pid_t>& forked() {
+  static std::vector<pid_t> all;
+  return all;
+}
+
+void endForked() {
+  for (const pid_t child : forked()) ::kill(child, SIGKILL);
+  for (const pid_t child : forked()) ::waitpid(child, nullptr, 0);
+}
+
 std::string forkUntilRefused(Words& /*words*/) {
+  forked().reserve(kMostProcesses);
+  std::atexit(endForked);
   for (int i = 0; i < kMostProcesses; ++i) {
     const pid_t child = ::fork();
     if (child < 0) return outcome(child);
-    if (child > 0) continue;
+    if (child > 0) {
+      forked().push_back(child);
+      continue;
+    }
     ::prctl(PR_SET_PDEATHSIG, SIGKILL);
     ::pause();
     ::_exit(0);
