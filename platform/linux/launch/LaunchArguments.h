@@ -6,6 +6,7 @@
 #include <string>
 #include <vector>
 
+#include "platform/linux/base/Sanitizers.h"
 #include "platform/linux/launch/ConfinedLaunch.h"
 #include "platform/linux/launch/HostLayout.h"
 #include "platform/linux/launch/policy/ConfinePolicy.h"
@@ -21,18 +22,8 @@ inline constexpr std::uint64_t kApplicationProcesses = 1024;
 inline constexpr int kProcessLimitLevel = 2;
 // Private writable memory of each process of an extension (RLIMIT_DATA: an address-space limit would count files that it maps). A build
 // with a memory sanitizer reserves terabytes of it at the start of every process, so there is none then.
-#if defined(__SANITIZE_ADDRESS__) || defined(__SANITIZE_THREAD__)
-#define DOCUVEND_SHADOW_MEMORY 1
-#elif defined(__has_feature)
-#if __has_feature(address_sanitizer) || __has_feature(thread_sanitizer)
-#define DOCUVEND_SHADOW_MEMORY 1
-#endif
-#endif
-#ifdef DOCUVEND_SHADOW_MEMORY
-inline constexpr std::optional<std::uint64_t> kExtensionMemory;
-#else
-inline constexpr std::optional<std::uint64_t> kExtensionMemory = std::uint64_t{4} << 30U;
-#endif
+inline constexpr std::optional<std::uint64_t> kExtensionMemory =
+    kSanitized ? std::nullopt : std::optional<std::uint64_t>(std::uint64_t{4} << 30U);
 
 // Descriptors of each process of an extension. The kernel counts those that lie in sockets unread for all of a user's processes together,
 // and refuses to pass more on to whoever's own limit is below that number. This one is below what every login gives the daemon, so an
