@@ -243,6 +243,8 @@ TEST_F(SlowProviderTest, ThatCannotBeToldOfOneFileIsToldOfOthersMeanwhile) {
   write("y");
   ASSERT_EQ(provider->told.size(), 2U);
   EXPECT_EQ(provider->told[1].second, url("y"));
+  pass(kLong);
+  provider->answerAll();
 }
 
 TEST_F(SlowProviderTest, ThatCanNeverBeToldIsGivenUpWithALineInTheLog) {

@@ -284,7 +284,8 @@ class LibraryTest : public ::testing::Test {
 
 class ConsumerTest : public LibraryTest {
  protected:
-  ~ConsumerTest() override {
+  // Before anything of a test's own class goes: the script may use it until then.
+  void TearDown() override {
     consumer_.reset();
     stopServices();
   }
