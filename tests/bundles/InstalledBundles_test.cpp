@@ -69,10 +69,10 @@ class InstalledBundlesTest : public ::testing::Test {
     }
     return true;
   }
-  // Writes a bundle as a slow copy does, its entitlements last. True when there were pauses in which it may have been looked at.
-  static bool copyInPlace(const std::string& directory, const std::string& identifier) {
-    using Clock = std::chrono::steady_clock;
-    const auto begin = Clock::now();
+  using Clock = std::chrono::steady_clock;
+  // Writes a bundle as a slow copy does, its entitlements last. True when there were pauses, since the first change, in which it may have
+  // been looked at.
+  static bool copyInPlace(const std::string& directory, const std::string& identifier, Clock::time_point begin = Clock::now()) {
     auto last = begin;
     Clock::duration longest{0};
     const auto step = [&last, &longest] {
@@ -213,9 +213,10 @@ TEST_F(InstalledBundlesTest, ABundleThatIsOverwrittenWithoutPauseCountsAsItWasUn
   for (int i = 0; i < kMostTries; ++i) {
     const std::string version = bundles_->find("org.a")->version;
     isSeenInPart = false;
+    const auto begin = Clock::now();
     std::filesystem::remove(user("a") + "/Entitlements.plist");
     BundleHouse::write(user("a") + "/Info.plist", "half");
-    const bool pauses = copyInPlace(user("a"), "org.a");
+    const bool pauses = copyInPlace(user("a"), "org.a", begin);
     ASSERT_TRUE(changes_.waitFor([this, &version] {
       const auto bundle = bundles_->find("org.a");
       return bundle && bundle->version != version && !bundle->entitlements.empty();
