@@ -226,8 +226,8 @@ TEST_P(ReactorTest, AHandlerThatAsksForAnotherTurnGetsItAfterThoseWhoWaitForAThr
   Mailbox<std::string> order;
   Mailbox<int> entered;
   Mailbox<int> mayLeave;
-  Reactor reactor(1, GetParam());
   int turns = 0;
+  Reactor reactor(1, GetParam());
   const auto registration = reactor.watch(two.get(), EPOLLIN, [&](std::uint32_t events) -> std::uint32_t {
     ++turns;
     order.put("turn " + std::to_string(turns) + (events == 0 ? " without events" : " with events"));
@@ -253,6 +253,7 @@ TEST_P(ReactorTest, HandlersInOneLaneRunOneAtATimeInTheOrderInWhichTheyBecameRea
   Mailbox<int> mayLeave;
   std::atomic<int> inside = 0;
   std::atomic<bool> overlapped = false;
+  Mailbox<int> passed;
   Reactor reactor(4, GetParam());
   const auto lane = Reactor::makeLane();
   for (int i = 0; i < kHandlers; ++i) {
@@ -274,7 +275,6 @@ TEST_P(ReactorTest, HandlersInOneLaneRunOneAtATimeInTheOrderInWhichTheyBecameRea
   for (int i = 1; i < kHandlers; ++i) {
     writeByte(pairs[static_cast<std::size_t>(i)].first.get());
     // Whoever is told that the byte is there has lined the handler up.
-    Mailbox<int> passed;
     auto [near, far] = socketPair();
     const auto probe = reactor.watch(far.get(), EPOLLIN, [&passed](std::uint32_t) -> std::uint32_t {
       passed.put(1);
@@ -329,9 +329,10 @@ TEST_P(ReactorTest, AHandlerInALaneThatAsksForAnotherTurnLetsTheLaneGoOnFirst) {
   Mailbox<std::string> order;
   Mailbox<int> entered;
   Mailbox<int> mayLeave;
+  Mailbox<int> lined;
+  int turns = 0;
   Reactor reactor(2, GetParam());
   const auto lane = Reactor::makeLane();
-  int turns = 0;
   const auto first = reactor.watch(
       two.get(), EPOLLIN,
       [&](std::uint32_t) -> std::uint32_t {
@@ -343,7 +344,6 @@ TEST_P(ReactorTest, AHandlerInALaneThatAsksForAnotherTurnLetsTheLaneGoOnFirst) {
       lane);
   writeByte(one.get());
   ASSERT_TRUE(entered.take());
-  Mailbox<int> lined;
   const auto second = reactor.watch(
       four.get(), EPOLLIN,
       [&](std::uint32_t) -> std::uint32_t {
