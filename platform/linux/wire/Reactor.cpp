@@ -66,7 +66,7 @@ struct Reactor::State {
   std::condition_variable changed;
   std::uint64_t nextKey = EpollSet::kFirstKey;
   std::map<std::uint64_t, Watched> watches;
-  std::unique_ptr<PollThread> polling;  // made when it is needed; after the threads have ended, gone
+  std::unique_ptr<PollThread> polling;  // made when it is needed; ends before the threads do
   std::deque<std::function<void()>> tasks;
   bool isStopping = false;
   bool over = false;
