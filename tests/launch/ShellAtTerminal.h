@@ -3,7 +3,6 @@
 
 #include <fcntl.h>
 #include <gtest/gtest.h>
-#include <poll.h>
 #include <pty.h>
 #include <signal.h>
 #include <sys/ioctl.h>
@@ -12,9 +11,6 @@
 #include <unistd.h>
 
 #include <algorithm>
-#include <array>
-#include <cerrno>
-#include <chrono>
 #include <iterator>
 #include <stdexcept>
 #include <string>
@@ -22,6 +18,7 @@
 
 #include "platform/linux/base/UniqueDescriptor.h"
 #include "tests/support/Eventually.h"
+#include "tests/support/TerminalReading.h"
 
 namespace docuvend::tests {
 
@@ -91,18 +88,7 @@ class ShellAtTerminal {
   }
 
  private:
-  bool readSome() {
-    pollfd waiting{terminal_.get(), POLLIN, 0};
-    int ready = 0;
-    do {
-      ready = ::poll(&waiting, 1, static_cast<int>(std::chrono::milliseconds(kPatience).count()));
-    } while (ready < 0 && errno == EINTR);
-    std::array<char, 4096> buffer;
-    const ssize_t count = ready > 0 ? ::read(terminal_.get(), buffer.data(), buffer.size()) : -1;
-    if (count <= 0) return false;
-    shown_.append(buffer.data(), static_cast<std::size_t>(count));
-    return true;
-  }
+  bool readSome() { return appendWhatComes(terminal_.get(), shown_); }
 
   pid_t pid_ = -1;
   linux_platform::UniqueDescriptor terminal_;

@@ -2,19 +2,15 @@
 #pragma once
 
 #include <gtest/gtest.h>
-#include <poll.h>
 #include <pty.h>
 #include <termios.h>
 #include <unistd.h>
 
-#include <array>
-#include <cerrno>
-#include <chrono>
 #include <stdexcept>
 #include <string>
 
 #include "platform/linux/base/UniqueDescriptor.h"
-#include "tests/wire/Waiting.h"
+#include "tests/support/TerminalReading.h"
 
 namespace docuvend::tests {
 
@@ -53,18 +49,7 @@ class PseudoTerminal {
   }
 
  private:
-  bool readSome() {
-    pollfd waiting{master_.get(), POLLIN, 0};
-    int ready = 0;
-    do {
-      ready = ::poll(&waiting, 1, static_cast<int>(std::chrono::milliseconds(kPatience).count()));
-    } while (ready < 0 && errno == EINTR);
-    std::array<char, 4096> buffer;
-    const ssize_t count = ready > 0 ? ::read(master_.get(), buffer.data(), buffer.size()) : -1;
-    if (count <= 0) return false;
-    written_.append(buffer.data(), static_cast<std::size_t>(count));
-    return true;
-  }
+  bool readSome() { return appendWhatComes(master_.get(), written_); }
 
   linux_platform::UniqueDescriptor master_;
   linux_platform::UniqueDescriptor slave_;
