@@ -13,7 +13,7 @@
 
 #include "platform/linux/bundles/BundleInstaller.h"
 #include "tests/bundles/BundleHouse.h"
-#include "tests/bundles/WatchRefusals.h"
+#include "tests/bundles/InterposedWatches.h"
 
 namespace docuvend::linux_platform {
 namespace {
@@ -92,7 +92,9 @@ class InstalledBundlesTest : public ::testing::Test {
 
   BundleHouse house_;
   Changes changes_;
-  std::optional<InstalledBundles> bundles_;
+  std::atomic<bool> isSeenInPart_ = false;
+  InterposedWatches watches_;
+  std::optional<InstalledBundles> bundles_;  // calls back until its end, so last
 };
 
 TEST_F(InstalledBundlesTest, KnowsWhatIsInstalledFromItsCreationOn) {
@@ -183,36 +185,72 @@ TEST_F(InstalledBundlesTest, NoticesAProgramDeepInABundleThatIsCopiedInPlace) {
 TEST_F(InstalledBundlesTest, ACopyInPlaceThatMakesNoPauseIsNeverSeenInPart) {
   std::filesystem::create_directories(house_.paths.userBundles);
   start();
-  std::atomic<bool> isSeenInPart = false;
-  bundles_->onChange([this, &isSeenInPart] {
-    for (const auto& bundle : bundles_->all()) isSeenInPart = isSeenInPart || bundle.entitlements.empty();
+  bundles_->onChange([this] {
+    for (const auto& bundle : bundles_->all()) isSeenInPart_ = isSeenInPart_ || bundle.entitlements.empty();
   });
   // A machine that makes the copy pause proves nothing; the next try does.
   for (int i = 0; i < kMostTries; ++i) {
     const std::string name = std::to_string(i);
-    isSeenInPart = false;
+    isSeenInPart_ = false;
     const bool pauses = copyInPlace(user(name), "org.a" + name);
     ASSERT_TRUE(appears("org.a" + name));
     ASSERT_TRUE(changes_.waitFor([this, &name] { return !bundles_->find("org.a" + name)->entitlements.empty(); }));
     if (pauses) continue;
-    EXPECT_FALSE(isSeenInPart);
+    EXPECT_FALSE(isSeenInPart_);
     return;
   }
   FAIL() << "this machine is too slow to tell";
+}
+
+TEST_F(InstalledBundlesTest, WhatIsWrittenWhenTheLookIsDueAlreadyPutsTheBundleOff) {
+  BundleHouse::install(user("a"), "org.a");
+  start();
+  const std::string version = bundles_->find("org.a")->version;
+  auto lastWritten = Clock::now();
+  int lateWrites = 0;
+  watches_.beforeEach([this, &lastWritten, &lateWrites](const std::string& path) {
+    if (path != user("a") || Clock::now() < lastWritten + Settling::kQuietInPlace || lateWrites == 2) return;
+    ++lateWrites;
+    BundleHouse::write(user("a") + "/resource", "x");
+    lastWritten = Clock::now();
+  });
+  BundleHouse::write(user("a") + "/Entitlements.plist", BundleHouse::propertyList("<key>right</key><true/>"));
+  EXPECT_TRUE(changes_.waitFor([this, &version] { return bundles_->find("org.a")->version != version; }));
+  const auto seen = Clock::now();
+  watches_.beforeEach({});
+  EXPECT_EQ(lateWrites, 2);
+  EXPECT_GE(seen - lastWritten, Settling::kQuietInPlace);
+}
+
+TEST_F(InstalledBundlesTest, ANewDirectoryIsNotQuietBeforeItIsWatched) {
+  std::filesystem::create_directories(house_.paths.userBundles);
+  start();
+  std::optional<Clock::time_point> lastWritten;
+  watches_.beforeEach([this, &lastWritten](const std::string& path) {
+    if (path != user("a") || lastWritten) return;
+    std::this_thread::sleep_for(Settling::kQuietInPlace);  // this is late for all that was told
+    BundleHouse::install(user("a"), "org.a");
+    lastWritten = Clock::now();
+  });
+  std::filesystem::create_directory(user("a"));
+  EXPECT_TRUE(appears("org.a"));
+  const auto seen = Clock::now();
+  watches_.beforeEach({});
+  ASSERT_TRUE(lastWritten);
+  EXPECT_GE(seen - *lastWritten, Settling::kQuietInPlace);
 }
 
 TEST_F(InstalledBundlesTest, ABundleThatIsOverwrittenWithoutPauseCountsAsItWasUntilItIsWhole) {
   BundleHouse::install(user("a"), "org.a");
   BundleHouse::write(user("a") + "/Entitlements.plist", BundleHouse::propertyList("<key>right</key><true/>"));
   start();
-  std::atomic<bool> isSeenInPart = false;
-  bundles_->onChange([this, &isSeenInPart] {
+  bundles_->onChange([this] {
     const auto bundle = bundles_->find("org.a");
-    isSeenInPart = isSeenInPart || !bundle || bundle->entitlements.empty();
+    isSeenInPart_ = isSeenInPart_ || !bundle || bundle->entitlements.empty();
   });
   for (int i = 0; i < kMostTries; ++i) {
     const std::string version = bundles_->find("org.a")->version;
-    isSeenInPart = false;
+    isSeenInPart_ = false;
     const auto begin = Clock::now();
     std::filesystem::remove(user("a") + "/Entitlements.plist");
     BundleHouse::write(user("a") + "/Info.plist", "half");
@@ -222,7 +260,7 @@ TEST_F(InstalledBundlesTest, ABundleThatIsOverwrittenWithoutPauseCountsAsItWasUn
       return bundle && bundle->version != version && !bundle->entitlements.empty();
     }));
     if (pauses) continue;
-    EXPECT_FALSE(isSeenInPart);
+    EXPECT_FALSE(isSeenInPart_);
     return;
   }
   FAIL() << "this machine is too slow to tell";
@@ -287,7 +325,7 @@ TEST_F(InstalledBundlesTest, NoticesThatItsDirectoryIsReplaced) {
 
 // What happens without watches is seen all the same, and when there are some again it is seen by them.
 class InstalledBundlesWithoutWatches : public InstalledBundlesTest,
-                                       public ::testing::WithParamInterface<std::atomic<bool> WatchRefusals::*> {
+                                       public ::testing::WithParamInterface<std::atomic<bool> InterposedWatches::*> {
  protected:
   [[nodiscard]] long logged(const std::string& beginning) const {
     const auto texts = house_.log.texts();
@@ -296,13 +334,12 @@ class InstalledBundlesWithoutWatches : public InstalledBundlesTest,
 
   const std::string begins_ = "[ERROR] Not every bundle directory can be watched";
   const std::string ends_ = "[NOTICE] Every bundle directory is watched again.";
-  WatchRefusals refusals_;
 };
 
 TEST_P(InstalledBundlesWithoutWatches, LooksNowAndThenAndSaysSoOnceUntilTheyAreBack) {
   BundleHouse::install(user("a"), "org.a");
   BundleHouse::write(user("a") + "/Entitlements.plist", BundleHouse::propertyList("<key>right</key><true/>"));
-  refusals_.*GetParam() = true;
+  watches_.*GetParam() = true;
   start();
   EXPECT_TRUE(bundles_->find("org.a"));
   EXPECT_EQ(logged(begins_), 1);
@@ -313,32 +350,31 @@ TEST_P(InstalledBundlesWithoutWatches, LooksNowAndThenAndSaysSoOnceUntilTheyAreB
   EXPECT_EQ(logged(begins_), 1) << "however often it looks";
   EXPECT_EQ(logged(ends_), 0);
 
-  refusals_.*GetParam() = false;
+  watches_.*GetParam() = false;
   EXPECT_TRUE(eventually([this] { return logged(ends_) == 1; }));
-  const int refused = refusals_.count;
+  const int refused = watches_.refused;
   for (const std::string& name : {std::string("c"), std::string("d")}) {
     BundleHouse::install(user(name), "org." + name);
     EXPECT_TRUE(appears("org." + name));
   }
-  EXPECT_EQ(refusals_.count, refused);
+  EXPECT_EQ(watches_.refused, refused);
   EXPECT_EQ(logged(begins_), 1);
   EXPECT_EQ(logged(ends_), 1);
 }
 
 INSTANTIATE_TEST_SUITE_P(OfEitherKind, InstalledBundlesWithoutWatches,
-                         ::testing::Values(&WatchRefusals::ofQueues, &WatchRefusals::ofWatches),
-                         [](const auto& tested) { return tested.param == &WatchRefusals::ofQueues ? "Queues" : "Watches"; });
+                         ::testing::Values(&InterposedWatches::refusesQueues, &InterposedWatches::refusesWatches),
+                         [](const auto& tested) { return tested.param == &InterposedWatches::refusesQueues ? "Queues" : "Watches"; });
 
 TEST_F(InstalledBundlesTest, AWatchThatIsRefusedLaterIsMadeUpForByLooks) {
   std::filesystem::create_directories(house_.paths.userBundles);
-  WatchRefusals refusals;
   start();
-  refusals.ofWatches = true;
+  watches_.refusesWatches = true;
   BundleHouse::install(user("a"), "org.a");
   ASSERT_TRUE(appears("org.a"));
   BundleHouse::write(user("a") + "/Entitlements.plist", BundleHouse::propertyList("<key>right</key><true/>"));
   EXPECT_TRUE(changes_.waitFor([this] { return !bundles_->find("org.a")->entitlements.empty(); }));
-  EXPECT_GT(refusals.count, 0);
+  EXPECT_GT(watches_.refused, 0);
 }
 
 TEST_F(InstalledBundlesTest, AnUpdateOfTheOwnerUpdatesItsGroupsMembers) {

@@ -102,16 +102,19 @@ bool InstalledBundles::waitForEvents() {
   return waiting[0].revents == 0;
 }
 
+// What was written into a directory before it was watched is not told; so all this counts as of the time when it is.
 void InstalledBundles::takeChanges() {
-  bool isToBeWatchedAnew = false;
   const auto changes = watch_.takeChanges();
+  const auto isForBundles = [this](const DirectoryChange& change) { return !isHidden(bundleAround(realPathOf(change))); };
+  if (std::any_of(changes.begin(), changes.end(), [&](const auto& change) { return change.isOfDirectory && isForBundles(change); })) {
+    renewWatch();
+  }
   const auto now = Clock::now();
   for (const DirectoryChange& change : changes) {
+    if (!isForBundles(change)) continue;
+    settling_.changed(now);
     const std::string path = realPathOf(change);
     const std::string bundle = bundleAround(path);
-    if (isHidden(bundle)) continue;
-    settling_.changed(now);
-    isToBeWatchedAnew = isToBeWatchedAnew || change.isOfDirectory;
     if (bundle.empty()) continue;
     if (path == bundle && change.kind == DirectoryChange::Kind::cameOrWent) {
       settling_.wasRenamed(bundle, now);
@@ -119,7 +122,6 @@ void InstalledBundles::takeChanges() {
       settling_.wasWritten(bundle, now);
     }
   }
-  if (isToBeWatchedAnew) renewWatch();
 }
 
 // What changed, below a real directory of bundles if it was below one.
@@ -140,9 +142,11 @@ std::string InstalledBundles::bundleAround(const std::string& path) const {
   return {};
 }
 
+// What was written until it begins is known when the bundles are judged, however late this thread came to it.
 void InstalledBundles::lookAgain() {
   renewWatch();
   const auto began = Clock::now();
+  takeChanges();
   lastLook_ = began;
   auto looked = std::make_shared<const BundleMap>(scan_.run(settling_.unsettled(began)));
   std::vector<std::function<void()>> callbacks;

@@ -43,7 +43,7 @@ class Settling {
   [[nodiscard]] std::optional<Time> nextLook() const;
   // The bundles that are not to be judged by a look at this time.
   [[nodiscard]] std::set<std::string> unsettled(Time now) const;
-  // A look that began at `began` is over. Changes since then are told after this.
+  // A look that began at `began` is over. It saw all changes that were told before this, but those of the bundles that were unsettled then.
   void looked(Time began, Found found);
 
  private:
