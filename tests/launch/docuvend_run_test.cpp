@@ -76,6 +76,29 @@ TEST_F(DocuvendRun, SaysThatABundleIsNotInstalledAndWhy) {
                                "/broken: has no Info.plist.\ndocuvend-run: no bundle org.missing is installed\n");
 }
 
+TEST_F(DocuvendRun, ShowsWhatItReadsAndIsGivenInOneLineThatSteersNoTerminal) {
+  std::filesystem::create_directories(house_.paths.userBundles + "/bro\nken\x1b[2J\u009b2J");
+  const auto ending = run({"org.\r\u202egnissim"});
+  EXPECT_EQ(ending.output, "docuvend-run: [ERROR] Ignoring the bundle at " + house_.paths.userBundles +
+                               "/bro\\nken\\x1b[2J\\u{9b}2J: has no Info.plist.\n"
+                               "docuvend-run: no bundle org.\\r\\u{202e}gnissim is installed\n");
+}
+
+TEST_F(DocuvendRun, ShowsTheNameOfAnExecutableThatDoesNotStartInTheSameWay) {
+  const std::string directory = house_.paths.userBundles + "/org.a";
+  const std::string name = "pro\ngram\u009b2J";
+  BundleHouse::writeExecutable(directory + "/" + name,
+                               "\x7f"
+                               "ELF, but no program");
+  BundleHouse::write(directory + "/Info.plist",
+                     BundleHouse::propertyList(BundleHouse::entry("QXBundleIdentifier", BundleHouse::text("org.a")) +
+                                               BundleHouse::entry("QXBundleExecutable", BundleHouse::text(name))));
+  const auto ending = run({"org.a"});
+  EXPECT_EQ(ending.status, 125);
+  EXPECT_EQ(ending.output,
+            "docuvend-confine: QXSystemErrorDomain 8: cannot execute " + directory + "/pro\\ngram\\u{9b}2J: Exec format error\n");
+}
+
 TEST_F(DocuvendRun, RefusesRoot) {
   (void)house_.installProbe("org.a");
   const auto ending = run({"org.a"}, {"unshare", "--user", "--map-root-user"});

@@ -16,6 +16,7 @@
 #include "platform/linux/launch/policy/ConfinePolicy.h"
 #include "platform/linux/launch/policy/Landlock.h"
 #include "platform/linux/launch/policy/SystemCalls.h"
+#include "platform/linux/log/LogText.h"
 
 namespace docuvend::linux_platform {
 namespace {
@@ -23,7 +24,7 @@ namespace {
 constexpr int kFailed = 125;
 
 int fail(const std::string& why) {
-  std::fprintf(stderr, "docuvend-confine: %s\n", why.c_str());
+  std::fprintf(stderr, "docuvend-confine: %s\n", visibleLogText(why).c_str());
   return kFailed;
 }
 

@@ -3,11 +3,7 @@
 namespace docuvend {
 
 void HeldLog::write(QXLogType type, const std::string& message) {
-  if (!isEnabled(type)) return;
-  std::string& line = lines_.emplace_back(message);
-  for (char& c : line) {
-    if (static_cast<unsigned char>(c) < ' ' || c == '\x7f') c = '?';
-  }
+  if (isEnabled(type)) lines_.push_back(message);
 }
 
 }  // namespace docuvend

@@ -25,8 +25,9 @@
 #include <algorithm>
 #include <array>
 #include <cerrno>
-#include <cstdio>
 #include <utility>
+
+#include "tools/docuvend-run/Complaint.h"
 
 namespace docuvend {
 namespace {
@@ -134,7 +135,7 @@ void OwnTerminal::becomeApplication(LaunchPlan plan, pid_t parent) const {
   ::sigprocmask(SIG_SETMASK, &maskBefore_, nullptr);
   bool isReady = ::prctl(PR_SET_PDEATHSIG, SIGKILL) == 0 && ::getppid() == parent;
   for (const int number : user_.replaced()) isReady = isReady && ::dup2(theirs_.get(), number) == number;
-  if (isReady) std::fprintf(stderr, "docuvend-run: %s\n", execute(std::move(plan)).description().c_str());
+  if (isReady) complain(execute(std::move(plan)).description());
   ::_exit(kCannotLaunch);
 }
 

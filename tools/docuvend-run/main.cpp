@@ -10,6 +10,7 @@
 #include "platform/linux/bundles/BundleScan.h"
 #include "platform/linux/files/LinuxPropertyLists.h"
 #include "platform/linux/launch/ConfinedLaunch.h"
+#include "tools/docuvend-run/Complaint.h"
 #include "tools/docuvend-run/HeldLog.h"
 #include "tools/docuvend-run/OwnTerminal.h"
 #include "tools/docuvend-run/UserTerminal.h"
@@ -38,7 +39,7 @@ constexpr const char* kHelp =
     "  127  no such bundle is installed\n";
 
 int fail(int status, const std::string& why) {
-  std::fprintf(stderr, "docuvend-run: %s\n", why.c_str());
+  complain(why);
   return status;
 }
 
@@ -67,7 +68,7 @@ int run(const std::vector<std::string>& arguments) {
   const auto bundles = scan.run();
   const auto bundle = bundles.find(arguments[0]);
   if (bundle == bundles.end()) {
-    for (const auto& line : log.lines()) std::fprintf(stderr, "docuvend-run: %s\n", line.c_str());
+    for (const auto& line : log.lines()) complain(line);
     return fail(kNoSuchBundle, "no bundle " + arguments[0] + " is installed");
   }
 
