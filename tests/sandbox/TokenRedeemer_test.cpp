@@ -301,6 +301,28 @@ TEST_F(TokenRedeemerTest, RenamesNothingByATokenThatIsTakenBackWhileTheSiblingIs
   EXPECT_EQ(modeOf(sibling), 0600U);
 }
 
+// Two replace the same item by the same sibling.
+TEST_F(TokenRedeemerTest, AnItemThatAnotherHasReplacedMeanwhileKeepsItsMode) {
+  ASSERT_EQ(::chmod(document.c_str(), 0640), 0);
+  ASSERT_TRUE(puts(redeemed(tokenFor(sibling), TokenUse::writing), "new"));
+  testing::SystemCalls calls;
+  calls.beforeFlush = [this](int) {
+    EXPECT_TRUE(std::holds_alternative<ReplacedItem>(redeemer.replaceItem(tokenFor(document), tokenFor(sibling))));
+  };
+  expectReplaceError(tokenFor(document), tokenFor(sibling), SandboxErrorCode::gone, "the other was faster");
+  EXPECT_EQ(read(document), "new");
+  EXPECT_EQ(modeOf(document), 0640U);
+}
+
+TEST_F(TokenRedeemerTest, TheItemGetsItsModeAlsoWhenAnotherWhoFailedGaveTheSiblingsBackMeanwhile) {
+  ASSERT_EQ(::chmod(document.c_str(), 0640), 0);
+  static_cast<void>(redeemed(tokenFor(sibling), TokenUse::writing));
+  testing::SystemCalls calls;
+  calls.beforeFlush = [this](int) { EXPECT_EQ(::chmod(sibling.c_str(), 0600), 0); };
+  EXPECT_TRUE(std::holds_alternative<ReplacedItem>(redeemer.replaceItem(tokenFor(document), tokenFor(sibling))));
+  EXPECT_EQ(modeOf(document), 0640U);
+}
+
 TEST_F(TokenRedeemerTest, ForcesContentsAndModeBeforeTheRenameAndTheDirectoryAfterIt) {
   ASSERT_EQ(::chmod(document.c_str(), 0640), 0);
   ASSERT_TRUE(puts(redeemed(tokenFor(sibling), TokenUse::writing), "new"));

@@ -123,33 +123,47 @@ std::optional<QXError> flushDirectory(int directory) {
   return flush(readable.get(), "the directory cannot be written");
 }
 
-// The item's permission bits on its hidden sibling. Unless they are to stay, the sibling gets back what it had: it is still the hidden
-// sibling then, and its next writer needs that.
+// What the name of a hidden sibling means now.
+bool isStillThere(const PlacedItem& item, const std::string& siblingName, const ObjectIdentity& sibling) {
+  const auto entry = placeEntry(item.directory.get(), siblingName);
+  const auto* present = std::get_if<std::optional<PlacedFile>>(&entry);
+  return present != nullptr && *present && (*present)->identity == sibling;
+}
+
+// The item's permission bits on its hidden sibling. Unless they are to stay, the sibling gets back what it had: its next writer needs that.
+// Others may replace the same item by the same sibling at once. So what has become the item meanwhile keeps them, and who is about to
+// rename takes them again, since another who failed may have given them back.
 class BorrowedMode {
  public:
-  explicit BorrowedMode(int sibling) : sibling_(sibling) {}
+  BorrowedMode(const PlacedItem& item, const std::string& siblingName, const OpenFile& sibling)
+      : item_(item), siblingName_(siblingName), sibling_(sibling) {}
   BorrowedMode(const BorrowedMode&) = delete;
   BorrowedMode& operator=(const BorrowedMode&) = delete;
   ~BorrowedMode() {
-    if (before_) static_cast<void>(::fchmod(sibling_, *before_));
+    if (before_ && isStillThere(item_, siblingName_, sibling_.identity)) static_cast<void>(::fchmod(sibling_.file.get(), *before_));
   }
 
-  [[nodiscard]] std::optional<QXError> take(const PlacedFile& item) {
-    const auto itemStatus = statusOf(item.path.get());
-    const auto siblingStatus = statusOf(sibling_);
+  [[nodiscard]] std::optional<QXError> take() {
+    const auto itemStatus = statusOf(item_.file->path.get());
+    const auto siblingStatus = statusOf(sibling_.file.get());
     for (const auto* status : {&itemStatus, &siblingStatus}) {
       if (const auto* failure = std::get_if<SystemFailure>(status)) return sandboxErrorFor(*failure, "the files cannot be examined");
     }
-    if (::fchmod(sibling_, std::get<ObjectStatus>(itemStatus).mode & kPermissionBits) != 0) {
+    const mode_t wanted = std::get<ObjectStatus>(itemStatus).mode & kPermissionBits;
+    const mode_t present = std::get<ObjectStatus>(siblingStatus).mode & kPermissionBits;
+    if (wanted == present) return std::nullopt;
+    if (::fchmod(sibling_.file.get(), wanted) != 0) {
       return sandboxErrorFor(SystemFailure{errno}, "the hidden sibling cannot be given the item's mode");
     }
-    before_ = std::get<ObjectStatus>(siblingStatus).mode & kPermissionBits;
+    if (!before_) before_ = present;
     return std::nullopt;
   }
   void stays() { before_.reset(); }
 
  private:
-  const int sibling_;
+  const PlacedItem& item_;
+  const std::string& siblingName_;
+  const OpenFile& sibling_;
   std::optional<mode_t> before_;
 };
 
@@ -233,15 +247,16 @@ std::variant<ReplacedItem, QXError> TokenRedeemer::replaceItem(std::string_view 
   auto opened = openPlaced(*source, O_RDONLY);
   if (auto* error = std::get_if<QXError>(&opened)) return std::move(*error);
   if (std::holds_alternative<Exchanged>(opened)) return goneError();
-  const int file = std::get<OpenFile>(opened).file.get();
-  BorrowedMode mode(file);
-  if (auto error = mode.take(*item.file)) return *std::move(error);
-  if (auto error = flush(file, "the hidden sibling cannot be written")) return *std::move(error);
+  const auto& file = std::get<OpenFile>(opened);
+  BorrowedMode mode(item, sibling.name, file);
+  if (auto error = mode.take()) return *std::move(error);
+  if (auto error = flush(file.file.get(), "the hidden sibling cannot be written")) return *std::move(error);
 
   auto use = session_.beginUse();
   for (const std::string_view token : {itemToken, siblingToken}) {
     if (auto error = refusalOf(token)) return *std::move(error);
   }
+  if (auto error = mode.take()) return *std::move(error);
   if (::renameat(item.directory.get(), sibling.name.c_str(), item.directory.get(), item.name.c_str()) != 0) {
     return sandboxErrorFor(SystemFailure{errno}, "the hidden sibling cannot be renamed");
   }
