@@ -52,8 +52,8 @@ DVExtensionDocuvend::DVExtensionDocuvend(std::shared_ptr<QXExtension> extension)
   QXQueueService& queues = QXPlatform::current().queues;
   const std::optional<ProviderID> identifier = identifierOf(*extension);
   operationQueue_ = queues.operationQueue();
-  operationQueue_->setName("Operation queue for " + dvDescribe(identifier));
-  memberQueue_ = queues.concurrentQueue("DVExtensionDocuvend concurrent member queue for " + dvDescribe(identifier));
+  operationQueue_->setName("Operation queue for " + qxDescribe(identifier));
+  memberQueue_ = queues.concurrentQueue("DVExtensionDocuvend concurrent member queue for " + qxDescribe(identifier));
   memberQueueExtension_ = std::move(extension);
   memberQueueIdentifier_ = identifier;
   memberQueueProvidedItemsURL_ = providedItemsURLOf(memberQueueExtension_, identifier);

@@ -24,8 +24,8 @@ struct ForwardedOperation {
 
   std::string_view name;
   void (*send)(const VendorProxy& proxy, const Argument& argument, Completion reply);
-  DVLogFormat<Argument, Identifier, QXError> requestFailed;
-  DVLogFormat<Argument, Identifier, QXError> proxyFailed;
+  QXLogFormat<3> requestFailed;
+  QXLogFormat<3> proxyFailed;
   void (*logSuccess)(const Argument& argument, const std::optional<Results>&... results, const Identifier& provider);
 };
 

@@ -22,14 +22,6 @@ void noteAsserted(const AssertedMessage& message) {
       << static_cast<char>(kFirstType + static_cast<int>(message.type)) << message.text << kEndOfMessage;
 }
 
-std::optional<QXLogType> typeOfLevel(std::string_view message) {
-  if (message.starts_with("[NOTICE] ")) return QXLogType::defaultType;
-  if (message.starts_with("[INFO] ")) return QXLogType::info;
-  if (message.starts_with("[DEBUG] ")) return QXLogType::debug;
-  if (message.starts_with("[ERROR] ")) return QXLogType::fault;
-  return std::nullopt;
-}
-
 std::set<AssertedMessage> assertedMessagesIn(const std::string& file) {
   std::set<AssertedMessage> messages;
   std::ifstream stream(file, std::ios::binary);

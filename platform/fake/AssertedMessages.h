@@ -5,10 +5,8 @@
 #pragma once
 
 #include <compare>
-#include <optional>
 #include <set>
 #include <string>
-#include <string_view>
 
 #include "platform/log.h"
 
@@ -25,9 +23,6 @@ struct AssertedMessage {
 
 // May be called from any thread.
 void noteAsserted(const AssertedMessage& message);
-
-// The type at which a message of its level is written; none for a text without a level.
-[[nodiscard]] std::optional<QXLogType> typeOfLevel(std::string_view message);
 
 // What the processes that were given that file have noted. Empty when they noted nothing.
 [[nodiscard]] std::set<AssertedMessage> assertedMessagesIn(const std::string& file);

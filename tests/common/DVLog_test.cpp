@@ -3,11 +3,9 @@
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
 
-#include <array>
 #include <memory>
 #include <optional>
 #include <string>
-#include <string_view>
 #include <vector>
 
 #include "tests/support/FakePlatform.h"
@@ -78,34 +76,9 @@ TEST_F(DVLogTest, PresentOptionalValuesPrintAsTheValue) {
   EXPECT_THAT(platform.log.texts(), ElementsAre("[INFO] text itself"));
 }
 
-TEST_F(DVLogTest, EachValueTypePrintsInItsForm) {
-  QXUUID uuid;
-  for (std::size_t i = 0; i < uuid.bytes.size(); ++i) uuid.bytes[i] = static_cast<std::uint8_t>(i * 16 + i);
-  const QXURL url = QXURL::fileURL("/a b", QXURLKind::directory);
-  const std::array<std::string_view, 2> list = {"one", "two"};
-  EXPECT_EQ(dvDescribe(-12), "-12");
-  EXPECT_EQ(dvDescribe(std::string_view("view")), "view");
-  EXPECT_EQ(dvDescribe(url), "file:///a%20b/");
-  EXPECT_EQ(dvDescribe(uuid), "00112233-4455-6677-8899-AABBCCDDEEFF");
-  EXPECT_EQ(dvDescribe(ProviderID{"provider"}), "provider");
-  EXPECT_EQ(dvDescribe(ItemID{"item"}), "item");
-  EXPECT_EQ(dvDescribe(ConsumerID{"consumer"}), "consumer");
-  EXPECT_EQ(dvDescribe(QXError::make("Domain", 4, "What happened.")), "Domain 4: What happened.");
-  EXPECT_EQ(dvDescribe(QXDictionary{{"key", 1}, {"other", "text"}}), "{\"key\" = 1, \"other\" = \"text\"}");
-  EXPECT_EQ(dvDescribe(std::span<const std::string_view>(list)), "(\"one\", \"two\")");
-  EXPECT_EQ(dvDescribe(std::span<const std::string_view>()), "()");
-}
-
 TEST_F(DVLogTest, ValuesAreNotFormatsAndOtherPercentSignsStay) {
   dvLog("[INFO] 100% of %@ and %@ %x%", "%@ %d", "second");
   EXPECT_THAT(platform.log.texts(), ElementsAre("[INFO] 100% of %@ %d and second %x%"));
-}
-
-TEST_F(DVLogTest, AFormatWithoutEnoughValuesKeepsItsPlaceholders) {
-  const std::array<std::string, 1> values = {"one"};
-  EXPECT_EQ(dvFormat("%@ %s %d", values), "one %s %d");
-  EXPECT_EQ(dvFormat("%", values), "%");
-  EXPECT_EQ(dvFormat("", values), "");
 }
 
 TEST_F(DVLogTest, AMessageOfATypeThatIsOffIsNeitherFormattedNorWritten) {

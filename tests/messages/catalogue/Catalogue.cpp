@@ -6,6 +6,8 @@
 #include <string_view>
 #include <utility>
 
+#include "platform/QXLogMessage.h"
+
 namespace docuvend::tests {
 namespace {
 
@@ -91,7 +93,7 @@ MessageFindings Catalogue::compare(const std::set<AssertedMessage>& asserted) co
     const auto message = owner(assertion.text);
     if (!message) {
       findings.unknown.push_back("no source writes: " + assertion.text);
-    } else if (fake_platform::typeOfLevel(*message) != assertion.type) {
+    } else if (qxTypeOfLevel(*message) != assertion.type) {
       findings.unknown.push_back("at another type than its level's: " + assertion.text);
     } else if (areTelling(*valuesOf(*message, assertion.text))) {
       good.insert(*message);

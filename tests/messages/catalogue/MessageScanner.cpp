@@ -8,7 +8,7 @@
 #include <stdexcept>
 #include <utility>
 
-#include "platform/fake/AssertedMessages.h"
+#include "platform/QXLogMessage.h"
 
 namespace docuvend::tests {
 namespace {
@@ -100,7 +100,7 @@ class Tokens {
 
 // A level alone is what messages are recognised by, and none itself.
 bool isMessage(const Token& token) {
-  return token.kind == Token::Kind::literal && fake_platform::typeOfLevel(token.text) && !token.text.ends_with("] ");
+  return token.kind == Token::Kind::literal && qxTypeOfLevel(token.text) && !token.text.ends_with("] ");
 }
 
 bool isSign(const Token& token, std::string_view signs) {

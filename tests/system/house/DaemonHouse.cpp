@@ -22,6 +22,7 @@
 #include <string_view>
 #include <thread>
 
+#include "platform/QXLogMessage.h"
 #include "platform/fake/AssertedMessages.h"
 
 namespace docuvend::tests {
@@ -242,7 +243,7 @@ int count(const std::vector<std::string>& lines, Match match) {
 
 int DaemonHouse::logged(const std::string& text) const {
   const int times = count(log(), [&text](const std::string& line) { return line == text; });
-  if (const auto type = fake_platform::typeOfLevel(text); type && times > 0) fake_platform::noteAsserted({*type, text});
+  if (const auto type = qxTypeOfLevel(text); type && times > 0) fake_platform::noteAsserted({*type, text});
   return times;
 }
 
