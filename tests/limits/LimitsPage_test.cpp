@@ -69,6 +69,8 @@ std::vector<Limit> limits() {
           {"kMaximumAccesses", AccessSession::kMaximumAccesses},
           {"kMaximumAccessesOfApplication", FileAccesses::kMaximumAccessesOfApplication},
           {"kMaximumUnconfinedAccesses", FileAccesses::kMaximumUnconfinedAccesses},
+          {"WrittenDirectories::kMaximumHeld", WrittenDirectories::kMaximumHeld},
+          {"WrittenDirectories::kMaximumUnconfinedHeld", WrittenDirectories::kMaximumUnconfinedHeld},
           {"Provisions::kMaximumRequestsUnderWay", Provisions::kMaximumRequestsUnderWay},
           {"ChangeNotices::kMaximumNoticesUnderWay", ChangeNotices::kMaximumNoticesUnderWay},
           {"ChangeNotices::kMaximumUntoldFiles", ChangeNotices::kMaximumUntoldFiles},

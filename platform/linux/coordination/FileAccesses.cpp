@@ -44,10 +44,13 @@ AccessNumber FileAccesses::newNumber() { return ++lastNumber_; }
 
 void FileAccesses::begin(AccessNumber number, FileAccess access, Answer answer) {
   Consequences consequences;
+  const Application application = access.holder.bundleIdentifier;
+  auto directory = access.kind == AccessKind::writing ? HeldDirectory::of({access.file, access.url}) : std::nullopt;
   {
     const std::lock_guard lock(mutex_);
     assert(!entries_.contains(number));
     enter(number, {std::move(access), Stage::waiting, std::move(answer)}, consequences);
+    if (directory && entries_.contains(number)) directories_.add(number, application, *std::move(directory));
   }
   carryOut(std::move(consequences));
 }
@@ -69,7 +72,7 @@ bool FileAccesses::hasRoomFor(const Application& application) const {
 }
 
 void FileAccesses::end(AccessNumber number, std::function<void()> ended) {
-  std::optional<FileAccess> written;
+  std::optional<Written> written;
   Consequences consequences;
   {
     const std::lock_guard lock(mutex_);
@@ -78,7 +81,7 @@ void FileAccesses::end(AccessNumber number, std::function<void()> ended) {
       Entry& entry = found->second;
       if (entry.stage == Stage::holding && entry.access.kind == AccessKind::writing) {
         entry.stage = Stage::ending;
-        written = entry.access;
+        written = Written{entry.access, directories_.take(number)};
       } else {
         if (entry.stage != Stage::holding) answerWith(entry, endedBeforeItBegan(entry.access.url), consequences);
         remove(number, consequences);
@@ -90,8 +93,10 @@ void FileAccesses::end(AccessNumber number, std::function<void()> ended) {
   carryOut(std::move(consequences));
 }
 
-void FileAccesses::tellThenRelease(AccessNumber number, const FileAccess& access, std::function<void()> ended) {
-  const KeyedFile file{access.file, access.url};
+void FileAccesses::tellThenRelease(AccessNumber number, const Written& written, std::function<void()> ended) {
+  const auto& [access, directory] = written;
+  KeyedFile file{access.file, access.url};
+  if (directory) file = directory->whereIsNow(file);
   // This outlives the telling.
   coordinator_.tellFinishedWriting(coordinator_.ownerOf(file, LinuxFileCoordinator::DirectoryItself::counts), access.holder, file,
                                    [this, number, ended = std::move(ended)] { release(number, ended); });
@@ -135,6 +140,7 @@ void FileAccesses::remove(AccessNumber number, Consequences& consequences) {
   entries_.erase(found);
   const auto count = counts_.find(access.holder.bundleIdentifier);
   if (--count->second == 0) counts_.erase(count);
+  (void)directories_.take(number);
   provisions_.leave(number);
   awaiting_.erase(number);
   const std::vector<AccessNumber> come = table_.leave(number);

@@ -29,6 +29,7 @@
 #include "platform/linux/coordination/AccessTable.h"
 #include "platform/linux/coordination/LinuxFileCoordinator.h"
 #include "platform/linux/coordination/Provisions.h"
+#include "platform/linux/coordination/WrittenDirectories.h"
 
 namespace docuvend::linux_platform {
 
@@ -85,6 +86,11 @@ class FileAccesses {
     Stage stage;
     Answer answer;  // until it has run
   };
+  // A write that is over, of which the provider is to hear.
+  struct Written {
+    FileAccess access;
+    std::optional<HeldDirectory> directory;
+  };
   struct Reader {
     AccessNumber number;
     FileKey file;
@@ -122,7 +128,7 @@ class FileAccesses {
   void lookAgain();
   void ask(const Question& question);
   void requestIsAnswered(ProvideRequest request, const std::optional<QXError>& error);
-  void tellThenRelease(AccessNumber number, const FileAccess& access, std::function<void()> ended);
+  void tellThenRelease(AccessNumber number, const Written& written, std::function<void()> ended);
   void release(AccessNumber number, std::function<void()> ended);
 
   LinuxFileCoordinator& coordinator_;
@@ -131,6 +137,7 @@ class FileAccesses {
   // Guarded by mutex_.
   AccessTable table_;
   Provisions provisions_;
+  WrittenDirectories directories_;             // of entries that write
   std::map<AccessNumber, Entry> entries_;      // as many as the table has
   std::map<Application, std::size_t> counts_;  // of entries; none that is 0
   std::set<AccessNumber> awaiting_;            // have the turn, and their provider is not registered

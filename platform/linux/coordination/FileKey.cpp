@@ -33,12 +33,15 @@ std::variant<KeyedFile, QXError> KeyedFile::of(const QXURL& url) {
   const OpenedPath opened = openDirectory(path.substr(0, slash + 1));
   if (const auto* failure = std::get_if<SystemFailure>(&opened)) return noDirectory(failure->code, url);
   const int directory = std::get<UniqueDescriptor>(opened).get();
+  return in(directory, path.substr(slash + 1), url);
+}
+
+std::variant<KeyedFile, QXError> KeyedFile::in(int directory, const std::string& name, const QXURL& url) {
   const auto status = statusOf(directory);
   if (const auto* failure = std::get_if<SystemFailure>(&status)) return noDirectory(failure->code, url);
   auto straight = kernelPath(directory);
   if (!straight) return noDirectory(ENOENT, url);
   if (!qxIsValidUTF8(*straight)) return noDirectory(EILSEQ, url);
-  std::string name = path.substr(slash + 1);
   if (*straight != "/") straight->append("/");
   const QXURLKind kind = url.hasDirectoryPath() ? QXURLKind::directory : QXURLKind::file;
   return KeyedFile{{std::get<ObjectStatus>(status).identity, name}, QXURL::fileURL(straight->append(name), kind)};

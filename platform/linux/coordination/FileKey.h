@@ -28,6 +28,9 @@ struct KeyedFile {
   // final slash; "/" has none. EILSEQ: the directory's path is not UTF-8.
   [[nodiscard]] static std::variant<KeyedFile, QXError> of(const QXURL& url);
 
+  // The same for that name in a directory that is open. `url` is what errors name, and says whether the name is a directory's.
+  [[nodiscard]] static std::variant<KeyedFile, QXError> in(int directory, const std::string& name, const QXURL& url);
+
   // The URL still leads to the same directory without a link, and what has the name there, if anything, is no link. Who owns a directory on
   // the way can exchange it: what was found out about the URL before holds only where this is so afterwards.
   [[nodiscard]] bool isInPlace() const;
