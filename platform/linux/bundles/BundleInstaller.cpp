@@ -76,15 +76,18 @@ std::vector<ParsedBundle> bundlesWith(const ParsedBundle& bundle, const Paths& p
 std::optional<QXError> refuseWhatIsAnothers(const ParsedBundle& bundle, const Paths& paths, QXPropertyLists& propertyLists) {
   const auto bundles = bundlesWith(bundle, paths, propertyLists);
   const GroupMembership membership(bundles);
+  const std::string& identifier = bundle.bundle.identifier;
   for (const std::string& group : bundle.wantedGroups) {
-    const auto refusal = membership.refusal(bundle.bundle.identifier, group);
+    const auto refusal = membership.refusal(identifier, group);
     // The bundle may wait for the owner.
     if (!refusal || refusal->reason == GroupMembership::Refusal::Reason::ownerIsMissing) continue;
-    return bundleError(BundleErrorCode::notItsOwn, refusal->text + ".");
+    return bundleError(BundleErrorCode::notItsOwn,
+                       "The bundle " + identifier + " may not belong to the group " + group + ", " + refusal->whose + ".");
   }
   const auto lists = GroupMembership::foreignLists(bundle);
   if (lists.empty()) return std::nullopt;
-  return bundleError(BundleErrorCode::notItsOwn, lists.front() + ".");
+  return bundleError(BundleErrorCode::notItsOwn, "The bundle " + identifier + " may not name members of the group " + lists.front().group +
+                                                     ", " + lists.front().whose + ".");
 }
 
 // A bundle's copy under a hidden name, and whatever else has taken that name; gone with the object.

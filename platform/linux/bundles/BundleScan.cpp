@@ -102,14 +102,14 @@ void BundleScan::scanDirectory(const std::string& root, BundleOrigin origin, con
                                const Parsed& lastParsed) {
   const std::string real = realPath(root);
   if (const auto why = distrustAt(real, origin)) {
-    report("[ERROR] Ignoring the bundles in " + real + ": it " + std::string(*why) + ".");
+    report(qxLogMessage("[ERROR] Ignoring the bundles in %@: it %@.", real, *why));
     return;
   }
   for (const auto& path : visibleEntries(root)) {
     std::error_code error;
     const auto type = fs::symlink_status(path, error).type();
     if (type == fs::file_type::symlink) {
-      report("[ERROR] Ignoring the bundle at " + path.string() + ": it is a link.");
+      report(qxLogMessage("[ERROR] Ignoring the bundle at %@: it is a link.", path.string()));
     }
     if (type != fs::file_type::directory) continue;
     if (unsettled.contains(path.string())) {
@@ -125,7 +125,7 @@ void BundleScan::scanDirectory(const std::string& root, BundleOrigin origin, con
       problem = std::get<BundleProblem>(std::move(parsed));
     }
     if (problem) {
-      report("[ERROR] Ignoring the bundle at " + path.string() + ": " + problem->text + ".");
+      report(qxLogMessage("[ERROR] Ignoring the bundle at %@: %@.", path.string(), problem->text));
     } else {
       add(std::get<ParsedBundle>(parsed));
     }
@@ -140,7 +140,7 @@ void BundleScan::add(const ParsedBundle& parsed) {
     found_.push_back(parsed);
     return;
   }
-  report("[ERROR] Ignoring the bundle at " + parsed.bundle.directory + ": " + same->bundle.directory + " has the same identifier.");
+  report(qxLogMessage("[ERROR] Ignoring the bundle at %@: %@ has the same identifier.", parsed.bundle.directory, same->bundle.directory));
 }
 
 BundleMap BundleScan::resolve() {
@@ -153,21 +153,21 @@ BundleMap BundleScan::resolve() {
     bundle.container = containers + "/" + bundle.identifier;
     for (const auto& group : parsed.wantedGroups) {
       if (const auto refusal = membership.refusal(bundle.identifier, group)) {
-        report("[ERROR] " + refusal->text + ".");
+        report(qxLogMessage("[ERROR] The bundle %@ may not belong to the group %@, %@.", bundle.identifier, group, refusal->whose));
         continue;
       }
       if (bundle.groups.try_emplace(group, groupContainers + "/" + group).second) bundle.version += "/" + group;
     }
-    for (const auto& list : GroupMembership::foreignLists(parsed)) report("[ERROR] " + list + ".");
+    for (const auto& [group, whose] : GroupMembership::foreignLists(parsed)) {
+      report(qxLogMessage("[ERROR] The bundle %@ may not name members of the group %@, %@.", bundle.identifier, group, whose));
+    }
     result.emplace(bundle.identifier, std::move(bundle));
   }
   return result;
 }
 
-void BundleScan::report(const std::string& text) {
-  if (reported_.insert(text).second && !lastReported_.contains(text) && log_.isEnabled(QXLogType::fault)) {
-    log_.write(QXLogType::fault, text);
-  }
+void BundleScan::report(const QXLogMessage& message) {
+  if (reported_.insert(message.text).second && !lastReported_.contains(message.text)) qxLog(log_, message);
 }
 
 }  // namespace docuvend::linux_platform

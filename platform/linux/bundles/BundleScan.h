@@ -7,6 +7,7 @@
 #include <string>
 #include <vector>
 
+#include "platform/QXLogMessage.h"
 #include "platform/linux/base/Paths.h"
 #include "platform/linux/bundles/BundleParser.h"
 #include "platform/log.h"
@@ -33,7 +34,7 @@ class BundleScan {
   void scanDirectory(const std::string& root, BundleOrigin origin, const std::set<std::string>& unsettled, const Parsed& lastParsed);
   void add(const ParsedBundle& parsed);
   [[nodiscard]] BundleMap resolve();
-  void report(const std::string& text);
+  void report(const QXLogMessage& message);
 
   const Paths paths_;
   QXPropertyLists& propertyLists_;

@@ -8,9 +8,8 @@
 namespace docuvend::linux_platform {
 namespace {
 
-// Goes on after the group's name.
 std::string whose(const std::optional<std::string>& owner) {
-  return owner ? ", which is " + *owner + "'s" : ", which is nobody's: a group's name is its owner's identifier and one part more";
+  return owner ? "which is " + *owner + "'s" : "which is nobody's: a group's name is its owner's identifier and one part more";
 }
 
 bool names(const ParsedBundle& owner, const std::string& identifier, const std::string& group) {
@@ -30,21 +29,19 @@ std::optional<std::string> ownerOfGroup(std::string_view group) {
 std::optional<GroupMembership::Refusal> GroupMembership::refusal(const std::string& identifier, const std::string& group) const {
   const auto owner = ownerOfGroup(group);
   if (owner == identifier) return std::nullopt;
-  const std::string text = "The bundle " + identifier + " may not belong to the group " + group + whose(owner);
-  if (!owner) return Refusal{Refusal::Reason::nobodys, text};
+  if (!owner) return Refusal{Refusal::Reason::nobodys, whose(owner)};
   const auto manifest =
       std::find_if(bundles_.begin(), bundles_.end(), [&owner](const ParsedBundle& parsed) { return parsed.bundle.identifier == *owner; });
-  if (manifest == bundles_.end()) return Refusal{Refusal::Reason::ownerIsMissing, text};
+  if (manifest == bundles_.end()) return Refusal{Refusal::Reason::ownerIsMissing, whose(owner)};
   if (names(*manifest, identifier, group)) return std::nullopt;
-  return Refusal{Refusal::Reason::anothers, text};
+  return Refusal{Refusal::Reason::anothers, whose(owner)};
 }
 
-std::vector<std::string> GroupMembership::foreignLists(const ParsedBundle& bundle) {
-  std::vector<std::string> lists;
+std::vector<GroupMembership::ForeignList> GroupMembership::foreignLists(const ParsedBundle& bundle) {
+  std::vector<ForeignList> lists;
   for (const auto& [group, members] : bundle.groupMembers) {
     const auto owner = ownerOfGroup(group);
-    if (owner == bundle.bundle.identifier) continue;
-    lists.push_back("The bundle " + bundle.bundle.identifier + " may not name members of the group " + group + whose(owner));
+    if (owner != bundle.bundle.identifier) lists.push_back({group, whose(owner)});
   }
   return lists;
 }

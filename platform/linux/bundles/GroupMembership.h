@@ -23,7 +23,7 @@ class GroupMembership {
   struct Refusal {
     enum class Reason { nobodys, ownerIsMissing, anothers };
     Reason reason;
-    std::string text;  // a sentence without its full stop
+    std::string whose;  // goes on after the group's name
   };
 
   explicit GroupMembership(const std::vector<ParsedBundle>& bundles) : bundles_(bundles) {}
@@ -31,8 +31,12 @@ class GroupMembership {
   // Why the bundle, which is one of them or about to be, may not have the group's container; none when it may.
   [[nodiscard]] std::optional<Refusal> refusal(const std::string& identifier, const std::string& group) const;
 
-  // For each group whose members the bundle wants to name without being its owner, a sentence without its full stop.
-  [[nodiscard]] static std::vector<std::string> foreignLists(const ParsedBundle& bundle);
+  struct ForeignList {
+    std::string group;
+    std::string whose;  // goes on after the group's name
+  };
+  // The groups whose members the bundle wants to name without being their owner.
+  [[nodiscard]] static std::vector<ForeignList> foreignLists(const ParsedBundle& bundle);
 
  private:
   const std::vector<ParsedBundle>& bundles_;

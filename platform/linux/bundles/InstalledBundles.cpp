@@ -16,6 +16,8 @@
 #include <filesystem>
 #include <system_error>
 
+#include "platform/QXLogMessage.h"
+
 namespace docuvend::linux_platform {
 namespace {
 
@@ -191,10 +193,9 @@ void InstalledBundles::renewWatch() {
   if (isComplete == watchIsComplete_) return;
   watchIsComplete_ = isComplete;
   if (isComplete) {
-    log_.write(QXLogType::defaultType, "[NOTICE] Every bundle directory is watched again.");
+    qxLog(log_, "[NOTICE] Every bundle directory is watched again.");
   } else {
-    log_.write(QXLogType::fault, "[ERROR] Not every bundle directory can be watched, so they are looked at every " +
-                                     std::to_string(kLookWithoutWatch.count()) + " seconds.");
+    qxLog(log_, "[ERROR] Not every bundle directory can be watched, so they are looked at every %d seconds.", kLookWithoutWatch.count());
   }
 }
 
