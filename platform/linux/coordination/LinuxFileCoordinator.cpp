@@ -226,7 +226,7 @@ void LinuxFileCoordinator::tellFinishedWriting(const FileOwner& owner, const Acc
   if (known && hasChangedSince(owner)) tellUntold();
   if (owner.isLost) {
     const LogSubject subject(subjectOf(writer));
-    logError("Nobody can be told that the item at URL " + file.url.absoluteString() + " has changed: it is not where it was.");
+    logError(qxLogMessage("[ERROR] Nobody can be told that the item at URL %@ has changed: it is not where it was.", file.url));
   }
   if (told) told();
 }
@@ -265,14 +265,14 @@ void LinuxFileCoordinator::noticeHasFailed(const std::shared_ptr<QXDocuvend>& pr
   if (failed) {
     const auto& [gone, written, writer] = failed->notice;
     const LogSubject subject(subjectOf(writer));
-    logError("The extension " + provider->_fileReactorID().value_or("(null)") + " was never told that the item at URL " +
-             written.url.absoluteString() + " has changed.");
+    logError(qxLogMessage("[ERROR] The extension %@ was never told that the item at URL %@ has changed.", provider->_fileReactorID(),
+                          written.url));
   }
   noticeHasEnded(provider, file);
 }
 
-void LinuxFileCoordinator::logError(const std::string& text) const {
-  if (outside_.log != nullptr) outside_.log->write(QXLogType::fault, "[ERROR] " + text);
+void LinuxFileCoordinator::logError(const QXLogMessage& message) const {
+  if (outside_.log != nullptr) qxLog(*outside_.log, message);
 }
 
 }  // namespace docuvend::linux_platform

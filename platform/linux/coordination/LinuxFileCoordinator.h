@@ -25,6 +25,7 @@
 #include <utility>
 #include <vector>
 
+#include "platform/QXLogMessage.h"
 #include "platform/file_coordination.h"
 #include "platform/file_system.h"
 #include "platform/linux/coordination/AccessHolder.h"
@@ -118,7 +119,7 @@ class LinuxFileCoordinator final : public QXFileCoordinator {
   void tellUntold();
   void registrationsChanged();
   void callHandler();
-  void logError(const std::string& text) const;
+  void logError(const QXLogMessage& message) const;
   // Never used before.
   [[nodiscard]] std::string nameFor(const char* role, int process);
 
