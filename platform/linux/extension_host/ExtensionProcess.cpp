@@ -25,6 +25,7 @@
 #include <string_view>
 #include <utility>
 
+#include "platform/QXLogMessage.h"
 #include "platform/linux/base/pidfd.h"
 #include "platform/linux/extension_host/ExtensionErrors.h"
 #include "platform/linux/extension_host/ProcessTree.h"
@@ -212,14 +213,14 @@ void ExtensionProcess::connectionIsOver() {
 bool ExtensionProcess::reap() {
   std::string how;
   Stage before = Stage::alive;
-  QXLogType importance = QXLogType::defaultType;
+  bool isExpected = false;
   {
     const std::lock_guard lock(eventMutex_);
     siginfo_t info{};
     if (waitid(P_PIDFD, static_cast<id_t>(process_.descriptor.get()), &info, WEXITED | WNOHANG) != 0 || info.si_pid == 0) return false;
     how = describeEnd(info);
     isReaped_ = true;
-    if (isLetGo_) importance = QXLogType::info;
+    isExpected = isLetGo_;
     before = std::exchange(stage_, Stage::killed);
     // Before the messages fail: whoever tries again then must not be sent to this process.
     if (before == Stage::alive) handlers_.onLost(ProcessLifetime::Cause::died);
@@ -227,7 +228,11 @@ bool ExtensionProcess::reap() {
   if (before == Stage::alive) {
     endpoint_->close(extensionHostError(ExtensionHostErrorCode::ended, "The process of " + identifier_ + " " + how + "."));
   }
-  note(importance, how);
+  if (isExpected) {
+    qxLog(log_, "[INFO] The process of %@ %@.", identifier_, how);
+  } else {
+    qxLog(log_, "[NOTICE] The process of %@ %@.", identifier_, how);
+  }
   const std::lock_guard lock(eventMutex_);
   handlers_.onGone();
   return true;
@@ -253,13 +258,13 @@ void ExtensionProcess::lookForOverdueAnswers() {
   }
   if (verdict.setTimer) answerTimer_->setFor(*verdict.setTimer);
   if (!verdict.overdue) return;
-  const std::string what = "did not answer " + *verdict.overdue + " in time";
   const std::lock_guard lock(eventMutex_);
   if (stage_ != Stage::alive) return;
   stage_ = Stage::killed;
-  note(QXLogType::defaultType, what);
+  qxLog(log_, "[NOTICE] The process of %@ did not answer %@ in time.", identifier_, *verdict.overdue);
   handlers_.onLost(ProcessLifetime::Cause::notAnswering);
-  closeAndKill(extensionHostError(ExtensionHostErrorCode::notAnswering, "The process of " + identifier_ + " " + what + "."));
+  closeAndKill(extensionHostError(ExtensionHostErrorCode::notAnswering,
+                                  "The process of " + identifier_ + " did not answer " + *verdict.overdue + " in time."));
 }
 
 void ExtensionProcess::watchLiveness() {
@@ -300,12 +305,6 @@ AnswerDeadlines::Message ExtensionProcess::expectAnswer(AnswerLine line, const s
 void ExtensionProcess::gotAnswer(const AnswerDeadlines::Message& message) {
   const std::lock_guard lock(deadlinesMutex_);
   deadlines_.answered(message, Clock::now());
-}
-
-void ExtensionProcess::note(QXLogType type, const std::string& what) const {
-  if (!log_.isEnabled(type)) return;
-  const std::string level = type == QXLogType::info ? "[INFO]" : "[NOTICE]";
-  log_.write(type, level + " The process of " + identifier_ + " " + what + ".");
 }
 
 }  // namespace docuvend::linux_platform

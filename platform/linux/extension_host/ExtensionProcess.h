@@ -95,7 +95,6 @@ class ExtensionProcess : public std::enable_shared_from_this<ExtensionProcess> {
   void closeAndKill(const QXError& why);
   [[nodiscard]] AnswerDeadlines::Message expectAnswer(AnswerLine line, const std::string& operationName);
   void gotAnswer(const AnswerDeadlines::Message& message);
-  void note(QXLogType type, const std::string& what) const;
 
   // Constant after `create`.
   const std::string identifier_;

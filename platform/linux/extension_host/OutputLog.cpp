@@ -9,6 +9,7 @@
 #include <string_view>
 #include <utility>
 
+#include "platform/QXLogMessage.h"
 #include "platform/linux/extension_host/OutputLines.h"
 #include "platform/linux/log/LineAllowance.h"
 
@@ -35,11 +36,11 @@ struct OutputLog::State {
     if (!log.isEnabled(QXLogType::info)) return;
     const auto now = std::chrono::steady_clock::now();
     tellOfLeftOut(allowance.dueCount(now));
-    if (allowance.line(now)) log.write(QXLogType::info, "[INFO] " + name + ": " + line);
+    if (allowance.line(now)) qxLog(log, "[INFO] %@: %@", name, line);
   }
 
   void tellOfLeftOut(std::size_t count) const {
-    if (count > 0) log.write(QXLogType::info, "[INFO] " + name + " wrote " + std::to_string(count) + " lines more than are logged.");
+    if (count > 0) qxLog(log, "[INFO] %@ wrote %d lines more than are logged.", name, count);
   }
 
   Pipe readChunk() {
