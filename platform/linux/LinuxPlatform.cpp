@@ -15,6 +15,7 @@
 #include <utility>
 #include <vector>
 
+#include "platform/QXLogMessage.h"
 #include "platform/linux/LinuxStatus.h"
 #include "platform/linux/base/Paths.h"
 #include "platform/linux/bundles/InstalledBundles.h"
@@ -159,16 +160,14 @@ struct LinuxPlatform::Services {
   }
 
   void logProtections() {
-    for (const std::string& sentence : status.protections()) log.defaultLog().write(QXLogType::defaultType, "[NOTICE] " + sentence);
+    for (const std::string& sentence : status.protections()) qxLog(log.defaultLog(), "[NOTICE] %@", sentence);
   }
 
  private:
   void followInstalledBundles() {
     const auto error = sandbox->followInstalledBundles();
     if (!error) return;
-    log.defaultLog().write(
-        QXLogType::fault,
-        "[ERROR] The tokens for a container that a bundle has left may be good again after a restart: " + error->description());
+    qxLog(log.defaultLog(), "[ERROR] The tokens for a container that a bundle has left may be good again after a restart: %@", *error);
   }
   std::shared_ptr<QXRpcListener> listen(const char* name, const std::shared_ptr<QXRpcListenerDelegate>& delegate) {
     auto listener = rpc.listenerForService(name);

@@ -9,6 +9,7 @@
 #include <fstream>
 #include <utility>
 
+#include "platform/QXLogMessage.h"
 #include "platform/linux/base/LogSubject.h"
 #include "platform/linux/base/kernel.h"
 #include "platform/linux/base/pidfd.h"
@@ -93,8 +94,8 @@ void LinuxPeerDirectory::readPeer(int socket, PeerIdentity& identity) {
 // At the usual level, for whoever wonders why a program that was at work is refused; the bundle's share of the log is what it costs.
 void LinuxPeerDirectory::tellOfOutdated(const PeerIdentity& identity, const std::string& bundleIdentifier) const {
   const LogSubject subject(std::make_shared<const std::string>(bundleIdentifier));
-  log_.write(QXLogType::defaultType, "[NOTICE] PID " + std::to_string(identity.pid) + " was started from another bundle " +
-                                         bundleIdentifier + " than the one that is installed now; it is to be started again.");
+  qxLog(log_, "[NOTICE] PID %d was started from another bundle %@ than the one that is installed now; it is to be started again.",
+        identity.pid, bundleIdentifier);
 }
 
 bool LinuxPeerDirectory::isCurrent(const PeerIdentity& peer) {
@@ -105,9 +106,7 @@ bool LinuxPeerDirectory::isCurrent(const PeerIdentity& peer) {
 
 void LinuxPeerDirectory::becomeNobody(PeerIdentity& identity, const std::string& reason) {
   identity.standing = Standing::nobody;
-  if (log_.isEnabled(QXLogType::debug)) {
-    log_.write(QXLogType::debug, "[DEBUG] PID " + std::to_string(identity.pid) + " is nobody: " + reason + ".");
-  }
+  qxLog(log_, "[DEBUG] PID %d is nobody: %@.", identity.pid, reason);
 }
 
 std::shared_ptr<const PeerIdentity> LinuxPeerDirectory::declare(const PeerIdentity& peer, const std::string& bundleIdentifier) {
@@ -133,9 +132,7 @@ std::shared_ptr<const PeerIdentity> LinuxPeerDirectory::declare(const PeerIdenti
     }
     identities.push_back(identity);
   }
-  if (log_.isEnabled(QXLogType::defaultType)) {
-    log_.write(QXLogType::defaultType, "[NOTICE] PID " + std::to_string(peer.pid) + " declares itself to be " + bundleIdentifier + ".");
-  }
+  qxLog(log_, "[NOTICE] PID %d declares itself to be %@.", peer.pid, bundleIdentifier);
   return identity;
 }
 

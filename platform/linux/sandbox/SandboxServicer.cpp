@@ -3,6 +3,8 @@
 #include <string>
 #include <utility>
 
+#include "platform/QXLogMessage.h"
+
 namespace docuvend::linux_platform {
 namespace {
 
@@ -39,7 +41,7 @@ void SandboxServicer::noteRefusal(const QXError& error) {
   if (error.code != static_cast<std::int64_t>(SandboxErrorCode::badToken) || noted_.exchange(true)) return;
   const auto connection = connection_.lock();
   const int pid = connection ? connection->processIdentifier() : 0;
-  log_.write(QXLogType::defaultType, "[NOTICE] Refusing a sandbox token from PID " + std::to_string(pid) + ": " + error.description());
+  qxLog(log_, "[NOTICE] Refusing a sandbox token from PID %d: %@", pid, error);
 }
 
 }  // namespace docuvend::linux_platform

@@ -13,6 +13,7 @@
 
 #include <cerrno>
 
+#include "platform/QXLogMessage.h"
 #include "platform/linux/files/PrivateFile.h"
 
 namespace docuvend::linux_platform {
@@ -62,8 +63,7 @@ std::variant<std::unique_ptr<TokenSession>, QXError> TokenSession::load(const Pa
     if (auto* known = std::get_if<TokenFloors>(&floors)) {
       return std::make_unique<TokenSession>(paths.tokenFloors, std::get<TokenKey>(key), std::move(*known));
     }
-    log.write(QXLogType::defaultType,
-              "[NOTICE] No sandbox token issued until now is good any more: " + std::get<QXError>(floors).description());
+    qxLog(log, "[NOTICE] No sandbox token issued until now is good any more: %@", std::get<QXError>(floors));
   }
   // The key first: what was issued under the old one is worthless from here, whatever becomes of the floors.
   key = TokenKey::renew(paths.tokenKey);
