@@ -13,6 +13,8 @@
 #include <string_view>
 #include <utility>
 
+#include "platform/QXLogMessage.h"
+
 namespace docuvend::linux_platform {
 namespace {
 
@@ -63,8 +65,7 @@ std::vector<ActivatedSocket> takeActivatedSockets(QXLogHandle& log) {
     UniqueDescriptor descriptor(kFirstActivatedDescriptor + i);
     if (::fcntl(descriptor.get(), F_SETFD, FD_CLOEXEC) != 0 || !hasOption(descriptor.get(), SO_DOMAIN, AF_UNIX) ||
         !hasOption(descriptor.get(), SO_TYPE, SOCK_STREAM) || !hasOption(descriptor.get(), SO_ACCEPTCONN, 1)) {
-      log.write(QXLogType::defaultType,
-                "[NOTICE] Ignoring the passed descriptor " + std::to_string(descriptor.get()) + ": it is no listening Unix stream socket.");
+      qxLog(log, "[NOTICE] Ignoring the passed descriptor %d: it is no listening Unix stream socket.", descriptor.get());
       continue;
     }
     std::string path = boundPath(descriptor.get());

@@ -2,6 +2,7 @@
 
 #include <utility>
 
+#include "platform/QXLogMessage.h"
 #include "platform/linux/rpc/StraightURLs.h"
 
 namespace docuvend::linux_platform {
@@ -12,8 +13,8 @@ Endpoint::Handlers handlersFor(QXLogHandle& log, int loggedProcess, LogSubject::
   handlers.onMisbehaviour = [&log, loggedProcess, name = std::move(subject)](const QXError& reason) {
     const LogSubject subject(name);
     const auto text = reason.texts.find("description");
-    log.write(QXLogType::defaultType, "[NOTICE] Closing the connection of PID " + std::to_string(loggedProcess) + ": " +
-                                          (text == reason.texts.end() ? reason.description() : text->second));
+    qxLog(log, "[NOTICE] Closing the connection of PID %d: %@", loggedProcess,
+          text == reason.texts.end() ? reason.description() : text->second);
   };
   handlers.onClose = std::move(onEnd);
   return handlers;

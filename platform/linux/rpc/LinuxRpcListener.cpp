@@ -10,6 +10,7 @@
 #include <utility>
 #include <vector>
 
+#include "platform/QXLogMessage.h"
 #include "platform/linux/base/PassedDescriptors.h"
 
 namespace docuvend::linux_platform {
@@ -81,7 +82,7 @@ void LinuxRpcListener::resume() {
     strongSelf->acceptWaiting();
     return EPOLLIN;
   });
-  if (!registration_) surroundings_.log.write(QXLogType::fault, "[ERROR] A listener's socket cannot be watched.");
+  if (!registration_) qxLog(surroundings_.log, "[ERROR] A listener's socket cannot be watched.");
 }
 
 void LinuxRpcListener::acceptWaiting() {
@@ -117,8 +118,7 @@ bool LinuxRpcListener::acceptOne() {
 // Where even that is of no use, this thread waits a little, so that others may release something.
 void LinuxRpcListener::acceptAndDrop(int errnoValue) {
   if (!std::exchange(isStarved_, true)) {
-    surroundings_.log.write(QXLogType::defaultType,
-                            "[NOTICE] Refusing connections: " + QXError::system(errnoValue, "cannot accept").texts.at("description"));
+    qxLog(surroundings_.log, "[NOTICE] Refusing connections: %@", QXError::system(errnoValue, "cannot accept").texts.at("description"));
   }
   spare_.reset();
   const bool dropped = static_cast<bool>(UniqueDescriptor(::accept4(socket_, nullptr, nullptr, SOCK_CLOEXEC)));
@@ -139,8 +139,8 @@ void LinuxRpcListener::admit(UniqueDescriptor socket) {
   auto admission = surroundings_.limiter->admit(counted, limits);
   if (admission.verdict != ConnectionLimiter::Verdict::admitted) {
     if (admission.verdict == ConnectionLimiter::Verdict::refused) {
-      surroundings_.log.write(QXLogType::defaultType, "[NOTICE] Refusing a connection of PID " + std::to_string(process) + ": " + counted +
-                                                          " may not open more than " + std::to_string(limits.connections) + ".");
+      qxLog(surroundings_.log, "[NOTICE] Refusing a connection of PID %d: %@ may not open more than %d.", process, counted,
+            limits.connections);
     }
     refuse(std::move(socket), "too many connections");
     return;
@@ -173,10 +173,9 @@ void LinuxRpcListener::endOutdated() {
 
 void LinuxRpcListener::end(LinuxRpcConnection& connection, const PeerIdentity& peer) const {
   const LogSubject subject(logSubjectFor(peer));
-  const std::string reason = "its bundle " + countedAs(peer) + " was removed or replaced";
-  connection.close(refusal(reason));
-  surroundings_.log.write(QXLogType::defaultType,
-                          "[NOTICE] Closing the connection of PID " + std::to_string(peer.pid) + ": " + reason + ".");
+  const std::string bundle = countedAs(peer);
+  connection.close(refusal("its bundle " + bundle + " was removed or replaced"));
+  qxLog(surroundings_.log, "[NOTICE] Closing the connection of PID %d: its bundle %@ was removed or replaced.", peer.pid, bundle);
 }
 
 // A declared bundle changes nothing here: it comes later, and only from an unconfined process.
@@ -194,8 +193,7 @@ CallRules LinuxRpcListener::rulesFor(const PeerIdentity& peer, ConnectionLimiter
 void LinuxRpcListener::refuseOutsider(const PeerIdentity& peer, UniqueDescriptor socket) {
   const std::string counted = countedAs(peer);
   if (outsiders_.isDue(counted, std::chrono::steady_clock::now())) {
-    surroundings_.log.write(QXLogType::defaultType, "[NOTICE] Refusing a connection of PID " + std::to_string(peer.pid) + ": " +
-                                                        service_.name + " is not for " + counted + ".");
+    qxLog(surroundings_.log, "[NOTICE] Refusing a connection of PID %d: %@ is not for %@.", peer.pid, service_.name, counted);
   }
   refuse(std::move(socket), service_.name + " is for unconfined processes alone");
 }

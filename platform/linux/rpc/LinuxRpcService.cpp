@@ -8,6 +8,7 @@
 #include <utility>
 #include <variant>
 
+#include "platform/QXLogMessage.h"
 #include "platform/linux/rpc/BoundSocket.h"
 #include "platform/linux/rpc/LinuxRpcListener.h"
 
@@ -29,7 +30,7 @@ UniqueDescriptor LinuxRpcService::takePassedSocket(const std::string& name) {
 }
 
 void LinuxRpcService::giveUp(const std::string& name, const QXError& error) const {
-  log_.write(QXLogType::fault, "[ERROR] Cannot publish the service " + name + ": " + error.description());
+  qxLog(log_, "[ERROR] Cannot publish the service %@: %@", name, error);
   std::_Exit(EXIT_FAILURE);  // other threads are at work: nothing is taken down under them
 }
 
