@@ -194,6 +194,9 @@ class CoordinationOverSockets : public testing::SandboxHouse {
   }
 
   [[nodiscard]] SocketClient connected() { return {*reactor, socketPath}; }
+  QXFileCoordination::ErrorReply intoAnswers() {
+    return [this](Error error) { answers.put(std::move(error)); };
+  }
   // Until so many have the file or wait for it: a request that was sent is not entered yet.
   void awaitAccesses(const QXURL& url, std::size_t count) const {
     const FileKey file = std::get<KeyedFile>(KeyedFile::of(url)).key;
@@ -202,6 +205,10 @@ class CoordinationOverSockets : public testing::SandboxHouse {
   const std::string socketPath = directory.path() + "/service";
   const QXURL item = QXURL::fileURL(document, QXURLKind::file);
   const QXURL plain = QXURL::fileURL(outside + "/secret.txt", QXURLKind::file);
+  // What the clients hear: filled until the reactor has ended.
+  Mailbox<Error> answers;
+  Mailbox<Error> ends;
+  Mailbox<int> begun;
   std::unique_ptr<DoomedWriter> doomed;
   EverybodyIsAnother everybody;
   LinuxFileSystem fileSystem{Paths{}};
@@ -218,17 +225,15 @@ class CoordinationOverSockets : public testing::SandboxHouse {
 TEST_F(CoordinationOverSockets, OfAKilledWriterTheProviderHearsOnceAndTheNextHasItsTurn) {
   ASSERT_TRUE(doomed->begins());
   const auto next = connected();
-  Mailbox<Error> answers;
-  next.coordinate<kWrite>(item, [&answers](Error error) { answers.put(std::move(error)); });
+  next.coordinate<kWrite>(item, intoAnswers());
   const std::string writer = "writer " + std::to_string(doomed->pid()) + "-";
   doomed->kill();
   EXPECT_TRUE(isSuccess(answers.take()));
   const auto told = provider->told.take();
   ASSERT_TRUE(told);
   EXPECT_TRUE(told->starts_with(writer)) << *told;
-  Mailbox<Error> ended;
-  next.end([&ended](Error error) { ended.put(std::move(error)); });
-  EXPECT_TRUE(isSuccess(ended.take()));
+  next.end([this](Error error) { ends.put(std::move(error)); });
+  EXPECT_TRUE(isSuccess(ends.take()));
   const auto second = provider->told.take();
   ASSERT_TRUE(second);
   EXPECT_FALSE(second->starts_with(writer)) << "it was told of the killed one twice";
@@ -239,8 +244,7 @@ TEST_F(CoordinationOverSockets, WhoLeavesWhileItsProviderHangsHoldsUpNobody) {
   reader.coordinate<kRead>(item, [](const Error&) {});
   ASSERT_TRUE(provider->asked.take());
   const auto writer = connected();
-  Mailbox<Error> answers;
-  writer.coordinate<kWrite>(item, [&answers](Error error) { answers.put(std::move(error)); });
+  writer.coordinate<kWrite>(item, intoAnswers());
   awaitAccesses(item, 2);
   reader.leave();
   EXPECT_TRUE(isSuccess(answers.take()));
@@ -248,15 +252,13 @@ TEST_F(CoordinationOverSockets, WhoLeavesWhileItsProviderHangsHoldsUpNobody) {
 
 TEST_F(CoordinationOverSockets, WhoLeavesWhileItWaitsIsForgotten) {
   const auto holder = connected();
-  Mailbox<Error> held;
-  holder.coordinate<kWrite>(plain, [&held](Error error) { held.put(std::move(error)); });
-  ASSERT_TRUE(isSuccess(held.take()));
+  holder.coordinate<kWrite>(plain, intoAnswers());
+  ASSERT_TRUE(isSuccess(answers.take()));
   auto waiter = connected();
   waiter.coordinate<kWrite>(plain, [](const Error&) {});
   awaitAccesses(plain, 2);
   const auto last = connected();
-  Mailbox<Error> answers;
-  last.coordinate<kWrite>(plain, [&answers](Error error) { answers.put(std::move(error)); });
+  last.coordinate<kWrite>(plain, intoAnswers());
   awaitAccesses(plain, 3);
   waiter.leave();
   holder.end({});
@@ -266,10 +268,9 @@ TEST_F(CoordinationOverSockets, WhoLeavesWhileItWaitsIsForgotten) {
 TEST_F(CoordinationOverSockets, TwoHundredWritersTakeTurns) {
   constexpr int kWriters = 200;
   std::vector<SocketClient> writers;
-  Mailbox<int> begun;
   for (int i = 0; i < kWriters; ++i) writers.push_back(connected());
   for (int i = 0; i < kWriters; ++i) {
-    writers[static_cast<std::size_t>(i)].coordinate<kWrite>(plain, [&begun, i](const Error& error) { begun.put(error ? -1 : i); });
+    writers[static_cast<std::size_t>(i)].coordinate<kWrite>(plain, [this, i](const Error& error) { begun.put(error ? -1 : i); });
   }
   std::set<int> seen;
   for (int i = 0; i < kWriters; ++i) {

@@ -128,6 +128,8 @@ struct FileAccessesThreads : ::testing::Test {
     fileSystem.addDirectory("/other");
     coordinator._addDocuvend(provider);
   }
+  // What it has not answered yet is still to be taken by the accesses.
+  void TearDown() override { provider->stop(); }
 
   FileAccess randomAccess(std::mt19937& random, int thread) const {
     const auto process = static_cast<std::uint8_t>(1 + thread / kThreadsOfAProcess);

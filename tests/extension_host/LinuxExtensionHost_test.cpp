@@ -232,13 +232,13 @@ TEST_F(LinuxExtensionHostTest, AMessageToAProcessThatIsGoneFails) {
 }
 
 TEST_F(LinuxExtensionHostTest, ARequestEndsWithTheFailureOfItsMessageAndItsLivingProcessCanBecomeIdle) {
+  std::promise<QXError> failed;
   RealExtensions real(times(milliseconds(1)));
   const auto extension = real.extension();
   const auto begun = begin(*extension);
   ASSERT_TRUE(begun && begun->request);
   const auto context = extension->extensionContextForRequest(*begun->request);
   ASSERT_TRUE(context);
-  std::promise<QXError> failed;
   const QXRemote<_QXDocuvendVendor> vendor(
       context->auxiliaryConnection()->remoteObjectProxy([&failed](const QXError& error) { failed.set_value(error); }));
   // No text on the wire holds this character: the message fails and the process lives.
@@ -415,9 +415,9 @@ TEST_F(LinuxExtensionHostTest, TheStatusOfARunningExtensionNamesItsProcessAndCou
 }
 
 TEST_F(LinuxExtensionHostTest, ARequestThatWaitsForAProcessCountsAsOpen) {
-  RealExtensions real;
   std::promise<QXDictionary> during;
   std::atomic<bool> isBegun = false;
+  RealExtensions real;
   // The first request's completion holds up the thread that starts processes, so the second one's process cannot be there yet.
   const auto set = real.extensions({real.makeBundle("com.orvane.a"), real.makeBundle("com.orvane.b")});
   ASSERT_EQ(set.size(), 2U);
@@ -434,9 +434,9 @@ TEST_F(LinuxExtensionHostTest, ARequestThatWaitsForAProcessCountsAsOpen) {
 
 // It runs on the thread that starts processes, which is at work for nobody in particular.
 TEST_F(LinuxExtensionHostTest, ARequestThatWaitsForAProcessIsCompletedForWhomItWasBegun) {
+  std::promise<LogSubject::Name> subject;
   RealExtensions real;
   const auto extension = real.extension();
-  std::promise<LogSubject::Name> subject;
   {
     const LogSubject beginners(std::make_shared<const std::string>("com.example.app"));
     extension->beginExtensionRequest(

@@ -70,10 +70,10 @@ TEST_F(ProviderWorkTest, NoNumberOfLongPiecesHoldsUpAQuickOne) {
 }
 
 TEST(ProviderWork, FinishingDropsWhatHasNotBegunAndTellsWhetherSomethingStillRuns) {
-  ProviderWork work;
   std::promise<void> runs;
   std::promise<void> gate;
   std::atomic<bool> second{false};
+  ProviderWork work;
   work.performForItem("a", [&runs, &gate] {
     runs.set_value();
     gate.get_future().wait();

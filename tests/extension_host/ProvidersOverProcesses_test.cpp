@@ -3,11 +3,14 @@
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
 
+#include <atomic>
 #include <chrono>
 #include <filesystem>
 #include <fstream>
+#include <functional>
 #include <future>
 #include <memory>
+#include <thread>
 
 #include "common/DVErrors.h"
 #include "platform/QXPlatform.h"
@@ -82,24 +85,25 @@ bool soon(const std::function<bool()>& condition) {
   return true;
 }
 
-// Ends the process of a request between its beginning and the moment when whoever began it hears of that.
-class EndedTooSoon final : public QXExtension {
+// A request that has begun, of which whoever began it does not know yet.
+struct BegunRequest {
+  std::optional<QXUUID> request;
+  std::function<void()> tell;
+};
+
+// An extension whose requests begin as the real one's, and are handed to the test to tell of them.
+class ToldLater final : public QXExtension {
  public:
-  explicit EndedTooSoon(std::shared_ptr<QXExtension> real) : real_(std::move(real)) {}
+  ToldLater(std::shared_ptr<QXExtension> real, std::shared_ptr<Mailbox<BegunRequest>> begun)
+      : real_(std::move(real)), begun_(std::move(begun)) {}
 
   [[nodiscard]] std::optional<std::string> identifier() const override { return real_->identifier(); }
   [[nodiscard]] std::string description() const override { return real_->description(); }
   [[nodiscard]] bool isEqual(const QXExtension& other) const override { return real_->isEqual(other); }
   void beginExtensionRequest(BeginCompletion completion) override {
     real_->beginExtensionRequest(
-        [real = real_, completion = std::move(completion)](std::optional<QXUUID> request, std::optional<QXError> error) {
-          // Not here: this is the thread that would bring the news of the end.
-          std::thread([real, completion, request, error = std::move(error)] {
-            const linux_platform::Conversation other(real);
-            (void)await(other.start("crash"));
-            EXPECT_TRUE(soon([&] { return !request || real->extensionContextForRequest(*request) == nullptr; }));
-            completion(request, error);
-          }).detach();
+        [begun = begun_, completion = std::move(completion)](std::optional<QXUUID> request, std::optional<QXError> error) {
+          begun->put({request, [completion, request, error = std::move(error)] { completion(request, error); }});
         });
   }
   void cancelExtensionRequest(const QXUUID& request) override { real_->cancelExtensionRequest(request); }
@@ -109,6 +113,7 @@ class EndedTooSoon final : public QXExtension {
 
  private:
   const std::shared_ptr<QXExtension> real_;
+  const std::shared_ptr<Mailbox<BegunRequest>> begun_;
 };
 
 class ProvidersOverProcesses : public testing::Test {
@@ -180,8 +185,14 @@ TEST_F(ProvidersOverProcesses, ARequestThatCannotBeginIsHandedTheHostsErrorOnce)
 
 TEST_F(ProvidersOverProcesses, ARequestWhoseProcessIsGoneBeforeItsContextIsAskedForIsHandedAMissingProxy) {
   begin();
-  const auto one = DVExtensionDocuvend::initWithExtension(std::make_shared<EndedTooSoon>(real->extension(kBad)));
-  perform(one);
+  const auto extension = real->extension(kBad);
+  const auto begun = std::make_shared<Mailbox<BegunRequest>>();
+  perform(DVExtensionDocuvend::initWithExtension(std::make_shared<ToldLater>(extension, begun)));
+  const auto one = begun->take();
+  ASSERT_TRUE(one && one->request);
+  (void)await(linux_platform::Conversation(extension).start("crash"));
+  ASSERT_TRUE(soon([&extension, &one] { return extension->extensionContextForRequest(*one->request) == nullptr; }));
+  one->tell();
   const auto given = handed.take();
   ASSERT_TRUE(given && given->error);
   EXPECT_EQ(given->error->domain, kDVErrorDomain);

@@ -52,6 +52,7 @@ TEST(LinuxQueues, AsynchronousReadersOfAConcurrentQueueOverlap) {
 // Also when it is run by a thread that is at work for somebody else, and waits for its turn meanwhile.
 TEST(LinuxQueues, ATaskIsForWhomItsSubmitterWasAtWork) {
   Arrivals arrivals;
+  Arrivals others;
   const auto tell = [&arrivals] {
     const auto subject = LogSubject::current();
     arrivals.arrive(subject ? *subject : "nobody in particular");
@@ -72,7 +73,6 @@ TEST(LinuxQueues, ATaskIsForWhomItsSubmitterWasAtWork) {
   EXPECT_THAT(arrivals.names(), testing::Each("one"));
 
   const auto other = queues.serialQueue("other");
-  Arrivals others;
   other->suspend();
   for (int i = 0; i < 2; ++i) {
     other->async([&others] {
@@ -290,12 +290,8 @@ TEST(LinuxQueues, ThePoolGrowsWhileItsThreadsAreBlockedInSync) {
 TEST(LinuxQueues, WaitsThroughSeveralQueuesNeverStarve) {
   constexpr std::size_t kTasks = 600;
   Arrivals finished;
-  LinuxQueues queues({2, 2});
   std::vector<std::shared_ptr<QXQueue>> chain;
-  for (int i = 0; i < 5; ++i) {
-    chain.push_back(i % 2 == 0 ? queues.serialQueue("serial") : queues.concurrentQueue("concurrent"));
-  }
-  std::function<void(std::size_t, std::size_t)> descend = [&](std::size_t level, std::size_t seed) {
+  const std::function<void(std::size_t, std::size_t)> descend = [&](std::size_t level, std::size_t seed) {
     if (level == chain.size()) {
       finished.arrive("");
       return;
@@ -304,6 +300,10 @@ TEST(LinuxQueues, WaitsThroughSeveralQueuesNeverStarve) {
     if (seed % 3 == level % 3) chain[level]->barrierAsync([] {});
     chain[level]->sync([&descend, level, seed] { descend(level + 1, seed); });
   };
+  LinuxQueues queues({2, 2});  // ends the tasks before that which they use goes
+  for (int i = 0; i < 5; ++i) {
+    chain.push_back(i % 2 == 0 ? queues.serialQueue("serial") : queues.concurrentQueue("concurrent"));
+  }
   for (std::size_t i = 0; i < kTasks; ++i) {
     switch (i % 3) {
       case 0:
@@ -438,6 +438,7 @@ TEST(LinuxQueues, SuspendHoldsBackATaskThatWasLetInButNotBegun) {
   Arrivals running;
   Arrivals released;
   Arrivals arrivals;
+  Arrivals passed;
   LinuxQueues queues({1, 1});
   const auto queue = queues.serialQueue("serial");
   queues.globalQueue().async([&] {
@@ -448,7 +449,6 @@ TEST(LinuxQueues, SuspendHoldsBackATaskThatWasLetInButNotBegun) {
   queue->async([&] { arrivals.arrive("held back"); });
   queue->suspend();
   released.arrive("");
-  Arrivals passed;
   queues.globalQueue().async([&] { passed.arrive(""); });  // runs after the pool came by for the queue
   ASSERT_TRUE(passed.waitFor(1));
   EXPECT_THAT(arrivals.names(), IsEmpty());
