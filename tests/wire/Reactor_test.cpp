@@ -59,6 +59,7 @@ TEST_P(ReactorTest, AHandlerRunsForEachReadinessItAsksFor) {
 TEST_P(ReactorTest, AHandlerThatAsksForNothingRunsAgainAfterRearm) {
   auto [one, two] = socketPair();
   Mailbox<int> runs;
+  Mailbox<int> posted;
   Reactor reactor(2, GetParam());
   const auto registration = reactor.watch(two.get(), EPOLLIN, [&runs](std::uint32_t) -> std::uint32_t {
     runs.put(1);
@@ -66,7 +67,6 @@ TEST_P(ReactorTest, AHandlerThatAsksForNothingRunsAgainAfterRearm) {
   });
   writeByte(one.get());
   ASSERT_TRUE(runs.take());
-  Mailbox<int> posted;
   reactor.post([&posted] { posted.put(1); });
   ASSERT_TRUE(posted.take());
   EXPECT_EQ(runs.count(), 0U) << "the byte is still there, but nobody waits for it";
@@ -154,9 +154,9 @@ TEST_P(ReactorTest, ADroppedRegistrationLetsItsHandlerGo) {
 TEST_P(ReactorTest, AHandlerMayDropItsOwnRegistration) {
   auto [one, two] = socketPair();
   Mailbox<int> runs;
+  Mailbox<int> set;
   Reactor reactor(2, GetParam());
   auto registration = std::make_shared<std::shared_ptr<Reactor::Registration>>();
-  Mailbox<int> set;
   *registration = reactor.watch(two.get(), EPOLLIN, [&, registration](std::uint32_t) -> std::uint32_t {
     set.take();
     registration->reset();
