@@ -82,9 +82,11 @@ TEST_F(ActivatedSocketsTest, WhatIsNoListeningStreamSocketIsClosedWithOneLine) {
   const auto sockets = takeActivatedSockets(log.defaultLog());
   ASSERT_EQ(sockets.size(), 1U);
   EXPECT_EQ(sockets[0].name, "d");
-  EXPECT_THAT(log.texts(), testing::ElementsAre("[NOTICE] Ignoring the passed descriptor 3: it is no listening Unix stream socket.",
-                                                "[NOTICE] Ignoring the passed descriptor 4: it is no listening Unix stream socket.",
-                                                "[NOTICE] Ignoring the passed descriptor 5: it is no listening Unix stream socket."));
+  const auto ignoring = [](int descriptor) {
+    return fake_platform::FakeLogEntry{QXLogType::defaultType, "[NOTICE] Ignoring the passed descriptor " + std::to_string(descriptor) +
+                                                                   ": it is no listening Unix stream socket."};
+  };
+  EXPECT_THAT(log.entries(), testing::ElementsAre(ignoring(3), ignoring(4), ignoring(5)));
   for (int i = 3; i < 6; ++i) EXPECT_LT(::fcntl(i, F_GETFD), 0) << i;
 }
 

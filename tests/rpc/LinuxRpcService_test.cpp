@@ -43,7 +43,7 @@ MATCHER_P(IsRpcError, value, "") {
 class StandardErrorLog final : public QXLogHandle {
  public:
   [[nodiscard]] bool isEnabled(QXLogType) const override { return true; }
-  void write(QXLogType, const std::string& message) override { std::cerr << message << std::endl; }
+  void write(QXLogType type, const std::string& message) override { std::cerr << static_cast<int>(type) << message << std::endl; }
 };
 
 // Tells for whom each line is written.
@@ -107,6 +107,7 @@ class LinuxRpcServiceTest : public testing::Test {
     });
     return answered.take() == true;
   }
+  static fake_platform::FakeLogEntry notice(const std::string& text) { return {QXLogType::defaultType, "[NOTICE] " + text}; }
   RawPeer connectRaw() const { return RawPeer(std::get<UniqueDescriptor>(connectToSocket(driver.socketPath))); }
 
   std::shared_ptr<Delegate> delegate = std::make_shared<Delegate>();
@@ -151,7 +152,13 @@ TEST_F(LinuxRpcServiceTest, AnotherListenersSocketIsLeftToItWhenThisOneGoes) {
 
 struct Publishing {
   int status = -1;     // as from waitpid
-  std::string output;  // what the process wrote to standard error
+  std::string output;  // what the process wrote to standard error: the number of a message's type, the message, a line end
+
+  [[nodiscard]] fake_platform::FakeLogEntry message() const {
+    const std::size_t end = output.find('\n');
+    if (output.empty() || end == std::string::npos) return {};
+    return {static_cast<QXLogType>(output.front() - '0'), output.substr(1, end - 1), /*isWritten=*/true};
+  }
 };
 
 // What becomes of a process that publishes `name` while `path` is the service's. Forked: no other thread may be running.
@@ -196,7 +203,11 @@ TEST(LinuxRpcServicePublishingTest, ANameThatCannotBePublishedEndsTheProcess) {
   EXPECT_EQ(publish(path, kServiceName).status, 0);
   std::filesystem::remove(path);
 
-  EXPECT_THAT(publish(path, "com.example.Other"), EndedWith("no socket is known for it"));
+  const Publishing unknown = publish(path, "com.example.Other");
+  EXPECT_THAT(unknown, EndedWith("no socket is known for it"));
+  EXPECT_EQ(unknown.message(),
+            (fake_platform::FakeLogEntry{QXLogType::fault, "[ERROR] Cannot publish the service com.example.Other: " +
+                                                               QXError::system(ENOENT, "no socket is known for it").description()}));
   EXPECT_THAT(publish(directory.path() + "/missing/socket", kServiceName), EndedWith("cannot open"));
   std::ofstream(path) << "a file";
   EXPECT_THAT(publish(path, kServiceName), EndedWith("is not a socket"));
@@ -251,10 +262,10 @@ TEST_F(LinuxRpcServiceTest, AMalformedFrameClosesThatConnectionWithOneLogLineAnd
   ASSERT_TRUE(raw.read<EndFrame>());
   EXPECT_TRUE(raw.atEnd());
   EXPECT_TRUE(roundTrip(driver.connect()));
-  const std::string line = "[NOTICE] Closing the connection of PID " + std::to_string(::getpid()) + ": a frame of unknown type 99";
+  const auto line = notice("Closing the connection of PID " + std::to_string(::getpid()) + ": a frame of unknown type 99");
   // The line is written by another thread than the one that closes the socket.
   for (int i = 0; i < 1000 && driver.log.texts().empty(); ++i) EXPECT_TRUE(roundTrip(driver.connect()));
-  EXPECT_THAT(driver.log.texts(QXLogType::defaultType), testing::ElementsAre(line));
+  EXPECT_THAT(driver.log.entries(), testing::ElementsAre(line));
 }
 
 TEST_F(LinuxRpcServiceTest, LinesAboutAPeerAreOnItsOwnAccountUnlessItIsTrusted) {
@@ -325,9 +336,9 @@ TEST_F(LinuxRpcServiceTest, AllWithoutAnIdentityHaveFewConnectionsTogetherAndTak
   }
   const auto refused = driver.connect({}, [this](const QXError& reason) { closed.put(reason); });
   EXPECT_THAT(closed.take(), IsRpcError(QXRpcErrorCode::refused));
-  EXPECT_THAT(driver.log.texts(), testing::ElementsAre("[NOTICE] Refusing a connection of PID " + std::to_string(::getpid()) +
-                                                       ": processes without an identity may not open more than " +
-                                                       std::to_string(kMaximumConnectionsOfNobody) + "."));
+  EXPECT_THAT(driver.log.entries(), testing::ElementsAre(notice("Refusing a connection of PID " + std::to_string(::getpid()) +
+                                                                ": processes without an identity may not open more than " +
+                                                                std::to_string(kMaximumConnectionsOfNobody) + ".")));
   driver.peers.setNextPeer(Standing::confined, "com.example.App", {});
   EXPECT_TRUE(roundTrip(driver.connect()));
 }
@@ -372,9 +383,9 @@ TEST_F(LinuxRpcServiceTest, OnePeersConnectionsAreLimitedAndOthersAreServed) {
     const auto refused = driver.connect({}, [this](const QXError& reason) { closed.put(reason); });
     EXPECT_THAT(closed.take(), IsRpcError(QXRpcErrorCode::refused));
   }
-  EXPECT_THAT(driver.log.texts(),
-              testing::ElementsAre("[NOTICE] Refusing a connection of PID " + std::to_string(::getpid()) +
-                                   ": com.example.App may not open more than " + std::to_string(kMaximumConnectionsPerPeer) + "."));
+  EXPECT_THAT(driver.log.entries(),
+              testing::ElementsAre(notice("Refusing a connection of PID " + std::to_string(::getpid()) +
+                                          ": com.example.App may not open more than " + std::to_string(kMaximumConnectionsPerPeer) + ".")));
   driver.peers.setNextPeer(Standing::confined, "com.example.Other", {});
   EXPECT_TRUE(roundTrip(driver.connect()));
   driver.peers.setNextPeer(Standing::confined, "com.example.App", {});
@@ -513,7 +524,7 @@ TEST_F(LinuxRpcServiceTest, WithoutFreeDescriptorsAClientIsDroppedAndTheServiceG
   const bool dropped = connected && raw.atEnd();
   ASSERT_EQ(::setrlimit(RLIMIT_NOFILE, &old), 0);
   EXPECT_TRUE(dropped);
-  EXPECT_THAT(driver.log.texts(), testing::ElementsAre(testing::StartsWith("[NOTICE] Refusing connections: cannot accept")));
+  EXPECT_THAT(driver.log.entries(), testing::ElementsAre(notice("Refusing connections: cannot accept: Too many open files")));
   EXPECT_TRUE(roundTrip(served));
   EXPECT_TRUE(roundTrip(driver.connect()));
 }
@@ -540,6 +551,21 @@ TEST_F(LinuxRpcServiceTest, APassedSocketServesItsName) {
   }
 }
 
+TEST_F(LinuxRpcServiceTest, APassedSocketThatSomebodyHasClosedIsToldOfInTheLog) {
+  UniqueDescriptor passed(::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0));
+  const int number = passed.get();
+  std::vector<ActivatedSocket> sockets;
+  sockets.push_back({kServiceName, "", std::move(passed)});
+  LinuxRpcService service(driver.reactor, driver.peers, driver.log.defaultLog(), {{kServiceName, {driver.socketPath}}}, std::move(sockets));
+  listener = service.listenerForService(kServiceName);
+  ASSERT_EQ(::close(number), 0);
+  listener->resume();
+  EXPECT_THAT(driver.log.entries(),
+              testing::ElementsAre(fake_platform::FakeLogEntry{QXLogType::fault, "[ERROR] A listener's socket cannot be watched."}));
+  ASSERT_EQ(::dup2(STDERR_FILENO, number), number);  // for the listener to close
+  listener.reset();
+}
+
 TEST_F(LinuxRpcServiceTest, UnconfinedProcessesHaveALimitOfTheirOwn) {
   rlimit descriptors{};
   ASSERT_EQ(::getrlimit(RLIMIT_NOFILE, &descriptors), 0);
@@ -553,9 +579,9 @@ TEST_F(LinuxRpcServiceTest, UnconfinedProcessesHaveALimitOfTheirOwn) {
   ASSERT_TRUE(roundTrip(clients.back()));
   const auto refused = driver.connect({}, [this](const QXError& reason) { closed.put(reason); });
   EXPECT_THAT(closed.take(), IsRpcError(QXRpcErrorCode::refused));
-  EXPECT_THAT(driver.log.texts(),
-              testing::ElementsAre("[NOTICE] Refusing a connection of PID " + std::to_string(::getpid()) +
-                                   ": unconfined processes may not open more than " + std::to_string(kMaximumUnconfinedConnections) + "."));
+  EXPECT_THAT(driver.log.entries(), testing::ElementsAre(notice("Refusing a connection of PID " + std::to_string(::getpid()) +
+                                                                ": unconfined processes may not open more than " +
+                                                                std::to_string(kMaximumUnconfinedConnections) + ".")));
   driver.peers.setNextPeer(Standing::nobody, std::nullopt, {});
   EXPECT_TRUE(roundTrip(driver.connect())) << "others are counted by themselves";
 }
@@ -576,8 +602,8 @@ class UnconfinedServiceTest : public LinuxRpcServiceTest {
     const auto client = driver.connect({}, [this](const QXError& reason) { closed.put(reason); });
     return closed.take();
   }
-  static std::string line(const std::string& peer) {
-    return "[NOTICE] Refusing a connection of PID " + std::to_string(::getpid()) + ": com.example.Service is not for " + peer + ".";
+  static fake_platform::FakeLogEntry line(const std::string& peer) {
+    return notice("Refusing a connection of PID " + std::to_string(::getpid()) + ": com.example.Service is not for " + peer + ".");
   }
 
   std::optional<LinuxRpcService> service;
@@ -607,7 +633,7 @@ TEST_F(UnconfinedServiceTest, AConfinedPeerIsRefusedWithAReasonAndNoDelegateHear
   const auto reason = refusal();
   ASSERT_THAT(reason, IsRpcError(QXRpcErrorCode::refused));
   EXPECT_EQ(reason->texts.at("description"), "com.example.Service is for unconfined processes alone");
-  EXPECT_THAT(driver.log.entries(), testing::ElementsAre(fake_platform::FakeLogEntry{QXLogType::defaultType, line("com.example.App")}));
+  EXPECT_THAT(driver.log.entries(), testing::ElementsAre(line("com.example.App")));
   driver.peers.setNextPeer(Standing::unconfined, std::nullopt, {});
   EXPECT_TRUE(roundTrip(driver.connect()));
   EXPECT_TRUE(delegate->connections.take());
@@ -629,7 +655,7 @@ TEST_F(UnconfinedServiceTest, NobodyIsRefused) {
   driver.peers.setNextPeer(Standing::nobody, std::nullopt, {});
   serveUnconfined();
   EXPECT_THAT(refusal(), IsRpcError(QXRpcErrorCode::refused));
-  EXPECT_THAT(driver.log.texts(), testing::ElementsAre(line("processes without an identity")));
+  EXPECT_THAT(driver.log.entries(), testing::ElementsAre(line("processes without an identity")));
 }
 
 TEST_F(UnconfinedServiceTest, ADeclarationIsNoWayInForAConfinedPeer) {
@@ -649,7 +675,7 @@ TEST_F(UnconfinedServiceTest, AFloodOfRefusalsIsOneLineForEachPeerAndTakesNobody
   EXPECT_EQ(service->connectionCount(), 0U);
   driver.peers.setNextPeer(Standing::confined, "com.example.Other", {});
   ASSERT_THAT(refusal(), IsRpcError(QXRpcErrorCode::refused));
-  EXPECT_THAT(driver.log.texts(), testing::ElementsAre(line("com.example.App"), line("com.example.Other")));
+  EXPECT_THAT(driver.log.entries(), testing::ElementsAre(line("com.example.App"), line("com.example.Other")));
   driver.peers.setNextPeer(Standing::unconfined, std::nullopt, {});
   const auto served = driver.connect();
   EXPECT_TRUE(roundTrip(served));
