@@ -8,8 +8,11 @@
 #include <chrono>
 #include <csignal>
 #include <cstdlib>
+#include <map>
+#include <regex>
 #include <string>
 
+#include "platform/fake/FakeLog.h"
 #include "platform/linux/base/LogSubject.h"
 #include "platform/linux/log/LogAllowance.h"
 #include "platform/linux/log/LogText.h"
@@ -18,6 +21,7 @@
 namespace docuvend::linux_platform {
 namespace {
 
+using fake_platform::FakeLogEntry;
 using testing::ElementsAre;
 using testing::IsEmpty;
 
@@ -29,6 +33,19 @@ class LinuxLogTest : public testing::Test {
     options.streamDescriptor = stream.writeEnd.get();
     options.journalSocketPath = journal.path();
     return options;
+  }
+  // What the journal was given since the last call.
+  [[nodiscard]] std::vector<FakeLogEntry> journalEntries() const {
+    static const std::map<std::string, QXLogType> kTypes = {
+        {"2", QXLogType::fault}, {"5", QXLogType::defaultType}, {"6", QXLogType::info}, {"7", QXLogType::debug}};
+    static const std::regex kEntry("PRIORITY=(.)\nSYSLOG_IDENTIFIER=docuvendd\nMESSAGE=([^\n]*)\n");
+    std::vector<FakeLogEntry> entries;
+    for (const std::string& datagram : journal.read()) {
+      std::smatch parts;
+      EXPECT_TRUE(std::regex_match(datagram, parts, kEntry)) << datagram;
+      entries.push_back({kTypes.at(parts[1]), parts[2], /*isWritten=*/true});
+    }
+    return entries;
   }
   static std::string line(const std::string& text) { return "docuvendd[" + std::to_string(::getpid()) + "]: " + text + "\n"; }
 
@@ -181,6 +198,32 @@ TEST_F(LinuxLogTest, ASubjectsLinesThatAreAlwaysOnAreNoMoreThanItsAllowanceAndAl
   EXPECT_LE(written("limited"), LogAllowance::kLinesAtOnce + back);
   EXPECT_EQ(written("asked for"), 2 * kMany);
   EXPECT_EQ(written("the system's own"), kMany);
+}
+
+TEST_F(LinuxLogTest, WhatWasLeftOutIsToldWhenItIsDue) {
+  LogAllowance::Time now = std::chrono::steady_clock::now();
+  LinuxLogOptions some = options();
+  some.journalStream = stream.deviceAndInode();
+  some.now = [&now] { return now; };
+  LinuxLog log(some);
+  {
+    const LogSubject subject(std::make_shared<const std::string>("com.example.App"));
+    for (std::size_t i = 0; i < LogAllowance::kLinesAtOnce + 3; ++i) {
+      log.defaultLog().write(QXLogType::fault, "limited");
+      EXPECT_EQ(journal.read().size(), i < LogAllowance::kLinesAtOnce ? 1U : 0U);
+    }
+  }
+  const FakeLogEntry own{QXLogType::fault, "the system's own"};
+  now += LineAllowance::kTimeUntilCount - std::chrono::milliseconds(1);
+  log.defaultLog().write(own.type, own.text);
+  EXPECT_THAT(journalEntries(), ElementsAre(own)) << "not yet";
+  now += std::chrono::milliseconds(1);
+  log.defaultLog().write(own.type, own.text);
+  EXPECT_THAT(journalEntries(),
+              ElementsAre(FakeLogEntry{QXLogType::defaultType, "[NOTICE] 3 lines about com.example.App were left out."}, own));
+  now += 2 * LineAllowance::kTimeUntilCount;
+  log.defaultLog().write(own.type, own.text);
+  EXPECT_THAT(journalEntries(), ElementsAre(own)) << "once";
 }
 
 // The datagrams lie there unread until no more fit.

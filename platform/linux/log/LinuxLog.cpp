@@ -51,6 +51,7 @@ LinuxLog::LinuxLog(const LinuxLogOptions& options) : handle_(options) {}
 LinuxLog::Handle::Handle(const LinuxLogOptions& options)
     : isInfoEnabled_(options.setting == "info" || options.setting == "debug"),
       isDebugEnabled_(options.setting == "debug"),
+      now_(options.now),
       stream_(options.streamDescriptor, options.identifier) {
   if (leadsToTheJournal(options.streamDescriptor, options.journalStream)) {
     journal_.emplace(options.journalSocketPath, options.identifier);
@@ -71,11 +72,11 @@ bool LinuxLog::Handle::isEnabled(QXLogType type) const {
 }
 
 void LinuxLog::Handle::write(QXLogType type, const std::string& message) {
-  if (isEnabled(type) && isAllowed(type)) put(type, message);
+  if (isEnabled(type) && isAllowed(type)) put({type, message});
 }
 
 bool LinuxLog::Handle::isAllowed(QXLogType type) {
-  const auto now = std::chrono::steady_clock::now();
+  const auto now = now_();
   const auto subject = type == QXLogType::defaultType || type == QXLogType::fault ? LogSubject::current() : nullptr;
   std::vector<LogAllowance::LeftOut> counts;
   bool allowed = true;
@@ -84,15 +85,13 @@ bool LinuxLog::Handle::isAllowed(QXLogType type) {
     counts = allowance_.dueCounts(now);
     allowed = !subject || allowance_.line(*subject, now);
   }
-  for (const auto& [name, lines] : counts) {
-    put(QXLogType::defaultType, "[NOTICE] " + std::to_string(lines) + " lines about " + name + " were left out.");
-  }
+  for (const auto& [name, lines] : counts) put(qxLogMessage("[NOTICE] %d lines about %@ were left out.", lines, name));
   return allowed;
 }
 
-void LinuxLog::Handle::put(QXLogType type, const std::string& message) {
-  const std::string text = visibleLogText(message);
-  if (journal_ && journal_->write(type, text) == LogWritten::yes) return;
+void LinuxLog::Handle::put(const QXLogMessage& message) {
+  const std::string text = visibleLogText(message.text);
+  if (journal_ && journal_->write(message.type, text) == LogWritten::yes) return;
   stream_.write(text);
 }
 

@@ -5,10 +5,13 @@
 // on the others wants all of them.
 #pragma once
 
+#include <chrono>
+#include <functional>
 #include <mutex>
 #include <optional>
 #include <string>
 
+#include "platform/QXLogMessage.h"
 #include "platform/linux/log/LogAllowance.h"
 #include "platform/linux/log/LogSink.h"
 #include "platform/log.h"
@@ -20,7 +23,8 @@ struct LinuxLogOptions {
   std::optional<std::string> setting;        // DOCUVEND_LOG
   std::optional<std::string> journalStream;  // JOURNAL_STREAM, "device:inode" of the stream that leads to the journal
   std::string journalSocketPath = "/run/systemd/journal/socket";
-  int streamDescriptor = 2;  // outlives the log
+  int streamDescriptor = 2;                                                   // outlives the log
+  std::function<LogAllowance::Time()> now = &std::chrono::steady_clock::now;  // may be asked from any thread
 
   [[nodiscard]] static LinuxLogOptions fromEnvironment(std::string identifier);
 };
@@ -42,10 +46,11 @@ class LinuxLog final : public QXLogService {
    private:
     // Whether a line that this thread writes is within what is allowed; tells what was left out before.
     [[nodiscard]] bool isAllowed(QXLogType type);
-    void put(QXLogType type, const std::string& message);
+    void put(const QXLogMessage& message);
 
     const bool isInfoEnabled_;
     const bool isDebugEnabled_;
+    const std::function<LogAllowance::Time()> now_;
     const StreamLogSink stream_;
     std::optional<JournalLogSink> journal_;
 
