@@ -19,6 +19,7 @@ class BundleScanTest : public ::testing::Test {
  protected:
   [[nodiscard]] std::string system(const std::string& name) const { return house_.paths.systemBundles + "/" + name; }
   [[nodiscard]] std::string user(const std::string& name) const { return house_.paths.userBundles + "/" + name; }
+  static fake_platform::FakeLogEntry fault(const std::string& text) { return {QXLogType::fault, text}; }
 
   BundleHouse house_;
 };
@@ -44,8 +45,8 @@ TEST_F(BundleScanTest, PrefersTheSystemsAndSaysSoOnce) {
   BundleHouse::install(system("one"), "org.one");
   BundleHouse::install(user("one"), "org.one");
   EXPECT_EQ(house_.scan().at("org.one").directory, system("one"));
-  EXPECT_THAT(house_.log.texts(),
-              ElementsAre("[ERROR] Ignoring the bundle at " + user("one") + ": " + system("one") + " has the same identifier."));
+  EXPECT_THAT(house_.log.entries(),
+              ElementsAre(fault("[ERROR] Ignoring the bundle at " + user("one") + ": " + system("one") + " has the same identifier.")));
 }
 
 TEST_F(BundleScanTest, PassesOverHalfCopiedBundles) {
@@ -59,8 +60,7 @@ TEST_F(BundleScanTest, ABadBundleIsOneLineAndHarmsNoOther) {
   BundleHouse::install(user("good"), "org.good");
   std::filesystem::create_directories(user("bad"));
   EXPECT_TRUE(house_.scan().contains("org.good"));
-  EXPECT_THAT(house_.log.entries(), ElementsAre(fake_platform::FakeLogEntry{
-                                        QXLogType::fault, "[ERROR] Ignoring the bundle at " + user("bad") + ": has no Info.plist."}));
+  EXPECT_THAT(house_.log.entries(), ElementsAre(fault("[ERROR] Ignoring the bundle at " + user("bad") + ": has no Info.plist.")));
 }
 
 TEST_F(BundleScanTest, ALinkIsNoBundle) {
@@ -68,7 +68,7 @@ TEST_F(BundleScanTest, ALinkIsNoBundle) {
   std::filesystem::create_directories(house_.paths.userBundles);
   std::filesystem::create_symlink(house_.root() + "/elsewhere", user("link"));
   EXPECT_THAT(house_.scan(), IsEmpty());
-  EXPECT_THAT(house_.log.texts(), ElementsAre("[ERROR] Ignoring the bundle at " + user("link") + ": it is a link."));
+  EXPECT_THAT(house_.log.entries(), ElementsAre(fault("[ERROR] Ignoring the bundle at " + user("link") + ": it is a link.")));
 }
 
 TEST_F(BundleScanTest, SaysTheSameAgainOnlyAfterItWasMended) {
@@ -137,8 +137,8 @@ TEST_F(BundleScanTest, GivesGroupContainersToMembersAlone) {
   EXPECT_THAT(bundles.at("org.owner").groups, ElementsAre(Pair("org.owner.docs", container)));
   EXPECT_THAT(bundles.at("org.member").groups, ElementsAre(Pair("org.owner.docs", container)));
   EXPECT_THAT(bundles.at("org.stranger").groups, IsEmpty());
-  EXPECT_THAT(house_.log.texts(),
-              ElementsAre("[ERROR] The bundle org.stranger may not belong to the group org.owner.docs, which is org.owner's."));
+  EXPECT_THAT(house_.log.entries(),
+              ElementsAre(fault("[ERROR] The bundle org.stranger may not belong to the group org.owner.docs, which is org.owner's.")));
 }
 
 // Whoever is there first, and whoever stays: the one that was there first may have named the owner as a member.
@@ -152,9 +152,9 @@ TEST_F(BundleScanTest, AGroupIsItsOwnersInWhateverOrderBundlesAreInstalled) {
     const auto bundles = house_.scan();
     EXPECT_THAT(bundles.at("org.owner").groups, IsEmpty());
     EXPECT_THAT(bundles.at(group).groups, IsEmpty());
-    EXPECT_THAT(house_.log.texts(), UnorderedElementsAre("[ERROR] The bundle org.owner may not belong to" + whose,
-                                                         "[ERROR] The bundle " + group + " may not belong to" + whose,
-                                                         "[ERROR] The bundle org.owner may not name members of" + whose));
+    EXPECT_THAT(house_.log.entries(), UnorderedElementsAre(fault("[ERROR] The bundle org.owner may not belong to" + whose),
+                                                           fault("[ERROR] The bundle " + group + " may not belong to" + whose),
+                                                           fault("[ERROR] The bundle org.owner may not name members of" + whose)));
     house_.log.clear();
   };
   BundleHouse::install(system("shorter"), "org.owner", docs + list);
@@ -176,8 +176,8 @@ TEST_F(BundleScanTest, AWordAboutTheMembersOfAnothersGroupIsOneLineAndWorthNothi
       user("thief"), "org.thief",
       BundleHouse::entry("QXGroupMembers", "<dict><key>org.owner.docs</key>" + BundleHouse::array({"org.thief"}) + "</dict>"));
   EXPECT_EQ(house_.scan().at("org.owner").groups.size(), 1U);
-  EXPECT_THAT(house_.log.texts(),
-              ElementsAre("[ERROR] The bundle org.thief may not name members of the group org.owner.docs, which is org.owner's."));
+  EXPECT_THAT(house_.log.entries(),
+              ElementsAre(fault("[ERROR] The bundle org.thief may not name members of the group org.owner.docs, which is org.owner's.")));
 }
 
 TEST_F(BundleScanTest, WhatOthersCanWriteIsNoBundle) {
@@ -209,7 +209,7 @@ TEST_F(BundleScanTest, WhatOthersCanWriteIsNoBundle) {
       house_.log.clear();
       fs::permissions(path, others, fs::perm_options::add);
       EXPECT_EQ(house_.scan().size(), left) << path;
-      EXPECT_THAT(house_.log.texts(), ElementsAre(line));
+      EXPECT_THAT(house_.log.entries(), ElementsAre(fault(line)));
       fs::permissions(path, others, fs::perm_options::remove);
     }
   }

@@ -327,13 +327,14 @@ TEST_F(InstalledBundlesTest, NoticesThatItsDirectoryIsReplaced) {
 class InstalledBundlesWithoutWatches : public InstalledBundlesTest,
                                        public ::testing::WithParamInterface<std::atomic<bool> InterposedWatches::*> {
  protected:
-  [[nodiscard]] long logged(const std::string& beginning) const {
-    const auto texts = house_.log.texts();
-    return std::count_if(texts.begin(), texts.end(), [&beginning](const std::string& text) { return text.starts_with(beginning); });
+  [[nodiscard]] long logged(const fake_platform::FakeLogEntry& entry) const {
+    const auto entries = house_.log.entries();
+    return std::count(entries.begin(), entries.end(), entry);
   }
 
-  const std::string begins_ = "[ERROR] Not every bundle directory can be watched";
-  const std::string ends_ = "[NOTICE] Every bundle directory is watched again.";
+  const fake_platform::FakeLogEntry begins_{QXLogType::fault,
+                                            "[ERROR] Not every bundle directory can be watched, so they are looked at every 3 seconds."};
+  const fake_platform::FakeLogEntry ends_{QXLogType::defaultType, "[NOTICE] Every bundle directory is watched again."};
 };
 
 TEST_P(InstalledBundlesWithoutWatches, LooksNowAndThenAndSaysSoOnceUntilTheyAreBack) {
