@@ -11,7 +11,10 @@
 
 #include <array>
 #include <atomic>
+#include <functional>
 #include <future>
+#include <memory>
+#include <utility>
 #include <vector>
 
 #include "platform/fake/FakeLog.h"
@@ -25,6 +28,7 @@
 namespace docuvend::linux_platform {
 namespace {
 
+using fake_platform::FakeLogEntry;
 using std::chrono::milliseconds;
 using tests::Mailbox;
 using tests::RawPeer;
@@ -196,6 +200,42 @@ TEST_F(ExtensionProcessTest, OneThatOwesAnAnswerIsAskedUntilItHasGivenIt) {
   EXPECT_EQ(looks.count(), 0U);
 }
 
+// An error handler that lets the test act whenever it is copied, as it is when a message is sent whose answer has a limit.
+class ToldWhenCopied {
+ public:
+  explicit ToldWhenCopied(std::shared_ptr<std::function<void()>> act) : act_(std::move(act)) {}
+  ToldWhenCopied(const ToldWhenCopied& other) : act_(other.act_) {
+    if (*act_) (*act_)();
+  }
+  ToldWhenCopied& operator=(const ToldWhenCopied&) = delete;
+  ~ToldWhenCopied() = default;
+
+  void operator()(const QXError&) const {}
+
+ private:
+  const std::shared_ptr<std::function<void()>> act_;
+};
+
+TEST_F(ExtensionProcessTest, OneThatIsSentAMessageIsAskedHoweverLongTheSendingTakes) {
+  start(times(kLong, kOne));
+  const auto whenCopied = std::make_shared<std::function<void()>>();
+  const auto proxy = process->remoteObjectProxy(ToldWhenCopied(whenCopied));
+  int copies = 0;
+  *whenCopied = [this, &copies] {
+    ++copies;
+    waitForATimer();
+  };
+  const QXRpcInterface vendor = qxInterfaceOf<_QXDocuvendVendor>();
+  const auto& operation = vendor.operations()[vendor.indexOf("_identifierForItemAtURL:completion:").value()];
+  proxy->send(operation, {QXURL::fileURL("/item", QXURLKind::file)}, [](const QXArray&) {});
+  *whenCopied = {};
+  ASSERT_GT(copies, 0) << "there was no time for a look in the middle";
+  ASSERT_TRUE(peer->read<RequestFrame>());
+  pollfd ready{peer->socket(), POLLIN, 0};
+  ASSERT_EQ(poll(&ready, 1, static_cast<int>(milliseconds(tests::kPatience).count())), 1);
+  EXPECT_TRUE(peer->read<PingFrame>());
+}
+
 TEST_F(ExtensionProcessTest, NoSecondSignIsAskedForWhileTheFirstIsAwaited) {
   hasRequests = true;
   start(times(kLong, kOne));
@@ -217,8 +257,21 @@ TEST_F(ExtensionProcessTest, WithoutASignInTimeItIsEndedAndItsMessagesFail) {
   EXPECT_EQ(error.domain, kExtensionHostErrorDomain);
   EXPECT_EQ(error.code, static_cast<std::int64_t>(ExtensionHostErrorCode::notAnswering));
   EXPECT_NE(error.description().find("The process of com.orvane.test did not answer a ping in time."), std::string::npos);
-  EXPECT_THAT(log.texts(), ::testing::Contains("[NOTICE] The process of com.orvane.test did not answer a ping in time."));
+  EXPECT_THAT(
+      log.entries(),
+      ::testing::ElementsAre(FakeLogEntry{QXLogType::defaultType, "[NOTICE] The process of com.orvane.test did not answer a ping in time."},
+                             FakeLogEntry{QXLogType::defaultType, "[NOTICE] The process of com.orvane.test was ended by signal 9."}));
   EXPECT_EQ(lost.count(), 0U);
+}
+
+TEST_F(ExtensionProcessTest, OneThatIsLetGoEndsWithLessToSayThanOneThatDies) {
+  ExtensionTimes impatient = times(kLong, kLong);
+  impatient.endGrace = kOne;
+  start(impatient);
+  process->end();
+  EXPECT_TRUE(gone.take());
+  EXPECT_THAT(log.entries(),
+              ::testing::ElementsAre(FakeLogEntry{QXLogType::info, "[INFO] The process of com.orvane.test was ended by signal 15."}));
 }
 
 TEST_F(ExtensionProcessTest, WhatApplicationsAskForLeavesRoomForNoticesAndTheSetup) {

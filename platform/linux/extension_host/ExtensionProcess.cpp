@@ -69,7 +69,6 @@ class ExtensionProcess::Proxy : public QXRpcProxy {
       plain_->send(operation, std::move(arguments), std::move(reply));
       return;
     }
-    process->watchLiveness();
     if (isQuestion(operation.name)) {
       std::shared_ptr<CallBudget::Share> share = process->questions_->take(/*bytes=*/0);
       if (!share) {
@@ -83,12 +82,18 @@ class ExtensionProcess::Proxy : public QXRpcProxy {
         reply(std::move(values));
       };
     }
-    const auto line = answerLineOf(operation.name);
-    if (!line) {
+    if (const auto line = answerLineOf(operation.name)) {
+      sendLimited(*process, *line, operation, std::move(arguments), std::move(reply));
+    } else {
       plain_->send(operation, std::move(arguments), std::move(reply));
-      return;
     }
-    const AnswerDeadlines::Message message = process->expectAnswer(*line, operation.name);
+    // Not before: a look that comes in between would find nothing to wait for, and be the last.
+    process->watchLiveness();
+  }
+
+ private:
+  void sendLimited(ExtensionProcess& process, AnswerLine line, const QXRpcOperation& operation, QXArray arguments, QXRpcReply reply) {
+    const AnswerDeadlines::Message message = process.expectAnswer(line, operation.name);
     const auto limited = endpoint_->remoteObjectProxy([weak = process_, message, errorHandler = errorHandler_](const QXError& error) {
       if (const auto strongProcess = weak.lock()) strongProcess->gotAnswer(message);
       if (errorHandler) errorHandler(error);
@@ -99,7 +104,6 @@ class ExtensionProcess::Proxy : public QXRpcProxy {
     });
   }
 
- private:
   std::weak_ptr<ExtensionProcess> process_;
   std::shared_ptr<Endpoint> endpoint_;
   QXErrorHandler errorHandler_;
