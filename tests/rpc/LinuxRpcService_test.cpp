@@ -756,10 +756,13 @@ class SlowRequestTest : public LinuxRpcServiceTest {
     EXPECT_TRUE(delegate->connections.take()) << "it is looked at before the next peer is another";
     return client;
   }
-  static void ping(const LinuxDriver::Client& client, Mailbox<bool>& answered) {
-    QXRemote<TestProtocol>(client.proxy([&answered](const QXError&) { answered.put(false); })).call<&TestProtocol::ping>([&answered] {
-      answered.put(true);
+  // What is returned hears whether it was answered or has failed, at the latest when the client goes.
+  [[nodiscard]] static std::shared_ptr<Mailbox<bool>> ping(const LinuxDriver::Client& client) {
+    auto answered = std::make_shared<Mailbox<bool>>();
+    QXRemote<TestProtocol>(client.proxy([answered](const QXError&) { answered->put(false); })).call<&TestProtocol::ping>([answered] {
+      answered->put(true);
     });
+    return answered;
   }
 
   const std::shared_ptr<SlowObject> slow = std::make_shared<SlowObject>();
@@ -767,44 +770,40 @@ class SlowRequestTest : public LinuxRpcServiceTest {
 
 TEST_F(SlowRequestTest, ARequestThatTakesLongHoldsUpNoOtherPeer) {
   serveSlowly();
-  Mailbox<bool> answered;
   const auto first = connectAs(Standing::confined, "com.example.Slow");
-  ping(first, answered);
+  const auto answered = ping(first);
   ASSERT_TRUE(slow->begun.take());
   EXPECT_TRUE(roundTrip(connectAs(Standing::confined, "com.example.Other")));
   EXPECT_TRUE(roundTrip(connectAs(Standing::unconfined, std::nullopt)));
   EXPECT_TRUE(roundTrip(connectAs(Standing::nobody, std::nullopt)));
-  EXPECT_EQ(answered.count(), 0U);
+  EXPECT_EQ(answered->count(), 0U);
   slow->mayEnd.put(true);
-  EXPECT_EQ(answered.take(), true);
+  EXPECT_EQ(answered->take(), true);
 }
 
 TEST_F(SlowRequestTest, UnconfinedProcessesDoNotHoldUpEachOther) {
   serveSlowly();
-  Mailbox<bool> answered;
   const auto first = connectAs(Standing::unconfined, std::nullopt);
-  ping(first, answered);
+  const auto answered = ping(first);
   ASSERT_TRUE(slow->begun.take());
   EXPECT_TRUE(roundTrip(connectAs(Standing::unconfined, std::nullopt)));
-  EXPECT_EQ(answered.count(), 0U);
+  EXPECT_EQ(answered->count(), 0U);
   slow->mayEnd.put(true);
-  EXPECT_EQ(answered.take(), true);
+  EXPECT_EQ(answered->take(), true);
 }
 
 TEST_F(SlowRequestTest, OfOneBundlesConnectionsOneIsServedAtATime) {
   serveSlowly();
-  Mailbox<bool> answered;
-  Mailbox<bool> answeredSecond;
   const auto first = connectAs(Standing::confined, "com.example.Slow");
-  ping(first, answered);
+  const auto answered = ping(first);
   ASSERT_TRUE(slow->begun.take());
   const auto second = connectAs(Standing::confined, "com.example.Slow");
-  ping(second, answeredSecond);
+  const auto answeredSecond = ping(second);
   for (int i = 0; i < 20; ++i) EXPECT_TRUE(roundTrip(connectAs(Standing::confined, "com.example.Other")));
-  EXPECT_EQ(answeredSecond.count(), 0U);
+  EXPECT_EQ(answeredSecond->count(), 0U);
   slow->mayEnd.put(true);
-  EXPECT_EQ(answered.take(), true);
-  EXPECT_EQ(answeredSecond.take(), true);
+  EXPECT_EQ(answered->take(), true);
+  EXPECT_EQ(answeredSecond->take(), true);
 }
 
 TEST_F(LinuxRpcServiceTest, TheListenersEndClosesItsConnections) {

@@ -44,10 +44,6 @@ QXError badToken() {
 
 class ConsumerCoordinationTest : public ConsumerTest {
  protected:
-  ~ConsumerCoordinationTest() override {
-    consumer_.reset();
-    stopServices();
-  }
   [[nodiscard]] static QXError noRoom() {
     return QXError::make(kQXRpcErrorDomain, static_cast<std::int64_t>(QXRpcErrorCode::tooManyCalls), "too much waits");
   }

@@ -193,8 +193,7 @@ TEST_F(ConsumerDocumentsTest, OpeningTellsWhatIsPresentOnTheCallingThreadUntilIt
   constexpr std::size_t kPresent = 4096;
   put("item", std::string(kPresent, 'x'));
   ASSERT_EQ(::truncate(path("item").c_str(), kSize), 0);
-  Mailbox<DVDaemon::ErrorReply> started;
-  script_.starting = [&started](DVDaemon::ErrorReply reply) { started.put(std::move(reply)); };
+  holdStarts();
   startServices();
   std::vector<Progress> told;
   const auto thread = std::this_thread::get_id();
@@ -203,7 +202,7 @@ TEST_F(ConsumerDocumentsTest, OpeningTellsWhatIsPresentOnTheCallingThreadUntilIt
     told.push_back(progress);
     if (told.size() < 2) return;
     // The provider is ready.
-    if (const auto reply = started.take()) (*reply)(std::nullopt);
+    if (const auto reply = started_.take()) (*reply)(std::nullopt);
   });
   EXPECT_EQ(errorIn(opened), std::nullopt);
   ASSERT_THAT(told, SizeIs(2));
@@ -214,13 +213,12 @@ TEST_F(ConsumerDocumentsTest, OpeningTellsWhatIsPresentOnTheCallingThreadUntilIt
 
 TEST_F(ConsumerDocumentsTest, NoMoreIsPresentThanTheFileIsLong) {
   put("item", "short");
-  Mailbox<DVDaemon::ErrorReply> started;
-  script_.starting = [&started](DVDaemon::ErrorReply reply) { started.put(std::move(reply)); };
+  holdStarts();
   startServices();
   std::optional<Progress> told;
   const auto opened = consumer().open(document(), kProvider, Access::read, [&](const Progress& progress) {
     told = progress;
-    if (const auto reply = started.take()) (*reply)(std::nullopt);
+    if (const auto reply = started_.take()) (*reply)(std::nullopt);
   });
   EXPECT_EQ(errorIn(opened), std::nullopt);
   ASSERT_TRUE(told);
@@ -229,11 +227,10 @@ TEST_F(ConsumerDocumentsTest, NoMoreIsPresentThanTheFileIsLong) {
 }
 
 TEST_F(ConsumerDocumentsTest, WhatCannotBeSeenIsNotTold) {
-  Mailbox<DVDaemon::ErrorReply> started;
-  script_.starting = [&started](DVDaemon::ErrorReply reply) { started.put(std::move(reply)); };
+  holdStarts();
   int looks = 0;
   script_.redeem = [&](const std::string&) -> std::variant<QXDescriptor, QXError> {
-    if (++looks == 2) (*started.take())(std::nullopt);
+    if (++looks == 2) (*started_.take())(std::nullopt);
     return sandboxError(SandboxErrorCode::gone);
   };
   startServices();
@@ -243,15 +240,14 @@ TEST_F(ConsumerDocumentsTest, WhatCannotBeSeenIsNotTold) {
 
 TEST_F(ConsumerDocumentsTest, ProvidingTellsWhatThisProcessSeesAtThePath) {
   put("letter.txt", "short");
-  Mailbox<DVDaemon::ErrorReply> started;
-  script_.starting = [&started](DVDaemon::ErrorReply reply) { started.put(std::move(reply)); };
+  holdStarts();
   startServices();
   std::vector<Progress> told;
   const QXURL url = QXURL::fileURL(path("letter.txt"), QXURLKind::file);
   EXPECT_EQ(consumer().startProviding(url, kProvider, kConsumer,
                                       [&](const Progress& progress) {
                                         told.push_back(progress);
-                                        if (const auto reply = started.take()) (*reply)(std::nullopt);
+                                        if (const auto reply = started_.take()) (*reply)(std::nullopt);
                                       }),
             std::nullopt);
   ASSERT_THAT(told, SizeIs(1));
@@ -392,6 +388,8 @@ class SaversTest : public ConsumerDocumentsTest {
     };
   }
   [[nodiscard]] Failure saveWithin(std::chrono::milliseconds deadline) { return consumer().within(deadline).replace(document(), writeNew); }
+
+  Mailbox<linux_platform::QXSandboxRedemption::ErrorReply> replaced_;
 };
 
 TEST_F(SaversTest, ItemAndSiblingAreLockedWhileOneIsWrittenAndTheOtherReplaced) {
@@ -479,13 +477,12 @@ TEST_F(SaversTest, ASiblingThatHasBecomeTheItemIsNotWritten) {
 }
 
 TEST_F(SaversTest, TheLocksAreHeldUntilItIsKnownWhetherTheSiblingHasTakenTheItemsPlace) {
-  Mailbox<linux_platform::QXSandboxRedemption::ErrorReply> replaced;
-  script_.replacing = [&replaced](linux_platform::QXSandboxRedemption::ErrorReply reply) { replaced.put(std::move(reply)); };
+  script_.replacing = [this](linux_platform::QXSandboxRedemption::ErrorReply reply) { replaced_.put(std::move(reply)); };
   startServices();
   EXPECT_EQ(errorIn(saveWithin(2s)), own(ConsumerErrorCode::deadlinePassed));
   EXPECT_TRUE(isLocked("item")) << "the daemon may rename at any moment";
   EXPECT_TRUE(isLocked("sibling"));
-  const auto late = replaced.take();
+  const auto late = replaced_.take();
   ASSERT_TRUE(late);
   (*late)(std::nullopt);
   eventually("the next saver may write", [this] { return !isLocked("item") && !isLocked("sibling"); });

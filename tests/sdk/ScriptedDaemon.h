@@ -312,9 +312,15 @@ class ConsumerTest : public LibraryTest {
     if (!consumer_) throw std::runtime_error(std::get<QXError>(connected).description());
     return *consumer_;
   }
-  // Wakings are put into `taken_` instead of being answered.
+  // Wakings are put into `taken_` instead of being answered, and so on.
   void holdWakings() {
     script_.waking = [this](DVDaemon::Done completion) { taken_.put(std::move(completion)); };
+  }
+  void holdStarts() {
+    script_.starting = [this](DVDaemon::ErrorReply reply) { started_.put(std::move(reply)); };
+  }
+  void holdStops() {
+    script_.stopping = [this](DVDaemon::ErrorReply reply) { stopped_.put(std::move(reply)); };
   }
   [[nodiscard]] Document document() const { return {*script_.url, script_.itemToken, script_.siblingURL, script_.siblingToken}; }
 
@@ -322,6 +328,8 @@ class ConsumerTest : public LibraryTest {
   Calls calls_;
   AccessNames names_;
   Mailbox<DVDaemon::Done> taken_;
+  Mailbox<DVDaemon::ErrorReply> started_;
+  Mailbox<DVDaemon::ErrorReply> stopped_;
   std::unique_ptr<ScriptedService<DVDaemon>> daemon_;
   std::unique_ptr<ScriptedService<linux_platform::QXSandboxRedemption>> sandbox_;
   std::unique_ptr<ScriptedService<linux_platform::QXFileCoordination>> coordination_;

@@ -54,6 +54,8 @@ class ServiceConnectionsTest : public ConsumerTest {
     startServices();
   }
   Failure stopProviding() { return consumer_->stopProviding(*script_.url, kProvider, kConsumer); }
+
+  Mailbox<QXSandboxRedemption::FileReply> redeemed_;
 };
 
 // Deadlines.
@@ -71,8 +73,7 @@ TEST_F(ServiceConnectionsTest, AnAnswerThatDoesNotComeIsTheDeadlinesErrorAndLate
 
 TEST_F(ServiceConnectionsTest, TheDeadlinesOfTheOptionsHoldForAnswersAndForMaterialising) {
   holdWakings();
-  Mailbox<DVDaemon::ErrorReply> started;
-  script_.starting = [&started](DVDaemon::ErrorReply reply) { started.put(std::move(reply)); };
+  holdStarts();
   startServices();
   Consumer::Options options;
   options.deadline = 1ms;
@@ -80,13 +81,12 @@ TEST_F(ServiceConnectionsTest, TheDeadlinesOfTheOptionsHoldForAnswersAndForMater
   Consumer& daemon = consumer(options);
   EXPECT_EQ(errorIn(daemon.wakeUp()), own(ConsumerErrorCode::deadlinePassed));
   auto answer = std::async(std::launch::async, [&daemon, this] { return daemon.startProviding(*script_.url, kProvider, kConsumer); });
-  const auto reply = started.take();
+  const auto reply = started_.take();
   ASSERT_TRUE(reply);
   EXPECT_EQ(errorIn(daemon.wakeUp()), own(ConsumerErrorCode::deadlinePassed)) << "that much time has passed for the other call, too";
   (*reply)(std::nullopt);
   EXPECT_EQ(answer.get(), std::nullopt);
   EXPECT_EQ(errorIn(daemon.within(1ms).startProviding(*script_.url, kProvider, kConsumer)), own(ConsumerErrorCode::deadlinePassed));
-  stopServices();
 }
 
 TEST_F(ServiceConnectionsTest, ADeadlineLongerThanTheClockReachesIsNoPastOne) {
@@ -97,9 +97,7 @@ TEST_F(ServiceConnectionsTest, ADeadlineLongerThanTheClockReachesIsNoPastOne) {
 TEST_F(ServiceConnectionsTest, TenThousandCallsWithoutAnswersLeaveNothingBehind) {
   startServices();
   ASSERT_EQ(consumer().wakeUp(), std::nullopt);
-  // Neither answered nor dropped.
-  Mailbox<DVDaemon::Done> held;
-  script_.waking = [&held](DVDaemon::Done completion) { held.put(std::move(completion)); };
+  holdWakings();  // neither answered nor dropped
   constexpr int kCalls = 10'000;
   constexpr std::size_t kFewAtATime = 256;
   const std::size_t descriptors = openDescriptors();
@@ -116,16 +114,14 @@ TEST_F(ServiceConnectionsTest, TenThousandCallsWithoutAnswersLeaveNothingBehind)
     EXPECT_EQ(errorIn(services.ask<&DVDaemon::wakeUpCompletion>(kDVServiceName, {after(kNever)}, Repeat::harmless)), std::nullopt);
   }
   eventually("all descriptors are closed", [descriptors] { return openDescriptors() <= descriptors; });
-  stopServices();
 }
 
 TEST_F(ServiceConnectionsTest, CallsThatRunOverAConnectionGoOnWhenItIsLeftBehind) {
   startServices();
   Consumer& daemon = consumer(patient(0ms));
-  Mailbox<DVDaemon::ErrorReply> stopped;
-  script_.stopping = [&stopped](DVDaemon::ErrorReply reply) { stopped.put(std::move(reply)); };
+  holdStops();
   auto running = std::async(std::launch::async, [this] { return stopProviding(); });
-  const auto reply = stopped.take();
+  const auto reply = stopped_.take();
   ASSERT_TRUE(reply);
   script_.waking = [](const DVDaemon::Done&) {};
   for (int i = 0; i < 2000; ++i) ASSERT_EQ(errorIn(daemon.within(0ms).wakeUp()), own(ConsumerErrorCode::deadlinePassed));
@@ -137,12 +133,11 @@ TEST_F(ServiceConnectionsTest, CallsThatRunOverAConnectionGoOnWhenItIsLeftBehind
 }
 
 TEST_F(ServiceConnectionsTest, AFileInALateAnswerIsClosed) {
-  Mailbox<QXSandboxRedemption::FileReply> redeemed;
-  script_.redeeming = [&redeemed](QXSandboxRedemption::FileReply reply) { redeemed.put(std::move(reply)); };
+  script_.redeeming = [this](QXSandboxRedemption::FileReply reply) { redeemed_.put(std::move(reply)); };
   startServices();
   Consumer& daemon = consumer();
   EXPECT_EQ(errorIn(daemon.within(1ms).redeem(QXData::fromText("item"), Access::read)), own(ConsumerErrorCode::deadlinePassed));
-  auto late = redeemed.take();
+  auto late = redeemed_.take();
   ASSERT_TRUE(late);
   // The last end of a pipe: who reads it learns when every copy is closed.
   std::array<int, 2> ends{};
@@ -251,12 +246,11 @@ TEST_F(ServiceConnectionsTest, ARequestThatEndsTheDaemonTwiceIsNotAskedAThirdTim
 }
 
 TEST_F(ServiceConnectionsTest, ARequestThatIsNotHarmlessIsNotAskedAgain) {
-  Mailbox<DVDaemon::ErrorReply> stopped;
-  script_.stopping = [&stopped](DVDaemon::ErrorReply reply) { stopped.put(std::move(reply)); };
+  holdStops();
   startServices();
   consumer(patient(kNever));
   auto answer = std::async(std::launch::async, [this] { return stopProviding(); });
-  ASSERT_TRUE(stopped.take());
+  ASSERT_TRUE(stopped_.take());
   restartServices();
   EXPECT_EQ(errorIn(answer.get()), own(ConsumerErrorCode::connectionLost));
   EXPECT_THAT(calls_.all(), SizeIs(1));

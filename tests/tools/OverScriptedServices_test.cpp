@@ -166,6 +166,8 @@ class OverScriptedServices : public tests::LibraryTest {
   tests::Calls calls_;
   tests::AccessNames accessNames_;
   tests::Mailbox<DVDaemon::ErrorReply> starting_;
+  tests::Mailbox<QXFileCoordination::ErrorReply> begun_;
+  tests::Mailbox<DVAdministration::GrantsReply> listing_;
   const std::shared_ptr<ScriptedAdministration> administrator_ = std::make_shared<ScriptedAdministration>();
   std::unique_ptr<tests::ScriptedService<DVAdministration>> administration_;
   std::unique_ptr<tests::ScriptedService<DVDaemon>> daemon_;
@@ -268,12 +270,10 @@ TEST_F(OverScriptedServices, ACommandOfTheAdministrationEndsAtTheCallersTimeoutT
 
 TEST_F(OverScriptedServices, ABundleStaysWhenItsGrantsCannotBeHad) {
   installBundle("org.b");
-  tests::Mailbox<DVAdministration::GrantsReply> listing;
-  administrator_->listing = [&listing](DVAdministration::GrantsReply reply) { listing.put(std::move(reply)); };
+  administrator_->listing = [this](DVAdministration::GrantsReply reply) { listing_.put(std::move(reply)); };
   startAdministration();
   EXPECT_EQ(tests::Process(command({"--timeout", "1", "uninstall", "--remove-grants", "org.b"})).wait().status, 8);
   EXPECT_TRUE(std::filesystem::exists(bundleDirectory("org.b"))) << "the list could not be had, so nothing is removed";
-  stop(administration_);
 }
 
 TEST_F(OverScriptedServices, AGrantThatIsGoneMeanwhileIsRemovedEnough) {
@@ -340,22 +340,20 @@ TEST_F(OverScriptedServices, AFileIsPrintedAsItIsOrInJSON) {
 TEST_F(OverScriptedServices, TheContentsProgressIsGoneBeforeTheyArePrinted) {
   script_.bytesPresent = 1'000'000;
   script_.size = 2'000'000;
-  tests::Mailbox<QXFileCoordination::ErrorReply> begun;
-  script_.accessing = [&begun](QXFileCoordination::ErrorReply reply) { begun.put(std::move(reply)); };
+  script_.accessing = [this](QXFileCoordination::ErrorReply reply) { begun_.put(std::move(reply)); };
   startCoordination();
   PseudoTerminal terminal(80);
   auto wanted = command({"read", path_});
   wanted.errors = terminal.descriptor();
   tests::Process process(wanted);
   ASSERT_TRUE(terminal.await("\r 50 %  1.0 MB of 2.0 MB"));
-  const auto reply = begun.take();
+  const auto reply = begun_.take();
   ASSERT_TRUE(reply);
   (*reply)(std::nullopt);
   const Ending ending = process.wait();
   EXPECT_EQ(ending.status, 0);
   EXPECT_EQ(ending.output, tests::contentsOf(path_));
   EXPECT_THAT(terminal.finished(), EndsWith(" \r"));
-  stop(coordination_);
 }
 
 TEST_F(OverScriptedServices, AFileThatCannotBeHadIsAFailureThatSaysWhy) {
