@@ -163,40 +163,53 @@ TEST_F(TokenSessionTest, ForgetsEveryTokenWhenItsFloorsAreNotWhatTheyShouldBe) {
     use(there);
   };
   const auto size = [this] { return static_cast<std::size_t>(std::filesystem::file_size(paths.tokenFloors)); };
-  const std::vector<std::pair<const char*, std::function<void()>>> table = {
-      {"missing", [&] { std::filesystem::remove(paths.tokenFloors); }},
-      {"empty", [&] { write(paths.tokenFloors, ""); }},
-      {"cut short by a byte", [&] { std::filesystem::resize_file(paths.tokenFloors, size() - 1); }},
-      {"cut short by its tag", [&] { cut(read(paths.tokenFloors).rfind("tag:"), std::string::npos, ""); }},
-      {"cut short to its number", [&] { cut(read(paths.tokenFloors).find("floor:"), std::string::npos, ""); }},
-      {"without its floor", [&] { keepingTag("docuvend-token-floors:2\nnumber:2\n"); }},
-      {"with a lower floor", [&] { keepingTag("docuvend-token-floors:2\nnumber:2\nfloor:1:/a/\n"); }},
-      {"of another version", [&] { keepingTag("docuvend-token-floors:1\nnumber:2\nfloor:2:/a/\n"); }},
-      {"with a byte more", [&] { cut(size(), 0, "\n"); }},
-      {"with a changed tag", [&] { cut(size() - 2, 1, read(paths.tokenFloors)[size() - 2] == '0' ? "1" : "0"); }},
-      {"in capitals", [&] { cut(read(paths.tokenFloors).rfind("tag:"), 3, "TAG"); }},
-      {"too long", [&] { std::filesystem::resize_file(paths.tokenFloors, TokenFloors::kMaximumTextLength + 1); }},
+  struct Row {
+    const char* name;
+    std::function<void()> damage;
+    QXError why;
+  };
+  const std::string& file = paths.tokenFloors;
+  const QXError isDamaged = QXError::system(EINVAL, file + " is damaged, of another key or of another version");
+  const std::vector<Row> table = {
+      {"missing", [&] { std::filesystem::remove(paths.tokenFloors); }, QXError::system(ENOENT, "cannot open " + file)},
+      {"empty", [&] { write(paths.tokenFloors, ""); }, isDamaged},
+      {"cut short by a byte", [&] { std::filesystem::resize_file(paths.tokenFloors, size() - 1); }, isDamaged},
+      {"cut short by its tag", [&] { cut(read(paths.tokenFloors).rfind("tag:"), std::string::npos, ""); }, isDamaged},
+      {"cut short to its number", [&] { cut(read(paths.tokenFloors).find("floor:"), std::string::npos, ""); }, isDamaged},
+      {"without its floor", [&] { keepingTag("docuvend-token-floors:2\nnumber:2\n"); }, isDamaged},
+      {"with a lower floor", [&] { keepingTag("docuvend-token-floors:2\nnumber:2\nfloor:1:/a/\n"); }, isDamaged},
+      {"of another version", [&] { keepingTag("docuvend-token-floors:1\nnumber:2\nfloor:2:/a/\n"); }, isDamaged},
+      {"with a byte more", [&] { cut(size(), 0, "\n"); }, isDamaged},
+      {"with a changed tag", [&] { cut(size() - 2, 1, read(paths.tokenFloors)[size() - 2] == '0' ? "1" : "0"); }, isDamaged},
+      {"in capitals", [&] { cut(read(paths.tokenFloors).rfind("tag:"), 3, "TAG"); }, isDamaged},
+      {"too long", [&] { std::filesystem::resize_file(paths.tokenFloors, TokenFloors::kMaximumTextLength + 1); },
+       QXError::system(EFBIG, file + " is too long")},
       {"of another session",
        [&] {
          otherSession([this](const Paths& there) {
            std::filesystem::copy_file(there.tokenFloors, paths.tokenFloors, std::filesystem::copy_options::overwrite_existing);
          });
-       }},
-      {"readable by others", [&] { ASSERT_EQ(::chmod(paths.tokenFloors.c_str(), 0604), 0); }},
-      {"not readable", [&] { ASSERT_EQ(::chmod(paths.tokenFloors.c_str(), 0200), 0); }},
-      {"two links", [&] { ASSERT_EQ(::link(paths.tokenFloors.c_str(), (paths.tokenFloors + "2").c_str()), 0); }},
+       },
+       isDamaged},
+      {"readable by others", [&] { ASSERT_EQ(::chmod(paths.tokenFloors.c_str(), 0604), 0); },
+       QXError::system(EPERM, file + " must have mode 600")},
+      {"not readable", [&] { ASSERT_EQ(::chmod(paths.tokenFloors.c_str(), 0200), 0); }, QXError::system(EACCES, "cannot open " + file)},
+      {"two links", [&] { ASSERT_EQ(::link(paths.tokenFloors.c_str(), (paths.tokenFloors + "2").c_str()), 0); },
+       QXError::system(EPERM, file + " must have one link")},
       {"a link",
        [&] {
          std::filesystem::rename(paths.tokenFloors, paths.tokenFloors + "2");
          ASSERT_EQ(::symlink((paths.tokenFloors + "2").c_str(), paths.tokenFloors.c_str()), 0);
-       }},
+       },
+       QXError::system(ELOOP, "cannot open " + file)},
       {"a pipe",
        [&] {
          std::filesystem::remove(paths.tokenFloors);
          ASSERT_EQ(::mkfifo(paths.tokenFloors.c_str(), 0600), 0);
-       }},
+       },
+       QXError::system(EINVAL, file + " is not a regular file")},
   };
-  for (const auto& [name, damage] : table) {
+  for (const auto& [name, damage, why] : table) {
     const std::string taken = issued(*loaded(), "/a/b");
     const std::string beside = issued(*loaded(), "/b/b");
     ASSERT_EQ(loaded()->takeBack({"/a/"}), std::nullopt) << name;
@@ -207,10 +220,10 @@ TEST_F(TokenSessionTest, ForgetsEveryTokenWhenItsFloorsAreNotWhatTheyShouldBe) {
     EXPECT_FALSE(isGood(*session, taken)) << name;
     EXPECT_FALSE(isGood(*session, beside)) << name;
     EXPECT_NE(read(paths.tokenKey), key) << name;
-    ASSERT_EQ(log.texts(QXLogType::defaultType).size(), 1U) << name;
-    EXPECT_TRUE(log.texts()[0].starts_with("[NOTICE] No sandbox token issued until now is good any more: QXSystemErrorDomain "))
-        << log.texts()[0];
-    EXPECT_NE(log.texts()[0].find(paths.tokenFloors), std::string::npos) << name;
+    EXPECT_EQ(log.entries(),
+              (std::vector<fake_platform::FakeLogEntry>{
+                  {QXLogType::defaultType, "[NOTICE] No sandbox token issued until now is good any more: " + why.description()}}))
+        << name;
 
     const std::string fresh = issued(*session, "/a/b");
     EXPECT_TRUE(isGood(*loaded(), fresh)) << name << ": the file begins anew";
