@@ -239,8 +239,9 @@ TEST_F(AwaitedProviderTest, OfAWriteOfAFileThatIsNotInItsPlaceAnyMoreTheLogSaysT
   finishWriting(fileNamed("/c/nobodys.txt"));
   EXPECT_TRUE(log.texts().empty());
   finishWriting(item);
-  EXPECT_EQ(log.texts(), (std::vector<std::string>{"[ERROR] Nobody can be told that the item at URL " + item.url.absoluteString() +
-                                                   " has changed: it is not where it was."}));
+  EXPECT_EQ(log.entries(), (std::vector<fake_platform::FakeLogEntry>{{QXLogType::fault, "[ERROR] Nobody can be told that the item at URL " +
+                                                                                            item.url.absoluteString() +
+                                                                                            " has changed: it is not where it was."}}));
   EXPECT_EQ(provider->told.size(), 1U);
 }
 

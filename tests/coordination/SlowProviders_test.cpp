@@ -259,8 +259,9 @@ TEST_F(SlowProviderTest, ThatCanNeverBeToldIsGivenUpWithALineInTheLog) {
   provider->fail();
   pass(kLong);
   EXPECT_EQ(provider->told.size(), static_cast<std::size_t>(ChangeNotices::kMaximumFailures));
-  EXPECT_EQ(log.texts(), (std::vector<std::string>{"[ERROR] The extension com.example.provider was never told that the item at URL " +
-                                                   url("x").absoluteString() + " has changed."}));
+  EXPECT_EQ(log.entries(), (std::vector<fake_platform::FakeLogEntry>{
+                               {QXLogType::fault, "[ERROR] The extension com.example.provider was never told that the item at URL " +
+                                                      url("x").absoluteString() + " has changed."}}));
   write("x");
   EXPECT_EQ(provider->told.size(), static_cast<std::size_t>(ChangeNotices::kMaximumFailures) + 1) << "of the next write it is told at once";
 }
