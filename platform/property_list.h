@@ -24,7 +24,8 @@ class QXPropertyLists {
   QXPropertyLists& operator=(const QXPropertyLists&) = delete;
   virtual ~QXPropertyLists() = default;
 
-  // An input stream on a file; null when none can be created.
+  // An input stream on a file; null when nothing is there to create it on, or this process can open no more. One on what cannot be opened or
+  // is no file is bad from the start, and reading a property list from it is an error.
   [[nodiscard]] virtual std::unique_ptr<std::istream> openStream(const std::string& path) = 0;
   // Parses one property list. Size, depth and the values that XML cannot carry are bounded.
   [[nodiscard]] virtual ReadResult read(std::istream& stream) = 0;

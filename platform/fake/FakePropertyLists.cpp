@@ -62,7 +62,7 @@ bool isCarried(const QXValue& value) {
 }  // namespace
 
 std::unique_ptr<std::istream> FakePropertyLists::openStream(const std::string& path) {
-  if (!fileSystem_.isFile(path)) return nullptr;
+  if (!fileSystem_.isFile(path)) return fileSystem_.isDirectory(path) ? std::make_unique<std::istream>(/*sb=*/nullptr) : nullptr;
   const std::lock_guard lock(mutex_);
   ReadResult result = notAPropertyList();
   if (const auto found = contents_.find(path); found != contents_.end()) {

@@ -72,6 +72,24 @@ TEST_F(StoreOverFiles, TheDirectoryIsThereFromTheStartAndTheFileFromTheFirstGran
   EXPECT_TRUE(fileSystem_.exists(file()));
 }
 
+TEST_F(StoreOverFiles, AFileThatMayNotBeReadIsAnErrorAndAnEmptyListAndIsKeptBeside) {
+  const auto store = DVAccessControlStore::sharedStore();
+  store->allowProviderWithIdentifier(kProvider, ItemID{"old"}, kConsumer);
+  std::filesystem::permissions(file(), std::filesystem::perms::none);
+  log_.clear();
+  const auto next = nextStore();
+  EXPECT_EQ(log_.texts(), std::vector<std::string>{"[ERROR] Cannot read access control from disk. Error: QXGeneralErrorDomain 300: "
+                                                   "The file cannot be read."});
+  store->rereadAccessControl();
+  queues_.runAll();
+  for (const auto& other : {store, next}) EXPECT_FALSE(other->isProviderWithIdentifier(kProvider, ItemID{"old"}, kConsumer));
+
+  next->allowProviderWithIdentifier(kProvider, ItemID{"new"}, kConsumer);
+  std::filesystem::permissions(file() + ".unreadable-1", std::filesystem::perms::owner_read);
+  EXPECT_NE(test::readText(file() + ".unreadable-1").find("old"), std::string::npos);
+  EXPECT_EQ(test::readText(file()).find("old"), std::string::npos);
+}
+
 TEST_F(StoreOverFiles, TheFirstGrantReplacesAFileThatIsNoPropertyList) {
   ASSERT_EQ(fileSystem_.createDirectory(home_.path("Library/Docuvend")), std::nullopt);
   test::writeText(file(), "no property list");

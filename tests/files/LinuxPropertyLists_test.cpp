@@ -2,6 +2,7 @@
 
 #include <fcntl.h>
 #include <gtest/gtest.h>
+#include <sys/resource.h>
 #include <sys/stat.h>
 
 #include <algorithm>
@@ -36,10 +37,37 @@ class LinuxPropertyListsTest : public ::testing::Test {
   LinuxPropertyLists lists_;
 };
 
-TEST_F(LinuxPropertyListsTest, NeitherAPipeNorADeviceMakesAStream) {
+TEST_F(LinuxPropertyListsTest, WhatIsThereAndCannotBeOpenedOrIsNoFileCannotBeRead) {
   ASSERT_EQ(::mkfifo(path_.c_str(), 0600), 0);
+  const std::string locked = directory_.path("locked");
+  ASSERT_TRUE(lists_.writeXMLAtomically({{"a", 1}}, locked));
+  ASSERT_EQ(::chmod(locked.c_str(), 0), 0);
+  const std::string loop = directory_.path("loop");
+  std::filesystem::create_symlink("loop", loop);
+  for (const std::string& path : {path_, std::string("/dev/zero"), locked, loop}) {
+    const auto stream = lists_.openStream(path);
+    ASSERT_NE(stream, nullptr) << path;
+    EXPECT_TRUE(stream->bad()) << path;
+    const auto result = lists_.read(*stream);
+    EXPECT_FALSE(result.value) << path;
+    ASSERT_TRUE(result.error) << path;
+    EXPECT_EQ(result.error->texts.at("description"), "The file cannot be read.") << path;
+  }
+}
+
+TEST_F(LinuxPropertyListsTest, WhereNothingIsOrNothingCanBeOpenedThereIsNoStream) {
+  EXPECT_EQ(lists_.openStream(path_ + "/below"), nullptr);
+  std::filesystem::create_symlink("nowhere", directory_.path("dangling"));
+  EXPECT_EQ(lists_.openStream(directory_.path("dangling")), nullptr);
+  ASSERT_TRUE(lists_.writeXMLAtomically({{"a", 1}}, path_));
+  EXPECT_EQ(lists_.openStream(path_ + "/below"), nullptr);
+  rlimit usual{};
+  ASSERT_EQ(::getrlimit(RLIMIT_NOFILE, &usual), 0);
+  rlimit none = usual;
+  none.rlim_cur = 0;
+  ASSERT_EQ(::setrlimit(RLIMIT_NOFILE, &none), 0);
   EXPECT_EQ(lists_.openStream(path_), nullptr);
-  EXPECT_EQ(lists_.openStream("/dev/zero"), nullptr);
+  ASSERT_EQ(::setrlimit(RLIMIT_NOFILE, &usual), 0);
 }
 
 TEST_F(LinuxPropertyListsTest, AStreamFollowsALinkToAFile) {

@@ -74,9 +74,14 @@ TYPED_TEST(PropertyListsBehavior, WhatIsWrittenReadsBack) {
 
 TYPED_TEST(PropertyListsBehavior, AMissingFileMakesNoStream) { EXPECT_EQ(this->lists().openStream(this->path_), nullptr); }
 
-TYPED_TEST(PropertyListsBehavior, ADirectoryMakesNoStream) {
+TYPED_TEST(PropertyListsBehavior, ADirectoryCannotBeRead) {
   this->files_.makeDirectory(this->path_);
-  EXPECT_EQ(this->lists().openStream(this->path_), nullptr);
+  const auto stream = this->lists().openStream(this->path_);
+  ASSERT_TRUE(stream);
+  EXPECT_TRUE(stream->bad());
+  const auto result = this->lists().read(*stream);
+  EXPECT_FALSE(result.value);
+  EXPECT_TRUE(result.error);
 }
 
 TYPED_TEST(PropertyListsBehavior, ALaterWriteReplacesTheEarlierOne) {

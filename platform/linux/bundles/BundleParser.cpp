@@ -64,7 +64,7 @@ class Parser {
     if (!S_ISREG(status.st_mode)) return problem(std::string(name) + " is not a regular file");
     addVersion(status);
     const auto stream = propertyLists_.openStream(directory_ + "/" + name);
-    if (!stream) return problem(std::string(name) + " cannot be opened");
+    if (!stream || stream->bad()) return problem(std::string(name) + " cannot be opened");
     auto read = propertyLists_.read(*stream);
     if (read.error) return problem(std::string(name) + " is no property list: " + read.error->description());
     auto* dictionary = read.value ? read.value->as<QXDictionary>() : nullptr;

@@ -8,6 +8,7 @@ namespace docuvend::linux_platform {
 
 DescriptorStream::DescriptorStream(UniqueDescriptor descriptor) : std::istream(nullptr), buffer_(*this, std::move(descriptor)) {
   rdbuf(&buffer_);  // also clears the state that the missing buffer left
+  if (!buffer_.hasDescriptor()) setstate(std::ios::badbit);
 }
 
 DescriptorStream::Buffer::int_type DescriptorStream::Buffer::underflow() {

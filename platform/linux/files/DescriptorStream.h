@@ -1,4 +1,5 @@
-// Reads an open file as a standard stream. A read that fails sets the stream's bad bit, so that it is not taken for the file's end.
+// Reads an open file as a standard stream. A read that fails sets the stream's bad bit, so that it is not taken for the file's end; so it
+// is from the start when there is no descriptor.
 #pragma once
 
 #include <array>
@@ -17,6 +18,8 @@ class DescriptorStream : public std::istream {
   class Buffer : public std::streambuf {
    public:
     Buffer(DescriptorStream& stream, UniqueDescriptor descriptor) : stream_(stream), descriptor_(std::move(descriptor)) {}
+
+    [[nodiscard]] bool hasDescriptor() const { return static_cast<bool>(descriptor_); }
 
    protected:
     int_type underflow() override;

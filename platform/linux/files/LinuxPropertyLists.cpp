@@ -18,12 +18,18 @@ namespace {
 
 constexpr const char* kUnreadableSuffix = ".unreadable-";
 
+// There is none, or it is this process that lacks something.
+bool saysNothingOfTheFile(int error) {
+  return error == ENOENT || error == ENOTDIR || error == EMFILE || error == ENFILE || error == ENOMEM;
+}
+
 }  // namespace
 
 std::unique_ptr<std::istream> LinuxPropertyLists::openStream(const std::string& path) {
   UniqueDescriptor file(::open(path.c_str(), O_RDONLY | O_NONBLOCK | O_NOCTTY | O_CLOEXEC));
+  if (!file && saysNothingOfTheFile(errno)) return nullptr;
   struct stat status {};
-  if (!file || ::fstat(file.get(), &status) != 0 || !S_ISREG(status.st_mode)) return nullptr;
+  if (file && (::fstat(file.get(), &status) != 0 || !S_ISREG(status.st_mode))) file.reset();
   return std::make_unique<DescriptorStream>(std::move(file));
 }
 
@@ -63,7 +69,7 @@ bool LinuxPropertyLists::keepBeside(const std::string& path) {
 }
 
 LinuxPropertyLists::Stamp LinuxPropertyLists::stampOf(const struct stat& status) {
-  return {status.st_dev, status.st_ino, status.st_size, status.st_mtim.tv_sec, status.st_mtim.tv_nsec};
+  return {status.st_dev, status.st_ino, status.st_mode, status.st_size, status.st_mtim.tv_sec, status.st_mtim.tv_nsec};
 }
 
 bool LinuxPropertyLists::holdsSomethingElse(const std::string& path) {

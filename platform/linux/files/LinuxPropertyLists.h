@@ -26,10 +26,11 @@ class LinuxPropertyLists : public QXPropertyLists {
   bool keepBeside(const std::string& path) override;
 
  private:
-  // What tells a file from every other one, and from itself after a change.
+  // What tells a file from every other one, and from itself after a change of its contents or of who may read them.
   struct Stamp {
     std::uint64_t device = 0;
     std::uint64_t inode = 0;
+    std::uint32_t mode = 0;
     std::int64_t size = 0;
     std::int64_t seconds = 0;
     std::int64_t nanoseconds = 0;
