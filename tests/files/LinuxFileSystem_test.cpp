@@ -133,8 +133,11 @@ TEST_F(LinuxFileSystemTest, AStraightURLKeepsItsTextAndALinkedOnesKind) {
   const auto escaped = QXURL::fromString("file://" + path("items/%66ile"));
   ASSERT_TRUE(escaped);
   EXPECT_EQ(straightURL(*escaped), *escaped);
+  EXPECT_EQ(straightURL(*QXURL::fromString("file://" + path("//items///%66ile"))), *escaped) << "but for slashes";
+  EXPECT_EQ(straightURL(*QXURL::fromString("file://" + path("items%2F%2F%66ile"))), QXURL::fileURL(path("items/file"), QXURLKind::file));
   const QXURL directory = QXURL::fileURL(path("items/sub"), QXURLKind::directory);
   EXPECT_EQ(straightURL(directory), directory);
+  EXPECT_EQ(straightURL(*QXURL::fromString("file://" + path("items//sub//"))), directory);
   EXPECT_EQ(straightURL(QXURL::fileURL(path("alias/sub"), QXURLKind::directory)), directory);
   EXPECT_EQ(straightURL(QXURL::fileURL(path("alias/file"), QXURLKind::file)), QXURL::fileURL(path("items/file"), QXURLKind::file));
 }

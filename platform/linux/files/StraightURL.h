@@ -11,7 +11,7 @@
 namespace docuvend::linux_platform {
 
 // The URL by the way without links, "." and "..", also of what does not exist yet; a directory's stays a directory's. A URL whose way is
-// straight already comes back as it is, percent escapes included, and so does one that leads nowhere.
+// straight already comes back as it is, percent escapes included, but with one slash where it has several; one that leads nowhere as it is.
 [[nodiscard]] QXURL straightURL(const QXURL& url);
 
 // Whether a straight URL is one of something below that directory, which may be reached over links.
