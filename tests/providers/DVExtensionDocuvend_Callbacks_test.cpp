@@ -92,6 +92,18 @@ TEST_F(CallbacksTest, AChangeThatWasAnsweredAndThenLostIsLoggedAndItsRequestIsEn
   EXPECT_EQ(cellar->cancelled(), (std::vector{FakeExtension::uuid(1), FakeExtension::uuid(2), FakeExtension::uuid(2)}));
 }
 
+TEST_F(CallbacksTest, TheLinesOfAChangeNameTheProviderAsItIsWhenTheyAreWritten) {
+  provider->itemChangedAtURL(*url);
+  provider->setIdentifier(ProviderID{kShed});
+  written();
+  cellar->vendor().answerLast({QXValue(broken)});
+  EXPECT_EQ(written().front(), Line("fault: [ERROR] Could not tell extension com.orvane.shed that item at URL " + text +
+                                    " has changed. Error: TestDomain 7: broken"));
+  cellar->failBegins(broken);
+  provider->itemChangedAtURL(*url);
+  EXPECT_EQ(written().back(), Line("fault: [ERROR] Cannot tell extension com.orvane.shed that item at URL " + text + " has changed."));
+}
+
 TEST_F(CallbacksTest, AFinishedWriteIsToldToTheProviderThatOwnsTheURL) {
   provider->_writerWithID(kWriter, *url);
   EXPECT_EQ(written(), (Lines{toldOf(text), "info: [INFO] Resolved URL to provider com.orvane.cellar.",

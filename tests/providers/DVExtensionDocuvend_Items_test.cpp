@@ -226,6 +226,25 @@ TEST_P(ItemsTest, AnErrorOfTheExtensionIsWrappedWithoutResultAndEndsTheRequest) 
   EXPECT_EQ(completed[0].result, std::nullopt);
 }
 
+TEST_P(ItemsTest, TheLinesNameTheProviderAsItIsWhenTheyAreWritten) {
+  const auto renamed = [](std::string text) {
+    const std::string usual = kCellar;
+    const std::size_t place = text.find(usual);
+    return place == std::string::npos ? text : text.replace(place, usual.size(), kAttic);
+  };
+  GetParam().call(*provider, recorder());
+  provider->setIdentifier(ProviderID{kAttic});
+  extension->vendor().answerLast(GetParam().success);
+  EXPECT_EQ(written(), opened({"debug: [DEBUG] " + renamed(GetParam().succeeded), "~ completion", "~ cancel 1"}));
+  GetParam().call(*provider, recorder());
+  extension->vendor().answerLast(GetParam().failure);
+  EXPECT_EQ(written(), opened({"fault: [ERROR] " + renamed(GetParam().proxyFailed), "~ completion", "~ cancel 2"}));
+  extension->failBegins(broken);
+  GetParam().call(*provider, recorder());
+  EXPECT_EQ(written(), opened({"fault: [ERROR] Extension request failed. Error: TestDomain 7: broken",
+                               "fault: [ERROR] " + renamed(GetParam().requestFailed), "~ completion"}));
+}
+
 TEST_P(ItemsTest, AnAbsentCompletionIsToleratedAndTheRequestStillEndsAfterAReply) {
   GetParam().call(*provider, /*outcome=*/{});
   extension->vendor().answerLast(GetParam().success);

@@ -167,9 +167,16 @@ TEST_F(ReadsTest, AReadThatNobodyWaitsForIsTolerated) {
   cellar->vendor().answerLast({QXValue()});
 
   provider->_provideItemAtURL(*url, kReader, /*completionHandler=*/{});
+  provider->setIdentifier(ProviderID{kAttic});
+  written();
   cellar->vendor().answerLast({QXValue(broken), QXValue()});
   platform.queues.runAll();
   EXPECT_EQ(asked(), (Texts{kIdentifierOperation, kStartOperation, kIdentifierOperation}));
+  const Lines lines = written();
+  ASSERT_EQ(lines.size(), 2U);
+  EXPECT_EQ(lines[0], Line("fault: [ERROR] Could not provide item at URL " + text + " from extension com.orvane.attic to reader " +
+                           "reader-5. Error: " + DVPluginOperationFailedError(broken).description()))
+      << "and named as it is now";
 }
 
 }  // namespace

@@ -114,17 +114,53 @@ TEST_F(RegistrationTest, AProviderWithoutDirectoryIsRegisteredAllTheSame) {
                               "info: [INFO] Registered docuvend extension com.orvane.cellar for path (null)", "~ completion"}));
 }
 
-TEST_F(RegistrationTest, CompletionsMayBeAbsent) {
+TEST_F(RegistrationTest, ARegistrationThatNobodyWaitsForIsMadeAndLoggedAllTheSame) {
   provider->registerWithFileCoordinatorRetryCount(1, /*completion=*/{});
   answerSetup(std::nullopt);
   platform.queues.runAll();
   EXPECT_EQ(platform.fileCoordinator.providers().size(), 1U);
+  EXPECT_EQ(written(), (Lines{kMethod, "~ begin", kBeginning, "~ cancel 1", kRegistered}));
   provider->registerWithFileCoordinatorRetryCount(1, /*completion=*/{});
   answerSetup(broken);
+  EXPECT_EQ(written(), (Lines{kMethod, "~ begin", kBeginning, kFailedToInitialize, "~ cancel 2"}));
   extension->failBegins(broken);
-  provider->registerWithFileCoordinatorRetryCount(1, /*completion=*/{});
   provider->registerWithFileCoordinatorRetryCount(0, /*completion=*/{});
   EXPECT_EQ(platform.queues.runAll(), 0U);
+  EXPECT_TRUE(written().empty());
+}
+
+TEST_F(RegistrationTest, ARegistrationThatNobodyWaitsForIsTriedAgainAllTheSame) {
+  extension->failBegins(broken);
+  provider->registerWithFileCoordinatorRetryCount(3, /*completion=*/{});
+  EXPECT_EQ(written(), (Lines{kMethod, "~ begin", kBeginning, kRequestFailed, kErrorRegistering, kTwoTriesLeft}));
+  for (int later = 0; later < 3; ++later) {
+    platform.queues.advance(2s);
+    platform.queues.runAll();
+  }
+  EXPECT_EQ(extension->beginCount(), 3);
+}
+
+// An identifier that is set while a registration is under way is the one that the lines name.
+TEST_F(RegistrationTest, TheLinesNameTheProviderAndItsDirectoryAsTheyAreWhenTheyAreWritten) {
+  provider->registerWithFileCoordinatorRetryCount(1, recorder());
+  provider->setIdentifier(ProviderID{kAttic});
+  answerSetup(broken);
+  EXPECT_EQ(written().at(3), Line("fault: [ERROR] Docuvend extension com.orvane.attic failed to initialize. Error: TestDomain 7: broken."));
+  extension->failBegins(broken);
+  provider->registerWithFileCoordinatorRetryCount(2, recorder());
+  const Lines lines = written();
+  ASSERT_EQ(lines.size(), 6U);
+  EXPECT_EQ(lines[4], Line("fault: [ERROR] Error registering docuvend extension com.orvane.attic: TestDomain 7: broken."));
+  EXPECT_EQ(lines[5], Line("default: [NOTICE] Trying to register docuvend extension com.orvane.attic again. Tries left: 1"));
+
+  extension->answerBegins();
+  provider->registerWithFileCoordinatorRetryCount(1, recorder());
+  answerSetup(std::nullopt);
+  provider->setIdentifier(ProviderID{kShed});
+  provider->setProvidedItemsURL(directory("/elsewhere"));
+  written();
+  platform.queues.runAll();
+  EXPECT_EQ(written().front(), Line("info: [INFO] Registered docuvend extension com.orvane.shed for path file:///elsewhere/"));
 }
 
 TEST_F(RegistrationTest, ThreeTriesTwoSecondsApartAndTheThirdErrorReachesTheCompletion) {

@@ -123,13 +123,19 @@ TEST_F(DVRpcServicerBookmarksTest, AnEmptyItemIdentifierMakesAStringAllTheSame) 
   EXPECT_EQ(lateAnswer().string, "docuvend:com.orvane.cellar/");
 }
 
-TEST_F(DVRpcServicerBookmarksTest, TheStringWithoutAReplyHandlerIsHarmless) {
+TEST_F(DVRpcServicerBookmarksTest, AStringThatNobodyWaitsForIsMadeAndLoggedAllTheSame) {
   servicer_->bookmarkableStringFromDocumentURL(kReport, /*completion=*/{});
   answerItemID(*cellar_, kExtensionError, /*item=*/std::nullopt);
   servicer_->bookmarkableStringFromDocumentURL(kReport, /*completion=*/{});
   answerItemID(*cellar_, /*error=*/std::nullopt, /*item=*/std::nullopt);
   servicer_->bookmarkableStringFromDocumentURL(kReport, /*completion=*/{});
   EXPECT_EQ(cellarMessages(), 3U);
+  EXPECT_EQ(logged(), (Entries{kGettingString,
+                               {QXLogType::debug, "[DEBUG] Successfully generated bookmarkable string “" + kString + "” from URL " +
+                                                      kReport.absoluteString() + "."},
+                               kGettingString,
+                               kGettingString,
+                               {QXLogType::fault, "[ERROR] Could not get Item ID for URL " + kReport.absoluteString() + "."}}));
 }
 
 // --- The URL for a string
@@ -382,16 +388,28 @@ TEST_F(DVRpcServicerBookmarksTest, AnEarlyFailureWithoutAReplyHandlerCausesNoTas
   servicer_->documentURLFromBookmarkableString("nonsense", /*completion=*/{});
   servicer_->documentURLFromBookmarkableString(kString, /*completion=*/{});
   EXPECT_EQ(platform_.queues.pending(), 0U);
+  const auto faults = platform_.log.texts(QXLogType::fault);
+  ASSERT_EQ(faults.size(), 1U) << "of the second, which nobody granted";
+  EXPECT_NE(faults[0].find("com.example.editor"), std::string::npos) << faults[0];
 }
 
-TEST_F(DVRpcServicerBookmarksTest, TheURLWithoutAReplyHandlerIsHarmless) {
+TEST_F(DVRpcServicerBookmarksTest, AURLThatNobodyWaitsForIsMadeAndLoggedAllTheSame) {
   grantToEditor();
   servicer_->documentURLFromBookmarkableString(kString, /*completion=*/{});
+  EXPECT_EQ(platform_.sandbox.issueCalls(), (std::vector<std::string>{kReportPath, kSiblingPath}));
   answerURL(*cellar_, /*error=*/std::nullopt, kElsewhere);
   servicer_->documentURLFromBookmarkableString(kString, /*completion=*/{});
   answerURL(*cellar_, kExtensionError, /*url=*/std::nullopt);
   servicer_->documentURLFromBookmarkableString(kString, /*completion=*/{});
   EXPECT_EQ(cellarMessages(), 3U);
+  EXPECT_EQ(logged(), (Entries{kGettingURL,
+                               {QXLogType::info, "[INFO] Successfully extended sandbox of URL " + kReport.absoluteString() +
+                                                     " from provider ID com.orvane.cellar to consumer ID com.example.editor."},
+                               kGettingURL,
+                               {QXLogType::fault, "[ERROR] Failed to extend sandbox of URL " + kElsewhere.absoluteString() +
+                                                      " from provider ID com.orvane.cellar to consumer ID com.example.editor. Error: " +
+                                                      DVNotPermittedError().description()},
+                               kGettingURL}));
 }
 
 TEST_F(DVRpcServicerBookmarksTest, NeitherDirectionWritesTheList) {

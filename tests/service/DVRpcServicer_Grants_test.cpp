@@ -117,6 +117,14 @@ TEST_F(DVRpcServicerGrantsTest, TheGrantAndTheLinesNameTheProviderAsTheRequestDo
   EXPECT_EQ(logged().back(), (fake_platform::FakeLogEntry{QXLogType::info, kSuccess}));
 }
 
+TEST_F(DVRpcServicerGrantsTest, SoDoesTheLineOfAFailure) {
+  rename(kCellar, kNobody);
+  extend(kElsewhere, kCellar, kEditor);
+  EXPECT_EQ(logged().back(),
+            (fake_platform::FakeLogEntry{QXLogType::fault, "[ERROR] Failed to extend sandbox for URL " + kElsewhere.absoluteString() +
+                                                               " from provider ID com.orvane.cellar to consumer ID com.example.editor."}));
+}
+
 TEST_F(DVRpcServicerGrantsTest, TheOwnerOfTheURLIsHeldAgainstTheIdentifierThatTheProviderSaysItHas) {
   answerItemID(*attic_, /*error=*/std::nullopt, kItem.value);
   rename(kAttic, kCellar);
