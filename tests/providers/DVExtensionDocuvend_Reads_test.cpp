@@ -173,8 +173,8 @@ TEST_F(ReadsTest, AReadThatNobodyWaitsForIsTolerated) {
   platform.queues.runAll();
   EXPECT_EQ(asked(), (Texts{kIdentifierOperation, kStartOperation, kIdentifierOperation}));
   const Lines lines = written();
-  ASSERT_EQ(lines.size(), 2U);
-  EXPECT_EQ(lines[0], Line("fault: [ERROR] Could not provide item at URL " + text + " from extension com.orvane.attic to reader " +
+  ASSERT_EQ(lines.size(), 3U);
+  EXPECT_EQ(lines[1], Line("fault: [ERROR] Could not provide item at URL " + text + " from extension com.orvane.attic to reader " +
                            "reader-5. Error: " + DVPluginOperationFailedError(broken).description()))
       << "and named as it is now";
 }
