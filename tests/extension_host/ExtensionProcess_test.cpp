@@ -138,6 +138,11 @@ class ExtensionProcessTest : public ::testing::Test {
     pollfd ready{peer->socket(), POLLIN, 0};
     return poll(&ready, 1, 0) == 0;
   }
+  // False when nothing comes to the peer in all that time.
+  [[nodiscard]] bool awaitFrame() const {
+    pollfd ready{peer->socket(), POLLIN, 0};
+    return poll(&ready, 1, static_cast<int>(milliseconds(tests::kPatience).count())) == 1;
+  }
 
   fake_platform::FakeLog log;
   Mailbox<ProcessLifetime::Cause> lost;
@@ -231,8 +236,7 @@ TEST_F(ExtensionProcessTest, OneThatIsSentAMessageIsAskedHoweverLongTheSendingTa
   *whenCopied = {};
   ASSERT_GT(copies, 0) << "there was no time for a look in the middle";
   ASSERT_TRUE(peer->read<RequestFrame>());
-  pollfd ready{peer->socket(), POLLIN, 0};
-  ASSERT_EQ(poll(&ready, 1, static_cast<int>(milliseconds(tests::kPatience).count())), 1);
+  ASSERT_TRUE(awaitFrame());
   EXPECT_TRUE(peer->read<PingFrame>());
 }
 
@@ -288,8 +292,16 @@ TEST_F(ExtensionProcessTest, WhatApplicationsAskForLeavesRoomForNoticesAndTheSet
   ASSERT_TRUE(last);
   expectNoRoom(sendMessage());
   expectNoRoom(sendMessage(kName));
-  for (std::size_t i = 0; i < ExtensionProcess::kRoomForNotices; ++i) {
-    waiting.push_back(sendMessage(i == 0 ? kSetup : kNotice));
+  std::size_t kept = 0;
+  for (const char* name : {kSetup, kNotice}) {
+    waiting.push_back(sendMessage(name));
+    ASSERT_TRUE(awaitFrame()) << "there is no room for " << name;
+    ASSERT_TRUE(peer->read<RequestFrame>());
+    ++kept;
+  }
+  for (; kept < ExtensionProcess::kRoomForNotices; ++kept) {
+    waiting.push_back(sendMessage(kNotice));
+    ASSERT_TRUE(awaitFrame());
     ASSERT_TRUE(peer->read<RequestFrame>());
   }
   expectNoRoom(sendMessage(kNotice));
