@@ -4,6 +4,7 @@
 
 #include <atomic>
 #include <future>
+#include <latch>
 #include <memory>
 #include <optional>
 #include <string>
@@ -152,18 +153,28 @@ TEST(ServicerOverThreads, EveryRequestIsAnsweredOnceAndNeverOnItsOwnThreadWhileE
   platform.extensionHost.setExtensions({kept, extension(kChanging, 0)});
   started.get_future().wait();
 
+  std::latch haveAsked(kClients);
+  std::promise<void> answered;
+  const std::shared_future<void> allAreAnswered = answered.get_future().share();
   std::vector<std::thread> threads;
   for (int i = 1; i <= kClients; ++i) {
     clients.push_back(std::make_unique<Client>(platform, static_cast<std::uint8_t>(i), tally));
-    threads.emplace_back([client = clients.back().get()] { client->run(); });
+    // Who asks stays until the last answer: a thread that has ended leaves its number to the next one.
+    threads.emplace_back([client = clients.back().get(), &haveAsked, allAreAnswered] {
+      client->run();
+      haveAsked.count_down();
+      allAreAnswered.wait();
+    });
   }
   for (int pass = 1; pass <= kPasses; ++pass) {
     fake_platform::FakeExtensionHost::Extensions extensions = {kept, extension(kChanging, pass)};
     if (pass % 2 == 1) extensions.push_back(extension(kPassing, pass));
     platform.extensionHost.setExtensions(std::move(extensions));
   }
-  for (std::thread& thread : threads) thread.join();
+  haveAsked.wait();
   while (tally.answered < tally.asked) std::this_thread::yield();
+  answered.set_value();
+  for (std::thread& thread : threads) thread.join();
 
   EXPECT_EQ(tally.answered, tally.asked);
   EXPECT_EQ(tally.answeredTwice, 0);
