@@ -113,5 +113,18 @@ TEST_F(Bundles, AProviderThatIsRemovedIsNoLongerFound) {
   expectTheWayIsOpen();
 }
 
+TEST_F(Bundles, WhatABundleLeavesIsToldOfWhenItCannotBeWritten) {
+  house_.startDaemon();
+  const std::string directory = house_.runtime() + "/docuvend";
+  fs::permissions(directory, fs::perms::owner_read | fs::perms::owner_exec);
+  fs::remove_all(house_.bundles() + "/" + kCellar);
+  const std::string line = "[ERROR] The tokens for a container that a bundle has left may be good again after a restart: ";
+  EXPECT_TRUE(house_.awaitLog(line));
+  fs::permissions(directory, fs::perms::owner_all);
+  EXPECT_EQ(house_.logged(line + "QXSystemErrorDomain 13: cannot create a temporary file beside " + directory +
+                          "/token-floors: Permission denied"),
+            1);
+}
+
 }  // namespace
 }  // namespace docuvend::tests
