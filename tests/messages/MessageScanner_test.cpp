@@ -36,6 +36,10 @@ TEST(MessagesIn, AreNotInComments) {
 
 TEST(MessagesIn, AreNotCutShortByQuotes) {
   EXPECT_THAT(textsIn(R"(f('"'); dvLog("[INFO] a \"b\" \\"); f('\'');)"), ElementsAre(R"([INFO] a "b" \)"));
+  EXPECT_THAT(textsIn(R"(int a = 1'000; dvLog("[INFO] b"); f('a', 0x1'F);)"), ElementsAre("[INFO] b"));
+  for (const char* source : {R"(dvLog("[INFO] a)", R"(dvLog("[INFO] a\")", "f('", "\""}) {
+    EXPECT_THROW(textsIn(source), std::invalid_argument) << source;
+  }
 }
 
 TEST(MessagesIn, HaveOneSignForAllKindsOfValues) {
@@ -51,6 +55,28 @@ TEST(MessagesIn, ContainTheLiteralsAmongTheirValues) {
 TEST(MessagesIn, AreEachTheirOwnInATable) {
   EXPECT_THAT(textsIn(R"(Row row{"name", "[ERROR] a %@", "[ERROR] b %@", [] { dvLog("[DEBUG] c"); }};)"),
               ElementsAre("[ERROR] a %@", "[ERROR] b %@", "[DEBUG] c"));
+}
+
+TEST(MessagesIn, AreFormatsWhateverFunctionTakesThemAndWhateverComesBefore) {
+  EXPECT_THAT(
+      textsIn(R"(qxLog(a.log(b, c), "[INFO] %@ %d", d, "e"); put(f(g), qxLogMessage("[ERROR] %s", h)); for (;;) { i("[DEBUG] j"); })"),
+      ElementsAre("[INFO] %@ e", "[ERROR] %@", "[DEBUG] j"));
+  EXPECT_THAT(textsIn(R"(f([] { k = {"[DEBUG] %d", 1}; }); (void)x; Format l = "[INFO] %s";)"), ElementsAre("[DEBUG] %@", "[INFO] %@"));
+}
+
+TEST(MessagesIn, AreRefusedWhenTheyArePutTogether) {
+  for (const char* source : {R"(f("[INFO] a" + b);)", R"(f("[NOTICE] " + b);)", R"(std::string c = d + "[ERROR] e";)"}) {
+    EXPECT_THROW(textsIn(source), std::invalid_argument) << source;
+  }
+  EXPECT_THAT(textsIn(R"(dvLog("[INFO] %@", "a" + b);)"), ElementsAre("[INFO] %@"));
+}
+
+TEST(MessagesIn, AreRefusedWithASourceThatWritesToTheLogWithoutAFormat) {
+  for (const char* source :
+       {"log.write(type, text);", "log_.write(type, text);", "a.log->write(type, text);", "platform.log.defaultLog().write(type, text);"}) {
+    EXPECT_THROW(textsIn(source), std::invalid_argument) << source;
+  }
+  EXPECT_THAT(textsIn("stream.write(log); journal_->write(text); f(log); write(a);"), IsEmpty());
 }
 
 TEST(MessagesIn, AreRefusedWithAnotherNumberOfValuesThanPlaces) {

@@ -15,7 +15,7 @@ namespace {
 
 constexpr std::array<std::string_view, 3> kPlaceholders{"%@", "%s", "%d"};
 constexpr std::string_view kValue = "%@";
-constexpr std::string_view kLoggingCall = "dvLog";
+constexpr char kDigitSeparator = '\'';
 
 struct Token {
   enum class Kind { literal, word, sign };
@@ -73,7 +73,9 @@ class Tokens {
       }
       return;
     }
-    const auto end = std::find_if_not(rest_.begin(), rest_.end(), isOfWord);
+    const bool isNumber = std::isdigit(static_cast<unsigned char>(rest_.front())) != 0;
+    const auto end =
+        std::find_if_not(rest_.begin(), rest_.end(), [isNumber](char c) { return isOfWord(c) || (isNumber && c == kDigitSeparator); });
     const auto length = static_cast<std::size_t>(end - rest_.begin());
     tokens_.push_back(
         {length == 0 ? Token::Kind::sign : Token::Kind::word, std::string(rest_.substr(0, std::max<std::size_t>(length, 1))), line});
@@ -84,11 +86,12 @@ class Tokens {
     const char quote = rest_.front();
     advance(1);
     std::string text;
-    while (!rest_.empty() && rest_.front() != quote) {
+    while (rest_.size() > 1 && rest_.front() != quote) {
       if (rest_.front() == '\\') advance(1);
       text += rest_.front();
       advance(1);
     }
+    if (rest_.empty() || rest_.front() != quote) throw std::invalid_argument("a literal without an end");
     advance(1);
     return text;
   }
@@ -98,13 +101,38 @@ class Tokens {
   std::vector<Token> tokens_;
 };
 
+bool hasLevel(const Token& token) { return token.kind == Token::Kind::literal && qxTypeOfLevel(token.text); }
+
 // A level alone is what messages are recognised by, and none itself.
-bool isMessage(const Token& token) {
-  return token.kind == Token::Kind::literal && qxTypeOfLevel(token.text) && !token.text.ends_with("] ");
-}
+bool isMessage(const Token& token) { return hasLevel(token) && !token.text.ends_with("] "); }
 
 bool isSign(const Token& token, std::string_view signs) {
   return token.kind == Token::Kind::sign && token.text.size() == 1 && signs.find(token.text.front()) != signs.npos;
+}
+
+bool isWord(const Token& token, std::string_view word) { return token.kind == Token::Kind::word && token.text == word; }
+
+bool isInSum(const std::vector<Token>& tokens, std::size_t text) {
+  return (text > 0 && isSign(tokens[text - 1], "+")) || (text + 1 < tokens.size() && isSign(tokens[text + 1], "+"));
+}
+
+// "log.write(", however the log is called and come by.
+bool isWriteToALog(const std::vector<Token>& tokens, std::size_t at) {
+  if (!isWord(tokens[at], "write") || at == 0 || !isSign(tokens[at - 1], ".>")) return false;
+  std::size_t receiver = at - 1;
+  while (receiver > 0 && tokens[receiver].kind == Token::Kind::sign) --receiver;
+  return isWord(tokens[receiver], "log") || isWord(tokens[receiver], "log_") || isWord(tokens[receiver], "defaultLog");
+}
+
+// Whether the text is among what a function is called with.
+bool isInCall(const std::vector<Token>& tokens, std::size_t text) {
+  int depth = 0;
+  for (std::size_t i = text; i-- > 0;) {
+    if (isSign(tokens[i], ")]}")) ++depth;
+    if (isSign(tokens[i], "([{") && depth-- == 0) return isSign(tokens[i], "(") && i > 0 && tokens[i - 1].kind == Token::Kind::word;
+    if (depth == 0 && isSign(tokens[i], ";")) return false;
+  }
+  return false;
 }
 
 // The values that follow the text in a call: a literal, or nothing where only the running program knows it.
@@ -161,13 +189,17 @@ std::vector<ScannedMessage> messagesIn(std::string_view source) {
   const std::vector<Token>& tokens = scanned.all();
   std::vector<ScannedMessage> messages;
   for (std::size_t i = 0; i < tokens.size(); ++i) {
+    const auto refuse = [line = tokens[i].line](const std::string& why) {
+      throw std::invalid_argument("line " + std::to_string(line) + ": " + why);
+    };
+    if (isWriteToALog(tokens, i)) refuse("a message that is not made of a format");
+    if (hasLevel(tokens[i]) && isInSum(tokens, i)) refuse("a message that is put together");
     if (!isMessage(tokens[i])) continue;
-    const bool isInCall =
-        i >= 2 && isSign(tokens[i - 1], "(") && tokens[i - 2].kind == Token::Kind::word && tokens[i - 2].text == kLoggingCall;
     try {
-      messages.push_back({isInCall ? filled(tokens[i].text, valuesAfter(tokens, i)) : withoutKinds(tokens[i].text), tokens[i].line});
+      messages.push_back(
+          {isInCall(tokens, i) ? filled(tokens[i].text, valuesAfter(tokens, i)) : withoutKinds(tokens[i].text), tokens[i].line});
     } catch (const std::invalid_argument& problem) {
-      throw std::invalid_argument("line " + std::to_string(tokens[i].line) + ": " + problem.what());
+      refuse(problem.what());
     }
   }
   return messages;
