@@ -310,6 +310,22 @@ TEST_F(ConfinedApplication, EndsWithWhoStartedIt) {
   EXPECT_EQ(process.status(), 128 + SIGKILL);
 }
 
+constexpr rlim_t kFewSignals = 150;
+
+rlim_t pendingSignalsOfALaunch() {
+  rlimit own{};
+  EXPECT_EQ(::getrlimit(RLIMIT_SIGPENDING, &own), 0);
+  return std::min<rlim_t>(own.rlim_cur / 2, kConfinedPendingSignals);
+}
+
+// Of this process, and so of what it launches from now on: a machine with little memory begins with few.
+void lowerPendingSignals(rlim_t most) {
+  rlimit own{};
+  ASSERT_EQ(::getrlimit(RLIMIT_SIGPENDING, &own), 0);
+  own.rlim_cur = most;
+  ASSERT_EQ(::setrlimit(RLIMIT_SIGPENDING, &own), 0);
+}
+
 // What the user may have is shared with the daemon.
 TEST_F(ConfinedApplication, IsLimited) {
   rlimit processes{};
@@ -323,7 +339,9 @@ TEST_F(ConfinedApplication, IsLimited) {
   EXPECT_EQ(attempt(bundle, "limit", "open files"), "300 of " + openFiles) << "what is asked for by default stays";
   EXPECT_EQ(attempt(bundle, "limit", "processes"), std::to_string(std::min<rlim_t>(processes.rlim_cur / 2, kApplicationProcesses)));
   EXPECT_EQ(attempt(bundle, "limit", "memory"), std::to_string(RLIM_INFINITY));
-  EXPECT_EQ(attempt(bundle, "limit", "pending signals"), std::to_string(kConfinedPendingSignals));
+  EXPECT_EQ(attempt(bundle, "limit", "pending signals"), std::to_string(pendingSignalsOfALaunch()));
+  lowerPendingSignals(2 * kFewSignals);
+  EXPECT_EQ(attempt(bundle, "limit", "pending signals"), std::to_string(kFewSignals));
 }
 
 class ConfinedExtension : public ConfinedTest {
@@ -364,7 +382,9 @@ TEST_F(ConfinedExtension, IsLimited) {
   EXPECT_EQ(outcomes.at("limit processes"), std::to_string(kExtensionProcesses));
   EXPECT_EQ(outcomes.at("limit memory"), std::to_string(kExtensionMemory.value_or(RLIM_INFINITY)));
   EXPECT_EQ(outcomes.at("limit open files"), std::to_string(kExtensionOpenFiles));
-  EXPECT_EQ(outcomes.at("limit pending signals"), std::to_string(kConfinedPendingSignals));
+  EXPECT_EQ(outcomes.at("limit pending signals"), std::to_string(pendingSignalsOfALaunch()));
+  lowerPendingSignals(2 * kFewSignals);
+  EXPECT_EQ(run({"limit", "pending signals"}).at("limit pending signals"), std::to_string(kFewSignals));
 }
 
 // Counted within its own confinement: the user's other processes take nothing away.

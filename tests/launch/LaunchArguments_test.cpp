@@ -157,6 +157,21 @@ TEST_F(LaunchArguments, LimitAnExtensionAndAnApplication) {
   }
 }
 
+// The kernel counts them for the user, wherever his processes are.
+TEST_F(LaunchArguments, GiveNoLaunchMoreThanHalfOfThePendingSignalsThatItsUserMayHave) {
+  for (const LaunchKind kind : {LaunchKind::application, LaunchKind::extension}) {
+    subject_.kind = kind;
+    host_.pendingSignals = kConfinedPendingSignals * 2 + 2;
+    EXPECT_EQ(confinePolicy(subject_, host_).pendingSignals, kConfinedPendingSignals);
+    host_.pendingSignals = 3801;
+    EXPECT_EQ(confinePolicy(subject_, host_).pendingSignals, 1900);
+    host_.pendingSignals = 1;
+    EXPECT_EQ(confinePolicy(subject_, host_).pendingSignals, 1);
+    host_.pendingSignals = std::nullopt;
+    EXPECT_EQ(confinePolicy(subject_, host_).pendingSignals, kConfinedPendingSignals);
+  }
+}
+
 TEST_F(LaunchArguments, GiveAnApplicationNoMoreThanHalfOfWhatItsUserMayHave) {
   host_.processes = kApplicationProcesses * 2 + 2;
   host_.openFiles = kApplicationOpenFiles * 2 + 2;

@@ -75,6 +75,24 @@ TEST_F(SystemCalls, OfLeasesAreLeftToExtensions) {
   EXPECT_EQ(insideAnExtension(leases), all(leases, "ok"));
 }
 
+// It keeps away who would write, beside any number that read: that tells a provider nothing which it needs.
+TEST_F(SystemCalls, OfLeasesThoseForReadingAreLeftToNobody) {
+  const Names leases = {"lease-for-reading", "lease-for-reading-with-high-halves"};
+  EXPECT_EQ(outside(leases), all(leases, "ok"));
+  EXPECT_EQ(inside(leases), all(leases, "EINVAL"));
+  EXPECT_EQ(insideAnExtension(leases), all(leases, "EINVAL"));
+  // A lease that it has it gives back: there is none here, which is what the kernel says of it.
+  EXPECT_EQ(insideAnExtension({"lease-given-back"}), all({"lease-given-back"}, "EAGAIN"));
+}
+
+// Not every kernel has them. Outside, each looks at the file first.
+TEST_F(SystemCalls, OfDelegationsAreLeftToNobody) {
+  const Names delegations = {"delegation", "delegation-with-a-high-half"};
+  EXPECT_EQ(outside(delegations), all(delegations, "EBADF"));
+  EXPECT_EQ(inside(delegations), all(delegations, "EINVAL"));
+  EXPECT_EQ(insideAnExtension(delegations), all(delegations, "EINVAL"));
+}
+
 TEST_F(SystemCalls, OfFilesOtherThanLeasesAreMade) {
   const Names others = {"lease-asked-for", "lock", "lock-of-description"};
   EXPECT_EQ(inside(others), all(others, "ok"));
@@ -99,6 +117,14 @@ TEST_F(SystemCalls, MakeSocketsOfTheNetworkAndOfThisMachineOnly) {
   const auto expected = outside(others);  // a machine may have no IPv6
   EXPECT_EQ(expected.at("unix"), "ok");
   EXPECT_EQ(inside(others), expected);
+}
+
+// A socket of ciphers takes a key of the user's by its number, which no keyring call is needed for.
+TEST_F(SystemCalls, MakeNoSocketThatTakesAKey) {
+  const Names ciphers = {"cipher", "cipher-with-a-high-half"};
+  EXPECT_EQ(outside(ciphers), all(ciphers, "EINVAL"));
+  EXPECT_EQ(inside(ciphers), all(ciphers, "EAFNOSUPPORT"));
+  EXPECT_EQ(insideAnExtension(ciphers), all(ciphers, "EAFNOSUPPORT"));
 }
 
 TEST_F(SystemCalls, TypeIntoNoTerminalAndAskOneWhatItIs) {

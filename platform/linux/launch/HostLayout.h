@@ -17,6 +17,7 @@ struct HostLayout {
   int landlockLevel = 0;
   std::optional<std::uint64_t> processes;  // this process's own limits, which a launch inherits; none where there is no limit
   std::optional<std::uint64_t> openFiles;
+  std::optional<std::uint64_t> pendingSignals;
   std::string bubblewrap;  // absolute path; empty when it is not installed
   std::string helper;      // absolute path of docuvend-confine; empty when it is not found
 

@@ -38,7 +38,7 @@ void setLimits(ConfinePolicy& policy, LaunchKind kind, const HostLayout& host) {
     policy.processes = isExtension ? kExtensionProcesses : halfOf(host.processes, kApplicationProcesses);
   }
   policy.openFiles = isExtension ? kExtensionOpenFiles : halfOf(host.openFiles, kApplicationOpenFiles);
-  policy.pendingSignals = kConfinedPendingSignals;
+  policy.pendingSignals = halfOf(host.pendingSignals, kConfinedPendingSignals);
   if (isExtension) policy.memory = kExtensionMemory;
 }
 

@@ -33,7 +33,8 @@ inline constexpr std::uint64_t kExtensionOpenFiles = 512;
 // together leave no more than this unread (and what they send at the same moment), since whoever is at his limit may send no more.
 inline constexpr std::uint64_t kApplicationOpenFiles = 4096;
 
-// Signals and timers that a launch may have pending: the user's other processes have the rest.
+// Signals and timers that a launch may have pending. The kernel counts them for the user, in whatever confinement they are, so it is never
+// more than half of what the user who launches may have, of an extension's launch too: on a small machine that is fewer.
 inline constexpr std::uint64_t kConfinedPendingSignals = 4096;
 
 // Where docuvend-confine is found inside.

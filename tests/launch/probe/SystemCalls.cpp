@@ -25,12 +25,16 @@
 #include <functional>
 #include <map>
 
+#include "platform/linux/base/kernel.h"
+
 namespace docuvend::probe {
 namespace {
 
 // What the kernel does not look at where it takes an int.
 constexpr long kHighHalf = 0x5EC5L << 32U;
 constexpr int kX32Bit = 0x40000000;
+// Of a socket: the kernel says so before it looks whether it has the family.
+constexpr int kNoType = 0xF;
 constexpr int kOtherMachine = 200;  // how a child ends
 
 std::string outcome(long result) { return result >= 0 ? "ok" : ::strerrorname_np(errno); }
@@ -42,7 +46,17 @@ int ownFile() {
 }
 int tcpSocket() { return ::socket(AF_INET, SOCK_STREAM | SOCK_CLOEXEC, 0); }
 
-long lease(long command) { return ::syscall(SYS_fcntl, ownFile(), command, F_WRLCK); }
+long lease(long command, long kind) { return ::syscall(SYS_fcntl, ownFile(), command, kind); }
+
+// A lease for reading is given to who has the file open for reading alone.
+long leaseForReading(long command, long kind) {
+  char name[] = "file-XXXXXX";
+  ::close(::mkostemp(name, O_CLOEXEC));
+  return ::syscall(SYS_fcntl, ::open(name, O_RDONLY | O_CLOEXEC), command, kind);
+}
+
+// Of no file, which says that it is none, whether or not the kernel has the command.
+long delegation(long command) { return ::syscall(SYS_fcntl, -1, command, nullptr); }
 
 long lockFile(int command) {
   struct flock whole {};
@@ -123,9 +137,14 @@ const Calls& calls() {
       {"io_uring_setup", setUpRing},
       {"io_uring_enter", [] { return ::syscall(SYS_io_uring_enter, -1, 0, 0, 0, nullptr, 0); }},
       {"io_uring_register", [] { return ::syscall(SYS_io_uring_register, -1, 0, nullptr, 0); }},
-      {"lease", [] { return lease(F_SETLEASE); }},
-      {"lease-with-a-high-half", [] { return lease(kHighHalf | F_SETLEASE); }},
-      {"lease-asked-for", [] { return lease(F_GETLEASE); }},
+      {"lease", [] { return lease(F_SETLEASE, F_WRLCK); }},
+      {"lease-with-a-high-half", [] { return lease(kHighHalf | F_SETLEASE, F_WRLCK); }},
+      {"lease-for-reading", [] { return leaseForReading(F_SETLEASE, F_RDLCK); }},
+      {"lease-for-reading-with-high-halves", [] { return leaseForReading(kHighHalf | F_SETLEASE, kHighHalf | F_RDLCK); }},
+      {"lease-given-back", [] { return lease(F_SETLEASE, F_UNLCK); }},
+      {"lease-asked-for", [] { return lease(F_GETLEASE, 0); }},
+      {"delegation", [] { return delegation(linux_platform::kernel::kSetDelegation); }},
+      {"delegation-with-a-high-half", [] { return delegation(kHighHalf | linux_platform::kernel::kSetDelegation); }},
       {"lock", [] { return lockFile(F_SETLK); }},
       {"lock-of-description", [] { return lockFile(F_OFD_SETLK); }},
       {"linger", [] { return setLinger(SOL_SOCKET, SO_LINGER); }},
@@ -135,6 +154,8 @@ const Calls& calls() {
       {"same-number-as-linger", [] { return setOne(IPPROTO_IP, SO_LINGER); }},
       {"vsock", [] { return openSocket(AF_VSOCK, SOCK_STREAM); }},
       {"vsock-with-a-high-half", [] { return openSocket(kHighHalf | AF_VSOCK, SOCK_STREAM); }},
+      {"cipher", [] { return openSocket(AF_ALG, kNoType); }},
+      {"cipher-with-a-high-half", [] { return openSocket(kHighHalf | AF_ALG, kNoType); }},
       {"unix", [] { return openSocket(AF_UNIX, SOCK_STREAM); }},
       {"inet", [] { return openSocket(AF_INET, SOCK_STREAM); }},
       {"inet6", [] { return openSocket(AF_INET6, SOCK_DGRAM); }},

@@ -20,7 +20,7 @@ enum class PathAccess {
   device,     // one device file: reading and writing
 };
 
-// Whether a process may take leases on files, which hold up everybody else who opens them.
+// Whether a process may take leases for writing on files, which hold up everybody else who opens them. Other leases nobody may take.
 enum class Leases { refused, taken };
 
 struct ConfinePolicy {

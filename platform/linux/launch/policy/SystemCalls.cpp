@@ -5,8 +5,11 @@
 //   io_uring             makes calls without making them: what it does passes no filter. Libraries fall back to ordinary calls.
 //   leases, delegations  of a file hold up everybody else who opens it, and who may only read it may take one: a bundle of itself, a
 //                        consumer of its documents. EINVAL is what file systems without leases say. A provider's documents are its own,
-//                        and a lease tells it that nobody has one open: it may have them.
+//                        and a lease for writing tells it that nobody has one open: that one it may have. One for reading is given beside
+//                        any number of readers, holds up who writes, and tells nothing of use. A delegation holds up renaming and
+//                        changes of mode as well, which are the daemon's own acts.
 //   SO_LINGER            makes the close of a TCP socket wait, in whatever process that happens: the socket can be sent away.
+//   AF_ALG               takes a key of the user's keyrings by its number, without a call about keys.
 //   AF_VSOCK             is another way out than the network: it leads to the host of a virtual machine, or to its guests.
 //   ioctls of files      Landlock knows those of devices alone. A key of an encrypted directory opens and closes it for all of the user's
 //                        processes, and counts as one of his keys; verity makes a file unwritable for ever, for whoever may read it; and
@@ -89,13 +92,13 @@ std::vector<Refusal> refusals(Leases leases) {
       {SYS_io_uring_register, ENOSYS, {}},
       {SYS_fanotify_init, ENOSYS, {}},
       {SYS_setsockopt, ENOPROTOOPT, {{1, SOL_SOCKET}, {2, SO_LINGER}}},
+      {SYS_socket, EAFNOSUPPORT, {{0, AF_ALG}}},
       {SYS_socket, EAFNOSUPPORT, {{0, AF_VSOCK}}},
+      {SYS_fcntl, EINVAL, {{1, F_SETLEASE}, {2, F_RDLCK}}},
+      {SYS_fcntl, EINVAL, {{1, kernel::kSetDelegation}}},
   };
   for (const std::uint32_t request : kRefusedRequests) all.push_back({SYS_ioctl, EPERM, {{1, request}}});
-  if (leases == Leases::refused) {
-    all.push_back({SYS_fcntl, EINVAL, {{1, F_SETLEASE}}});
-    all.push_back({SYS_fcntl, EINVAL, {{1, kernel::kSetDelegation}}});
-  }
+  if (leases == Leases::refused) all.push_back({SYS_fcntl, EINVAL, {{1, F_SETLEASE}}});
   return all;
 }
 
