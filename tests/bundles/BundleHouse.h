@@ -77,7 +77,7 @@ class BundleHouse {
     writeExecutable(directory + "/program", "#!/bin/sh\n");
   }
 
-  [[nodiscard]] BundleMap scan() { return BundleScan(paths, propertyLists, log.defaultLog()).run(); }
+  [[nodiscard]] BundleMap scan() { return BundleScan(paths, propertyLists, log.defaultLog()).run().bundles; }
 
   Paths paths;
   LinuxPropertyLists propertyLists;

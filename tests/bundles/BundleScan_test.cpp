@@ -74,13 +74,13 @@ TEST_F(BundleScanTest, ALinkIsNoBundle) {
 TEST_F(BundleScanTest, SaysTheSameAgainOnlyAfterItWasMended) {
   BundleScan scan(house_.paths, house_.propertyLists, house_.log.defaultLog());
   std::filesystem::create_directories(user("bad"));
-  EXPECT_THAT(scan.run(), IsEmpty());
-  EXPECT_THAT(scan.run(), IsEmpty());
+  EXPECT_THAT(scan.run().bundles, IsEmpty());
+  EXPECT_THAT(scan.run().bundles, IsEmpty());
   EXPECT_EQ(house_.log.texts().size(), 1U);
   BundleHouse::install(user("bad"), "org.bad");
-  EXPECT_EQ(scan.run().size(), 1U);
+  EXPECT_EQ(scan.run().bundles.size(), 1U);
   std::filesystem::remove(user("bad") + "/Info.plist");
-  EXPECT_THAT(scan.run(), IsEmpty());
+  EXPECT_THAT(scan.run().bundles, IsEmpty());
   EXPECT_EQ(house_.log.texts().size(), 2U);
 }
 
@@ -88,18 +88,18 @@ TEST_F(BundleScanTest, AnUnsettledBundleCountsAsWhatItWas) {
   BundleScan scan(house_.paths, house_.propertyLists, house_.log.defaultLog());
   BundleHouse::install(user("a"), "org.a");
   BundleHouse::install(user("b"), "org.b");
-  const std::string before = scan.run().at("org.a").version;
+  const std::string before = scan.run().bundles.at("org.a").version;
   BundleHouse::write(user("a") + "/Info.plist", "half");
   fs::remove_all(user("b"));
   for (int look = 0; look < 2; ++look) {
-    const auto bundles = scan.run({user("a"), user("b")});
+    const auto bundles = scan.run({user("a"), user("b")}).bundles;
     ASSERT_TRUE(bundles.contains("org.a"));
     EXPECT_EQ(bundles.at("org.a").version, before);
     EXPECT_FALSE(bundles.contains("org.b")) << "what is not there any more counts as nothing";
   }
   EXPECT_THAT(house_.log.texts(), IsEmpty());
-  EXPECT_THAT(scan.run(), IsEmpty());
-  EXPECT_THAT(scan.run({user("a")}), IsEmpty()) << "what it was last is no bundle";
+  EXPECT_THAT(scan.run().bundles, IsEmpty());
+  EXPECT_THAT(scan.run({user("a")}).bundles, IsEmpty()) << "what it was last is no bundle";
   EXPECT_EQ(house_.log.texts().size(), 1U);
 }
 
@@ -107,9 +107,9 @@ TEST_F(BundleScanTest, AnUnsettledBundleThatWasNeverSeenIsPassedOverInSilence) {
   BundleHouse::install(user("a"), "org.a");
   fs::create_directories(user("b"));
   BundleScan scan(house_.paths, house_.propertyLists, house_.log.defaultLog());
-  EXPECT_THAT(scan.run({user("a"), user("b")}), IsEmpty());
+  EXPECT_THAT(scan.run({user("a"), user("b")}).bundles, IsEmpty());
   EXPECT_THAT(house_.log.texts(), IsEmpty());
-  EXPECT_EQ(scan.run({user("b")}).size(), 1U);
+  EXPECT_EQ(scan.run({user("b")}).bundles.size(), 1U);
 }
 
 TEST_F(BundleScanTest, TheDirectoriesOfABundleAreThoseNearestFirstAndBounded) {
@@ -118,9 +118,10 @@ TEST_F(BundleScanTest, TheDirectoriesOfABundleAreThoseNearestFirstAndBounded) {
   fs::create_directories(bundle + "/w");
   fs::create_directory_symlink(house_.root(), bundle + "/link");
   BundleHouse::write(bundle + "/file", "");
-  EXPECT_THAT(directoriesOfBundle(bundle), ElementsAre(bundle, bundle + "/w", bundle + "/x", bundle + "/x/y", bundle + "/x/y/z"));
+  EXPECT_THAT(std::get<std::vector<std::string>>(directoriesOfBundle(bundle)),
+              ElementsAre(bundle, bundle + "/w", bundle + "/x", bundle + "/x/y", bundle + "/x/y/z"));
   for (std::size_t i = 0; i < kMostBundleDirectories; ++i) fs::create_directory(bundle + "/x/" + std::to_string(i));
-  const auto directories = directoriesOfBundle(bundle);
+  const auto directories = std::get<std::vector<std::string>>(directoriesOfBundle(bundle));
   EXPECT_EQ(directories.size(), kMostBundleDirectories);
   EXPECT_EQ(directories[2], bundle + "/x");
 }

@@ -6,69 +6,19 @@
 #include <algorithm>
 #include <atomic>
 #include <chrono>
-#include <condition_variable>
-#include <mutex>
 #include <thread>
 #include <utility>
 
 #include "platform/linux/bundles/BundleInstaller.h"
-#include "tests/bundles/BundleHouse.h"
-#include "tests/bundles/InterposedWatches.h"
+#include "tests/bundles/RegistryTest.h"
 
 namespace docuvend::linux_platform {
 namespace {
 
-// Only a registry that notices nothing waits so long.
-constexpr std::chrono::seconds kLongestWait{30};
 constexpr int kMostTries = 20;
 
-class Changes {
- public:
-  void note() {
-    const std::lock_guard lock(mutex_);
-    ++count_;
-    changed_.notify_all();
-  }
-  [[nodiscard]] int count() {
-    const std::lock_guard lock(mutex_);
-    return count_;
-  }
-  // Waits until the condition holds, looking after each change.
-  template <class Condition>
-  [[nodiscard]] bool waitFor(Condition condition) {
-    std::unique_lock lock(mutex_);
-    return changed_.wait_for(lock, kLongestWait, condition);
-  }
-
- private:
-  std::mutex mutex_;
-  std::condition_variable changed_;
-  int count_ = 0;
-};
-
-class InstalledBundlesTest : public ::testing::Test {
+class InstalledBundlesTest : public RegistryTest {
  protected:
-  void start() {
-    bundles_.emplace(house_.paths, house_.propertyLists, house_.log.defaultLog());
-    bundles_->onChange([this] { changes_.note(); });  // the fixture outlives the registry
-  }
-  [[nodiscard]] std::string user(const std::string& name) const { return house_.paths.userBundles + "/" + name; }
-  [[nodiscard]] bool appears(const std::string& identifier) {
-    return changes_.waitFor([this, &identifier] { return bundles_->find(identifier).has_value(); });
-  }
-  [[nodiscard]] bool disappears(const std::string& identifier) {
-    return changes_.waitFor([this, &identifier] { return !bundles_->find(identifier).has_value(); });
-  }
-
-  template <class Condition>
-  static bool eventually(Condition condition) {
-    const auto deadline = std::chrono::steady_clock::now() + kLongestWait;
-    while (!condition()) {
-      if (std::chrono::steady_clock::now() > deadline) return false;
-      std::this_thread::yield();
-    }
-    return true;
-  }
   using Clock = std::chrono::steady_clock;
   // Writes a bundle as a slow copy does, its entitlements last. True when there were pauses, since the first change, in which it may have
   // been looked at.
@@ -90,11 +40,7 @@ class InstalledBundlesTest : public ::testing::Test {
     return longest > Settling::kQuietInPlace / 2;
   }
 
-  BundleHouse house_;
-  Changes changes_;
   std::atomic<bool> isSeenInPart_ = false;
-  InterposedWatches watches_;
-  std::optional<InstalledBundles> bundles_;  // calls back until its end, so last
 };
 
 TEST_F(InstalledBundlesTest, KnowsWhatIsInstalledFromItsCreationOn) {
@@ -324,14 +270,8 @@ TEST_F(InstalledBundlesTest, NoticesThatItsDirectoryIsReplaced) {
 }
 
 // What happens without watches is seen all the same, and when there are some again it is seen by them.
-class InstalledBundlesWithoutWatches : public InstalledBundlesTest,
-                                       public ::testing::WithParamInterface<std::atomic<bool> InterposedWatches::*> {
+class InstalledBundlesWithoutWatches : public RegistryTest, public ::testing::WithParamInterface<std::atomic<bool> InterposedWatches::*> {
  protected:
-  [[nodiscard]] long logged(const fake_platform::FakeLogEntry& entry) const {
-    const auto entries = house_.log.entries();
-    return std::count(entries.begin(), entries.end(), entry);
-  }
-
   const fake_platform::FakeLogEntry begins_{QXLogType::fault,
                                             "[ERROR] Not every bundle directory can be watched, so they are looked at every 3 seconds."};
   const fake_platform::FakeLogEntry ends_{QXLogType::defaultType, "[NOTICE] Every bundle directory is watched again."};

@@ -65,9 +65,11 @@ int run(const std::vector<std::string>& arguments) {
   HeldLog log;
   LinuxPropertyLists propertyLists;
   BundleScan scan(std::get<Paths>(paths), propertyLists, log);
-  const auto bundles = scan.run();
-  const auto bundle = bundles.find(arguments[0]);
-  if (bundle == bundles.end()) {
+  const auto look = scan.run();
+  // A bundle that was not seen may come before the one that was, or let it belong to a group.
+  if (look.notSeen) return fail(kCannotLaunch, look.notSeen->description());
+  const auto bundle = look.bundles.find(arguments[0]);
+  if (bundle == look.bundles.end()) {
     for (const auto& line : log.lines()) complain(line);
     return fail(kNoSuchBundle, "no bundle " + arguments[0] + " is installed");
   }

@@ -20,6 +20,7 @@
 #include "platform/linux/bundles/BundleParser.h"
 #include "platform/linux/bundles/BundleScan.h"
 #include "platform/linux/bundles/GroupMembership.h"
+#include "platform/linux/bundles/Seen.h"
 #include "platform/linux/bundles/UserBundleDirectory.h"
 
 namespace docuvend::linux_platform {
@@ -36,14 +37,18 @@ Sound examine(const std::string& directory, const std::string& shownAs, QXProper
   if (const auto* problem = std::get_if<BundleProblem>(&parsed)) {
     return bundleError(BundleErrorCode::noBundle, shownAs + " is no bundle: " + problem->text + ".");
   }
+  if (auto* error = std::get_if<QXError>(&parsed)) return std::move(*error);
   return std::get<ParsedBundle>(std::move(parsed));
 }
 
 // The names of the directories of `root` that hold a bundle of that identifier, the one that counts first.
-std::vector<std::string> copiesOf(const std::string& identifier, const std::string& root, QXPropertyLists& propertyLists) {
+Seen<std::vector<std::string>> copiesOf(const std::string& identifier, const std::string& root, QXPropertyLists& propertyLists) {
   std::vector<std::string> result;
-  for (const std::string& directory : bundleDirectories(root)) {
-    const auto parsed = parseBundle(directory, propertyLists);
+  auto directories = bundleDirectories(root);
+  if (auto* error = std::get_if<QXError>(&directories)) return std::move(*error);
+  for (const std::string& directory : std::get<std::vector<std::string>>(directories)) {
+    auto parsed = parseBundle(directory, propertyLists);
+    if (auto* error = std::get_if<QXError>(&parsed)) return std::move(*error);
     const auto* bundle = std::get_if<ParsedBundle>(&parsed);
     if (bundle != nullptr && bundle->bundle.identifier == identifier) result.push_back(nameOf(directory));
   }
@@ -51,31 +56,40 @@ std::vector<std::string> copiesOf(const std::string& identifier, const std::stri
 }
 
 std::optional<QXError> refuseTheSystems(const std::string& identifier, const Paths& paths, QXPropertyLists& propertyLists) {
-  if (copiesOf(identifier, paths.systemBundles, propertyLists).empty()) return std::nullopt;
+  auto copies = copiesOf(identifier, paths.systemBundles, propertyLists);
+  if (auto* error = std::get_if<QXError>(&copies)) return std::move(*error);
+  if (std::get<std::vector<std::string>>(copies).empty()) return std::nullopt;
   return bundleError(BundleErrorCode::notPermitted, "The bundle " + identifier + " is the system's; only the system changes it.");
 }
 
 // What would be installed beside the bundle, as the registry would take it.
-std::vector<ParsedBundle> bundlesWith(const ParsedBundle& bundle, const Paths& paths, QXPropertyLists& propertyLists) {
+Seen<std::vector<ParsedBundle>> bundlesWith(const ParsedBundle& bundle, const Paths& paths, QXPropertyLists& propertyLists) {
   std::vector<ParsedBundle> result{bundle};
   for (const auto& [root, origin] :
        {std::pair(paths.systemBundles, BundleOrigin::system), std::pair(paths.userBundles, BundleOrigin::user)}) {
-    for (const std::string& directory : bundleDirectories(root)) {
+    auto directories = bundleDirectories(root);
+    if (auto* error = std::get_if<QXError>(&directories)) return std::move(*error);
+    for (const std::string& directory : std::get<std::vector<std::string>>(directories)) {
       auto parsed = parseBundle(directory, propertyLists);
+      if (auto* error = std::get_if<QXError>(&parsed)) return std::move(*error);
       auto* other = std::get_if<ParsedBundle>(&parsed);
       if (other == nullptr) continue;
       other->origin = origin;
       const bool isNew = std::none_of(result.begin(), result.end(),
                                       [other](const ParsedBundle& known) { return known.bundle.identifier == other->bundle.identifier; });
-      if (isNew && !distrustOf(*other)) result.push_back(std::move(*other));
+      if (!isNew) continue;
+      auto distrusted = distrustOf(*other);
+      if (auto* error = std::get_if<QXError>(&distrusted)) return std::move(*error);
+      if (!std::get<std::optional<BundleProblem>>(distrusted)) result.push_back(std::move(*other));
     }
   }
   return result;
 }
 
 std::optional<QXError> refuseWhatIsAnothers(const ParsedBundle& bundle, const Paths& paths, QXPropertyLists& propertyLists) {
-  const auto bundles = bundlesWith(bundle, paths, propertyLists);
-  const GroupMembership membership(bundles);
+  auto bundles = bundlesWith(bundle, paths, propertyLists);
+  if (auto* error = std::get_if<QXError>(&bundles)) return std::move(*error);
+  const GroupMembership membership(std::get<std::vector<ParsedBundle>>(bundles));
   const std::string& identifier = bundle.bundle.identifier;
   for (const std::string& group : bundle.wantedGroups) {
     const auto refusal = membership.refusal(identifier, group);
@@ -148,11 +162,15 @@ class HeldLists {
 // What lies at the bundle's own name without being one of its copies, put there by other means. A broken bundle is replaced, anything that
 // means something stays.
 std::variant<Occupant, QXError> occupantOf(const std::string& path, QXPropertyLists& propertyLists) {
-  std::error_code error;
-  const auto type = fs::symlink_status(path, error).type();
-  if (type == fs::file_type::not_found) return Occupant::none;
-  if (type == fs::file_type::directory && std::holds_alternative<BundleProblem>(parseBundle(path, propertyLists))) {
-    return Occupant::brokenBundle;
+  struct stat status {};
+  if (::lstat(path.c_str(), &status) != 0) {
+    if (errno == ENOENT) return Occupant::none;
+    return notSeen(path, errno);
+  }
+  if (S_ISDIR(status.st_mode)) {
+    auto parsed = parseBundle(path, propertyLists);
+    if (std::holds_alternative<BundleProblem>(parsed)) return Occupant::brokenBundle;
+    if (auto* error = std::get_if<QXError>(&parsed)) return std::move(*error);
   }
   return bundleError(BundleErrorCode::inTheWay, path + " is in the way.");
 }
@@ -162,6 +180,7 @@ std::variant<Occupant, QXError> occupantOf(const std::string& path, QXPropertyLi
 std::variant<InstalledBundle, QXError> installBundle(const std::string& directory, const Paths& paths, QXPropertyLists& propertyLists) {
   std::error_code error;
   const fs::path source = fs::canonical(directory, error);
+  if (error && !isAnswer(error.value())) return notSeen(directory, error.value());
   if (error) return bundleError(BundleErrorCode::noBundle, directory + " cannot be opened: " + error.message() + ".");
   // What can be refused at once is not copied first. What counts is the copy.
   auto examined = examine(source.string(), directory, propertyLists);
@@ -181,7 +200,9 @@ std::variant<InstalledBundle, QXError> installBundle(const std::string& director
   const std::string& identifier = bundle.bundle.identifier;
   if (auto refusal = refuseTheSystems(identifier, paths, propertyLists)) return *std::move(refusal);
   if (auto refusal = refuseWhatIsAnothers(bundle, paths, propertyLists)) return *std::move(refusal);
-  const auto older = copiesOf(identifier, place.path(), propertyLists);
+  auto found = copiesOf(identifier, place.path(), propertyLists);
+  if (auto* failure = std::get_if<QXError>(&found)) return std::move(*failure);
+  const auto& older = std::get<std::vector<std::string>>(found);
   if (older.empty()) {
     const auto occupant = occupantOf(place.path() + "/" + identifier, propertyLists);
     if (const auto* refusal = std::get_if<QXError>(&occupant)) return *refusal;
@@ -200,13 +221,15 @@ std::variant<InstalledBundle, QXError> installBundle(const std::string& director
 std::optional<QXError> uninstallBundle(const std::string& identifier, const Paths& paths, QXPropertyLists& propertyLists) {
   if (auto refusal = refuseTheSystems(identifier, paths, propertyLists)) return refusal;
   const QXError unknown = bundleError(BundleErrorCode::notFound, "No bundle " + identifier + " is installed.");
-  std::error_code error;
-  if (!fs::exists(paths.userBundles, error)) return unknown;
+  struct stat status {};
+  if (::stat(paths.userBundles.c_str(), &status) != 0) return isAnswer(errno) ? unknown : notSeen(paths.userBundles, errno);
   auto opened = UserBundleDirectory::open(paths, UserBundleDirectory::Absence::isAnError);
   if (auto* failure = std::get_if<QXError>(&opened)) return std::move(*failure);
   const auto& place = std::get<UserBundleDirectory>(opened);
   const HeldLists lists(place, identifier);
-  auto copies = copiesOf(identifier, place.path(), propertyLists);
+  auto found = copiesOf(identifier, place.path(), propertyLists);
+  if (auto* failure = std::get_if<QXError>(&found)) return std::move(*failure);
+  auto& copies = std::get<std::vector<std::string>>(found);
   const bool isNamed = std::find(copies.begin(), copies.end(), identifier) != copies.end();
   if (lists.areLeased() && !isNamed) copies.push_back(identifier);
   if (copies.empty()) return unknown;

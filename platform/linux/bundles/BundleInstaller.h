@@ -39,7 +39,8 @@ struct InstalledBundle {
 };
 
 // Installs the bundle that the directory holds, which stays as it is, or updates it if its identifier is installed. An error of
-// kBundleErrorDomain (BundleErrors.h) when the bundle cannot be had, of the system's when a call failed. The old state is then whole, or,
+// kBundleErrorDomain (BundleErrors.h) when the bundle cannot be had, of the system's when a call failed or another bundle could not be
+// looked at (Seen.h), which may be a copy of this one or the owner of its group. The old state is then whole, or,
 // when only forcing the change to disk or removing a further copy failed, the new one.
 [[nodiscard]] std::variant<InstalledBundle, QXError> installBundle(const std::string& directory, const Paths& paths,
                                                                    QXPropertyLists& propertyLists);

@@ -29,9 +29,27 @@ constexpr mode_t kExecutableBits = S_IXUSR | S_IXGRP | S_IXOTH;
 
 enum class Presence { needed, optional };
 
-using Problem = std::optional<BundleProblem>;
+// Of the bundle, or of the look at it.
+using Problem = std::optional<std::variant<BundleProblem, QXError>>;
 
 BundleProblem problem(std::string text) { return {std::move(text)}; }
+
+void append(std::string& text, std::initializer_list<std::uint64_t> numbers) {
+  for (const auto number : numbers) {
+    if (!text.empty()) text += '.';
+    text += std::to_string(number);
+  }
+}
+
+std::string incarnationIn(const struct statx& status) {
+  std::string result;
+  // Zero where there is no time of birth.
+  append(result, {::makedev(status.stx_dev_major, status.stx_dev_minor), status.stx_ino,
+                  static_cast<std::uint64_t>(status.stx_btime.tv_sec), std::uint64_t{status.stx_btime.tv_nsec}});
+  return result;
+}
+
+constexpr unsigned kIncarnation = STATX_TYPE | STATX_INO | STATX_BTIME;
 
 // Reads text about the bundle's files into values and says what is wrong with the first that does not fit.
 class Parser {
@@ -40,7 +58,7 @@ class Parser {
 
   Problem parse() {
     directoryDescriptor_.reset(::open(directory_.c_str(), O_PATH | O_DIRECTORY | O_NOFOLLOW | O_CLOEXEC));
-    if (!directoryDescriptor_) return problem("cannot be opened: " + std::system_category().message(errno));
+    if (!directoryDescriptor_) return failure(directory_, errno, "cannot be opened: " + std::system_category().message(errno));
     result_.bundle.directory = directory_;
     if (auto wrong = readDictionary(kInfoName, Presence::needed, result_.bundle.info)) return wrong;
     if (auto wrong = readDictionary(kEntitlementsName, Presence::optional, result_.bundle.entitlements)) return wrong;
@@ -59,13 +77,18 @@ class Parser {
     struct stat status {};
     if (::fstatat(directoryDescriptor_.get(), name, &status, AT_SYMLINK_NOFOLLOW) != 0) {
       if (errno == ENOENT && presence == Presence::optional) return std::nullopt;
-      return problem(errno == ENOENT ? std::string("has no ") + name : std::string(name) + ": " + std::system_category().message(errno));
+      if (errno == ENOENT) return problem(std::string("has no ") + name);
+      return failure(pathOf(name), errno, std::string(name) + ": " + std::system_category().message(errno));
     }
     if (!S_ISREG(status.st_mode)) return problem(std::string(name) + " is not a regular file");
     addVersion(status);
-    const auto stream = propertyLists_.openStream(directory_ + "/" + name);
-    if (!stream || stream->bad()) return problem(std::string(name) + " cannot be opened");
+    // A stream does not say why it cannot be had; this does. While it is open nobody can have a lease on the list either.
+    const UniqueDescriptor held(::openat(directoryDescriptor_.get(), name, O_RDONLY | O_NONBLOCK | O_NOCTTY | O_NOFOLLOW | O_CLOEXEC));
+    if (!held) return failure(pathOf(name), errno, std::string(name) + " cannot be opened");
+    const auto stream = propertyLists_.openStream(pathOf(name));
+    if (!stream) return notSeen(pathOf(name), EMFILE);
     auto read = propertyLists_.read(*stream);
+    if (read.error && stream->bad()) return notSeen(pathOf(name), EIO);
     if (read.error) return problem(std::string(name) + " is no property list: " + read.error->description());
     auto* dictionary = read.value ? read.value->as<QXDictionary>() : nullptr;
     if (dictionary == nullptr) return problem(std::string(name) + " holds no dictionary");
@@ -92,13 +115,14 @@ class Parser {
     if (!file) {
       if (errno == EXDEV) return problem("its executable lies outside the bundle");
       if (errno == ELOOP) return problem("its executable is a link, or lies behind one");
-      return problem("its executable cannot be opened: " + std::system_category().message(errno));
+      return failure(pathOf(*relative), errno, "its executable cannot be opened: " + std::system_category().message(errno));
     }
     struct stat status {};
-    if (::fstat(file.get(), &status) != 0 || !S_ISREG(status.st_mode)) return problem("its executable is not a regular file");
+    if (::fstat(file.get(), &status) != 0) return notSeen(pathOf(*relative), errno);
+    if (!S_ISREG(status.st_mode)) return problem("its executable is not a regular file");
     if ((status.st_mode & kExecutableBits) == 0) return problem("its executable may not be executed");
     addVersion(status);
-    result_.bundle.executable = directory_ + "/" + *relative;
+    result_.bundle.executable = pathOf(*relative);
     return std::nullopt;
   }
 
@@ -133,19 +157,15 @@ class Parser {
 
   Problem takeVersion() {
     struct stat status {};
-    if (::fstat(directoryDescriptor_.get(), &status) != 0) return problem(std::system_category().message(errno));
+    if (::fstat(directoryDescriptor_.get(), &status) != 0) return notSeen(directory_, errno);
     addVersion(status);
     return std::nullopt;
   }
 
   Problem takeIncarnation() {
     struct statx status {};
-    if (::statx(directoryDescriptor_.get(), "", AT_EMPTY_PATH, STATX_INO | STATX_BTIME, &status) != 0) {
-      return problem(std::system_category().message(errno));
-    }
-    // Zero where there is no time of birth.
-    append(result_.bundle.incarnation, {::makedev(status.stx_dev_major, status.stx_dev_minor), status.stx_ino,
-                                        static_cast<std::uint64_t>(status.stx_btime.tv_sec), std::uint64_t{status.stx_btime.tv_nsec}});
+    if (::statx(directoryDescriptor_.get(), "", AT_EMPTY_PATH, kIncarnation, &status) != 0) return notSeen(directory_, errno);
+    result_.bundle.incarnation = incarnationIn(status);
     return std::nullopt;
   }
 
@@ -154,11 +174,12 @@ class Parser {
                                     static_cast<std::uint64_t>(status.st_ctim.tv_sec), static_cast<std::uint64_t>(status.st_ctim.tv_nsec)});
   }
 
-  static void append(std::string& text, std::initializer_list<std::uint64_t> numbers) {
-    for (const auto number : numbers) {
-      if (!text.empty()) text += '.';
-      text += std::to_string(number);
-    }
+  [[nodiscard]] std::string pathOf(const std::string& name) const { return directory_ + "/" + name; }
+
+  // A call about something of the bundle failed.
+  static Problem failure(const std::string& path, int error, std::string answer) {
+    if (!isAnswer(error)) return notSeen(path, error);
+    return problem(std::move(answer));
   }
 
   const std::string& directory_;
@@ -169,10 +190,20 @@ class Parser {
 
 }  // namespace
 
-std::variant<ParsedBundle, BundleProblem> parseBundle(const std::string& directory, QXPropertyLists& propertyLists) {
+std::variant<ParsedBundle, BundleProblem, QXError> parseBundle(const std::string& directory, QXPropertyLists& propertyLists) {
   Parser parser(directory, propertyLists);
-  if (auto wrong = parser.parse()) return *wrong;
-  return parser.take();
+  auto wrong = parser.parse();
+  if (!wrong) return parser.take();
+  if (auto* error = std::get_if<QXError>(&*wrong)) return std::move(*error);
+  return std::get<BundleProblem>(*std::move(wrong));
+}
+
+Seen<std::string> incarnationOf(const std::string& directory) {
+  struct statx status {};
+  if (::statx(AT_FDCWD, directory.c_str(), AT_SYMLINK_NOFOLLOW, kIncarnation, &status) != 0) {
+    return isAnswer(errno) ? Seen<std::string>(std::string()) : notSeen(directory, errno);
+  }
+  return S_ISDIR(status.stx_mode) ? incarnationIn(status) : std::string();
 }
 
 }  // namespace docuvend::linux_platform

@@ -7,6 +7,7 @@
 #include <vector>
 
 #include "platform/linux/bundles/Bundle.h"
+#include "platform/linux/bundles/Seen.h"
 #include "platform/property_list.h"
 
 namespace docuvend::linux_platform {
@@ -26,7 +27,11 @@ struct BundleProblem {
   std::string text;
 };
 
-// `directory` is absolute and has no link in it. A bundle has none either on the way to its property lists and its executable.
-[[nodiscard]] std::variant<ParsedBundle, BundleProblem> parseBundle(const std::string& directory, QXPropertyLists& propertyLists);
+// `directory` is absolute and has no link in it. A bundle has none either on the way to its property lists and its executable. An error: it
+// could not be looked at (Seen.h).
+[[nodiscard]] std::variant<ParsedBundle, BundleProblem, QXError> parseBundle(const std::string& directory, QXPropertyLists& propertyLists);
+
+// As in Bundle; empty when no directory is there. Needs no descriptor.
+[[nodiscard]] Seen<std::string> incarnationOf(const std::string& directory);
 
 }  // namespace docuvend::linux_platform

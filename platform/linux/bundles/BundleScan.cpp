@@ -3,8 +3,7 @@
 #include <sys/stat.h>
 
 #include <algorithm>
-#include <filesystem>
-#include <system_error>
+#include <cerrno>
 #include <utility>
 
 #include "platform/linux/bundles/GroupMembership.h"
@@ -13,123 +12,150 @@
 namespace docuvend::linux_platform {
 namespace {
 
-namespace fs = std::filesystem;
+using Kind = DirectoryEntry::Kind;
 
-std::vector<fs::path> visibleEntries(const std::string& root) {
-  std::vector<fs::path> result;
-  std::error_code error;
-  const fs::path real = fs::canonical(root, error);
-  if (error) return result;
-  for (fs::directory_iterator entry(real, error), end; !error && entry != end; entry.increment(error)) {
-    if (!entry->path().filename().native().starts_with('.')) result.push_back(entry->path());
-  }
-  std::sort(result.begin(), result.end());
-  return result;
-}
-
-// The real path of something that may not exist yet.
-std::string realPath(const std::string& path) {
-  std::error_code error;
-  const fs::path real = fs::weakly_canonical(path, error);
-  return error ? path : real.string();
-}
+// An installer works under such a name.
+bool isHidden(const DirectoryEntry& entry) { return entry.name.starts_with('.'); }
 
 TrustedOwner trustedOwnerOf(BundleOrigin origin) {
   return origin == BundleOrigin::system ? TrustedOwner::thisUserOrRoot : TrustedOwner::thisUser;
 }
 
 // What is not there is nobody's.
-std::optional<std::string_view> distrustAt(const std::string& path, BundleOrigin origin) {
+Seen<std::optional<std::string_view>> distrustAt(const std::string& path, BundleOrigin origin) {
   struct stat status {};
-  if (::lstat(path.c_str(), &status) != 0) return std::nullopt;
-  return distrust(status, trustedOwnerOf(origin));
+  if (::lstat(path.c_str(), &status) == 0) return distrust(status, trustedOwnerOf(origin));
+  if (!isAnswer(errno)) return notSeen(path, errno);
+  return std::nullopt;
+}
+
+std::variant<ParsedBundle, BundleProblem, QXError> readTrusted(const std::string& directory, BundleOrigin origin,
+                                                               QXPropertyLists& propertyLists) {
+  auto parsed = parseBundle(directory, propertyLists);
+  auto* const bundle = std::get_if<ParsedBundle>(&parsed);
+  if (bundle == nullptr) return parsed;
+  bundle->origin = origin;
+  auto distrusted = distrustOf(*bundle);
+  if (auto* error = std::get_if<QXError>(&distrusted)) return std::move(*error);
+  if (auto& problem = std::get<std::optional<BundleProblem>>(distrusted)) return *std::move(problem);
+  return parsed;
 }
 
 }  // namespace
 
-std::optional<BundleProblem> distrustOf(const ParsedBundle& parsed) {
+Seen<std::optional<BundleProblem>> distrustOf(const ParsedBundle& parsed) {
   const std::string& directory = parsed.bundle.directory;
-  if (const auto why = distrustAt(directory, parsed.origin)) return BundleProblem{"it " + std::string(*why)};
-  std::vector<std::string> names = {"Info.plist", "Entitlements.plist"};
+  std::vector<std::string> names = {"", "Info.plist", "Entitlements.plist"};
   const std::string executable = parsed.bundle.executable.substr(directory.size() + 1);
   for (std::size_t slash = executable.find('/'); slash != std::string::npos; slash = executable.find('/', slash + 1)) {
     names.push_back(executable.substr(0, slash));
   }
   names.push_back(executable);
   for (const std::string& name : names) {
-    if (const auto why = distrustAt(directory + "/" + name, parsed.origin)) return BundleProblem{"its " + name + " " + std::string(*why)};
+    auto seen = distrustAt(name.empty() ? directory : directory + "/" + name, parsed.origin);
+    if (auto* error = std::get_if<QXError>(&seen)) return std::move(*error);
+    const auto& why = std::get<std::optional<std::string_view>>(seen);
+    if (why) return BundleProblem{(name.empty() ? "it " : "its " + name + " ").append(*why)};
   }
   return std::nullopt;
 }
 
-std::vector<std::string> bundleDirectories(const std::string& root) {
+Seen<std::vector<std::string>> bundleDirectories(const std::string& root) {
+  auto real = realPath(root);
+  if (auto* error = std::get_if<QXError>(&real)) return std::move(*error);
+  const auto& directory = std::get<std::string>(real);
+  auto entries = entriesOf(directory);
+  if (auto* error = std::get_if<QXError>(&entries)) return std::move(*error);
   std::vector<std::string> result;
-  for (const auto& path : visibleEntries(root)) {
-    std::error_code error;
-    if (fs::symlink_status(path, error).type() == fs::file_type::directory) result.push_back(path.string());
+  for (const auto& entry : std::get<std::vector<DirectoryEntry>>(entries)) {
+    if (entry.kind == Kind::directory && !isHidden(entry)) result.push_back(directory + "/" + entry.name);
   }
   return result;
 }
 
-std::vector<std::string> directoriesOfBundle(const std::string& directory) {
+Seen<std::vector<std::string>> directoriesOfBundle(const std::string& directory) {
   std::vector<std::string> result{directory};
   for (std::size_t next = 0; next < result.size() && result.size() < kMostBundleDirectories; ++next) {
-    std::error_code error;
-    std::vector<std::string> below;
-    for (fs::directory_iterator entry(result[next], error), end; !error && entry != end; entry.increment(error)) {
-      std::error_code unknown;
-      if (entry->symlink_status(unknown).type() == fs::file_type::directory) below.push_back(entry->path().string());
+    const std::string above = result[next];
+    auto entries = entriesOf(above);
+    if (auto* error = std::get_if<QXError>(&entries)) return std::move(*error);
+    for (const auto& entry : std::get<std::vector<DirectoryEntry>>(entries)) {
+      if (entry.kind == Kind::directory && result.size() < kMostBundleDirectories) result.push_back(above + "/" + entry.name);
     }
-    std::sort(below.begin(), below.end());
-    below.resize(std::min(below.size(), kMostBundleDirectories - result.size()));
-    result.insert(result.end(), below.begin(), below.end());
   }
   return result;
 }
 
-BundleMap BundleScan::run(const std::set<std::string>& unsettled) {
+BundleLook BundleScan::run(const std::set<std::string>& unsettled) {
   found_.clear();
   reported_.clear();
+  notSeen_.reset();
   const auto lastParsed = std::exchange(parsed_, {});
   scanDirectory(paths_.systemBundles, BundleOrigin::system, unsettled, lastParsed);
+  isSystemSeen_ = !notSeen_;
   scanDirectory(paths_.userBundles, BundleOrigin::user, unsettled, lastParsed);
-  BundleMap result = resolve();
+  BundleLook result{resolve(), {}};
+  result.notSeen = notSeen_;
+  if (notSeen_) reported_.merge(lastReported_);  // for all that is known it is still so
   lastReported_ = std::move(reported_);
   return result;
 }
 
 void BundleScan::scanDirectory(const std::string& root, BundleOrigin origin, const std::set<std::string>& unsettled,
                                const Parsed& lastParsed) {
-  const std::string real = realPath(root);
-  if (const auto why = distrustAt(real, origin)) {
+  const auto missedAll = [this, origin, &lastParsed](const QXError& error) {
+    missed(error);
+    for (const auto& [directory, last] : lastParsed) {
+      if (last.origin == origin) keep(last);
+    }
+  };
+  const auto place = realPath(root);
+  if (const auto* error = std::get_if<QXError>(&place)) return missedAll(*error);
+  const auto& real = std::get<std::string>(place);
+  const auto distrusted = distrustAt(real, origin);
+  if (const auto* error = std::get_if<QXError>(&distrusted)) return missedAll(*error);
+  if (const auto& why = std::get<std::optional<std::string_view>>(distrusted)) {
     report(qxLogMessage("[ERROR] Ignoring the bundles in %@: it %@.", real, *why));
     return;
   }
-  for (const auto& path : visibleEntries(root)) {
-    std::error_code error;
-    const auto type = fs::symlink_status(path, error).type();
-    if (type == fs::file_type::symlink) {
-      report(qxLogMessage("[ERROR] Ignoring the bundle at %@: it is a link.", path.string()));
-    }
-    if (type != fs::file_type::directory) continue;
-    if (unsettled.contains(path.string())) {
-      if (const auto last = lastParsed.find(path.string()); last != lastParsed.end()) add(last->second);
-      continue;
-    }
-    auto parsed = parseBundle(path.string(), propertyLists_);
-    std::optional<BundleProblem> problem;
-    if (auto* bundle = std::get_if<ParsedBundle>(&parsed)) {
-      bundle->origin = origin;
-      problem = distrustOf(*bundle);
-    } else {
-      problem = std::get<BundleProblem>(std::move(parsed));
-    }
-    if (problem) {
-      report(qxLogMessage("[ERROR] Ignoring the bundle at %@: %@.", path.string(), problem->text));
-    } else {
-      add(std::get<ParsedBundle>(parsed));
+  const auto entries = entriesOf(real);
+  if (const auto* error = std::get_if<QXError>(&entries)) return missedAll(*error);
+  for (const auto& entry : std::get<std::vector<DirectoryEntry>>(entries)) {
+    if (isHidden(entry)) continue;
+    const std::string path = real + "/" + entry.name;
+    if (entry.kind == Kind::link) report(qxLogMessage("[ERROR] Ignoring the bundle at %@: it is a link.", path));
+    if (entry.kind != Kind::directory) continue;
+    if (!unsettled.contains(path)) {
+      scanBundle(path, origin, lastParsed);
+    } else if (const auto last = lastParsed.find(path); last != lastParsed.end()) {
+      add(last->second);
     }
   }
+}
+
+void BundleScan::scanBundle(const std::string& directory, BundleOrigin origin, const Parsed& lastParsed) {
+  const auto last = lastParsed.find(directory);
+  const auto reading = readTrusted(directory, origin, propertyLists_);
+  if (const auto* problem = std::get_if<BundleProblem>(&reading)) return ignore(directory, *problem);
+  if (const auto* error = std::get_if<QXError>(&reading)) {
+    missed(*error);
+    if (last != lastParsed.end()) keep(last->second);
+    return;
+  }
+  const auto& parsed = std::get<ParsedBundle>(reading);
+  const bool isKnown = last != lastParsed.end() && last->second.bundle.identifier == parsed.bundle.identifier;
+  if (origin == BundleOrigin::system || isSystemSeen_ || isKnown) add(parsed);
+}
+
+// As it was, if this very directory is still there and still nobody else's.
+void BundleScan::keep(const ParsedBundle& last) {
+  const auto there = incarnationOf(last.bundle.directory);
+  if (const auto* incarnation = std::get_if<std::string>(&there); incarnation != nullptr && *incarnation != last.bundle.incarnation) return;
+  const auto distrusted = distrustOf(last);
+  if (const auto* problem = std::get_if<std::optional<BundleProblem>>(&distrusted); problem != nullptr && *problem) {
+    return ignore(last.bundle.directory, **problem);
+  }
+  add(last);
 }
 
 void BundleScan::add(const ParsedBundle& parsed) {
@@ -144,8 +170,8 @@ void BundleScan::add(const ParsedBundle& parsed) {
 }
 
 BundleMap BundleScan::resolve() {
-  const std::string containers = realPath(paths_.containers);
-  const std::string groupContainers = realPath(paths_.groupContainers);
+  const std::string containers = placeOf(paths_.containers);
+  const std::string groupContainers = placeOf(paths_.groupContainers);
   const GroupMembership membership(found_);
   BundleMap result;
   for (const auto& parsed : found_) {
@@ -164,6 +190,25 @@ BundleMap BundleScan::resolve() {
     result.emplace(bundle.identifier, std::move(bundle));
   }
   return result;
+}
+
+std::string BundleScan::placeOf(const std::string& path) {
+  const auto real = realPath(path);
+  if (const auto* error = std::get_if<QXError>(&real)) {
+    missed(*error);
+  } else {
+    places_.insert_or_assign(path, std::get<std::string>(real));
+  }
+  const auto last = places_.find(path);
+  return last == places_.end() ? path : last->second;
+}
+
+void BundleScan::missed(const QXError& error) {
+  if (!notSeen_) notSeen_ = error;
+}
+
+void BundleScan::ignore(const std::string& directory, const BundleProblem& problem) {
+  report(qxLogMessage("[ERROR] Ignoring the bundle at %@: %@.", directory, problem.text));
 }
 
 void BundleScan::report(const QXLogMessage& message) {

@@ -1,4 +1,9 @@
 // Looks through the bundle directories. What is wrong with a bundle is logged once, and again only after a look that found it mended.
+//
+// What cannot be looked at (Seen.h) counts as what the last look found there: a bundle by itself, or all bundles of a directory that cannot
+// be listed. Only what is known all the same to be gone, replaced or another user's work goes; that takes no descriptor. As long as
+// something of the system's cannot be looked at, it may be a bundle that comes before one of the user's; so the user's that the last look
+// did not find wait.
 #pragma once
 
 #include <map>
@@ -10,11 +15,17 @@
 #include "platform/QXLogMessage.h"
 #include "platform/linux/base/Paths.h"
 #include "platform/linux/bundles/BundleParser.h"
+#include "platform/linux/bundles/Seen.h"
 #include "platform/log.h"
 
 namespace docuvend::linux_platform {
 
 using BundleMap = std::map<std::string, Bundle, std::less<>>;
+
+struct BundleLook {
+  BundleMap bundles;
+  std::optional<QXError> notSeen;  // the first thing that could not be looked at; another look is due
+};
 
 // Used by one thread at a time. The property lists and the log outlive it.
 class BundleScan {
@@ -26,36 +37,45 @@ class BundleScan {
   // first by name of directory. Directories whose name begins with "." are not looked at: an installer copies under such a name, then
   // renames. Links are no bundles, nor is what another user owns or can write (distrustOf). A directory of `unsettled` is not read: it
   // counts as what the last look found there, and as nothing if that was no bundle. Creates nothing.
-  [[nodiscard]] BundleMap run(const std::set<std::string>& unsettled = {});
+  [[nodiscard]] BundleLook run(const std::set<std::string>& unsettled = {});
 
  private:
   using Parsed = std::map<std::string, ParsedBundle>;  // by directory
 
   void scanDirectory(const std::string& root, BundleOrigin origin, const std::set<std::string>& unsettled, const Parsed& lastParsed);
+  void scanBundle(const std::string& directory, BundleOrigin origin, const Parsed& lastParsed);
+  void keep(const ParsedBundle& last);
   void add(const ParsedBundle& parsed);
   [[nodiscard]] BundleMap resolve();
+  // The real path, or what it was when it was last seen.
+  [[nodiscard]] std::string placeOf(const std::string& path);
+  void missed(const QXError& error);
+  void ignore(const std::string& directory, const BundleProblem& problem);
   void report(const QXLogMessage& message);
 
   const Paths paths_;
   QXPropertyLists& propertyLists_;
   QXLogHandle& log_;
 
-  Parsed parsed_;                       // by the look that is going on, or else the last
-  std::vector<ParsedBundle> found_;     // of the look that is going on
-  std::set<std::string> reported_;      // by the look that is going on
-  std::set<std::string> lastReported_;  // by the one before
+  Parsed parsed_;                              // by the look that is going on, or else the last
+  std::vector<ParsedBundle> found_;            // of the look that is going on
+  std::set<std::string> reported_;             // by the look that is going on
+  std::set<std::string> lastReported_;         // by the one before
+  std::optional<QXError> notSeen_;             // by the look that is going on
+  bool isSystemSeen_ = true;                   // likewise
+  std::map<std::string, std::string> places_;  // the real paths of containers, as they were last seen
 };
 
 // Why what the bundle is known by, its property lists, its program and the directories on the way to them, may be another user's work, in
 // one line. A bundle of the system's may be root's.
-[[nodiscard]] std::optional<BundleProblem> distrustOf(const ParsedBundle& parsed);
+[[nodiscard]] Seen<std::optional<BundleProblem>> distrustOf(const ParsedBundle& parsed);
 
 // The real paths of the directories directly below `root` that may be bundles, in order of name.
-[[nodiscard]] std::vector<std::string> bundleDirectories(const std::string& root);
+[[nodiscard]] Seen<std::vector<std::string>> bundleDirectories(const std::string& root);
 
 // The directory of a bundle and those below it, as they may be in the way to its files: at most kMostBundleDirectories, those nearest
 // first.
 inline constexpr std::size_t kMostBundleDirectories = 64;
-[[nodiscard]] std::vector<std::string> directoriesOfBundle(const std::string& directory);
+[[nodiscard]] Seen<std::vector<std::string>> directoriesOfBundle(const std::string& directory);
 
 }  // namespace docuvend::linux_platform

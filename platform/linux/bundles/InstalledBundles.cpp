@@ -2,7 +2,8 @@
 // is watched at once, not only when it is looked at, so that it is known how long nothing has been written there.
 //
 // Every look asks for the watches anew. As long as they are not complete a look is due some time after the last one, whatever was heard;
-// the first look with all of them sees what was missed before.
+// the first look with all of them sees what was missed before. So it is after a look that did not see everything. What cannot be listed
+// stays watched as it was.
 #include "platform/linux/bundles/InstalledBundles.h"
 
 #include <poll.h>
@@ -13,8 +14,8 @@
 #include <array>
 #include <cerrno>
 #include <chrono>
-#include <filesystem>
-#include <system_error>
+#include <iterator>
+#include <utility>
 
 #include "platform/QXLogMessage.h"
 
@@ -41,11 +42,11 @@ bool areSame(const BundleMap& one, const BundleMap& other) {
 InstalledBundles::InstalledBundles(const Paths& paths, QXPropertyLists& propertyLists, QXLogHandle& log)
     : log_(log),
       stop_(::eventfd(0, EFD_CLOEXEC)),
-      roots_{Root{paths.systemBundles, {}}, Root{paths.userBundles, {}}},
+      roots_{Root{paths.systemBundles, paths.systemBundles}, Root{paths.userBundles, paths.userBundles}},
       scan_(paths, propertyLists, log) {
   lastLook_ = Clock::now();
   renewWatch();
-  bundles_ = std::make_shared<const BundleMap>(scan_.run());
+  bundles_ = std::make_shared<const BundleMap>(look(/*unsettled=*/{}));
   if (stop_) thread_ = std::thread([this] { run(); });  // joined by the destructor
 }
 
@@ -86,9 +87,9 @@ void InstalledBundles::run() {
 
 std::optional<Settling::Time> InstalledBundles::nextLook() const {
   const auto settled = settling_.nextLook();
-  if (watchIsComplete_) return settled;
-  const Settling::Time unwatched = lastLook_ + kLookWithoutWatch;
-  return settled ? std::min(*settled, unwatched) : unwatched;
+  if (watchIsComplete_ && lookIsComplete_) return settled;
+  const Settling::Time another = lastLook_ + kLookWithoutWatch;
+  return settled ? std::min(*settled, another) : another;
 }
 
 // Until something happens or the time for a look has come. False when the registry is to end.
@@ -150,7 +151,7 @@ void InstalledBundles::lookAgain() {
   const auto began = Clock::now();
   takeChanges();
   lastLook_ = began;
-  auto looked = std::make_shared<const BundleMap>(scan_.run(settling_.unsettled(began)));
+  auto looked = std::make_shared<const BundleMap>(look(settling_.unsettled(began)));
   std::vector<std::function<void()>> callbacks;
   bool isChanged = false;
   {
@@ -163,13 +164,43 @@ void InstalledBundles::lookAgain() {
   for (const auto& callback : callbacks) callback();
 }
 
-std::vector<std::string> InstalledBundles::directoriesToWatch() const {
-  std::vector<std::string> result;
+BundleMap InstalledBundles::look(const std::set<std::string>& unsettled) {
+  BundleLook seen = scan_.run(unsettled);
+  const bool wasComplete = std::exchange(lookIsComplete_, !seen.notSeen);
+  if (wasComplete && seen.notSeen) {
+    qxLog(log_, "[ERROR] Not every bundle can be looked at, so what cannot counts as it was and is tried every %d seconds: %@",
+          kLookWithoutWatch.count(), *seen.notSeen);
+  } else if (!wasComplete && !seen.notSeen) {
+    qxLog(log_, "[NOTICE] Every bundle can be looked at again.");
+  }
+  return std::move(seen.bundles);
+}
+
+InstalledBundles::Directories InstalledBundles::directoriesToWatch() const {
+  Directories result;
+  const auto add = [&result](const std::vector<std::string>& paths) {
+    result.paths.insert(result.paths.end(), paths.begin(), paths.end());
+  };
+  const auto keepBelow = [this, &result](const std::string& directory) {
+    result.areAll = false;
+    std::copy_if(watched_.begin(), watched_.end(), std::back_inserter(result.paths),
+                 [&directory](const std::string& path) { return path.starts_with(directory + "/"); });
+  };
   for (const Root& root : roots_) {
-    result.push_back(root.given);
-    for (const auto& bundle : bundleDirectories(root.given)) {
+    result.paths.push_back(root.given);
+    const auto bundles = bundleDirectories(root.given);
+    if (std::holds_alternative<QXError>(bundles)) {
+      keepBelow(root.real);
+      continue;
+    }
+    for (const auto& bundle : std::get<std::vector<std::string>>(bundles)) {
       const auto directories = directoriesOfBundle(bundle);
-      result.insert(result.end(), directories.begin(), directories.end());
+      if (const auto* paths = std::get_if<std::vector<std::string>>(&directories)) {
+        add(*paths);
+      } else {
+        result.paths.push_back(bundle);
+        keepBelow(bundle);
+      }
     }
   }
   return result;
@@ -179,17 +210,17 @@ std::vector<std::string> InstalledBundles::directoriesToWatch() const {
 void InstalledBundles::renewWatch() {
   bool isComplete = true;
   for (Root& root : roots_) {
-    std::error_code error;
-    const auto real = std::filesystem::canonical(root.given, error);
-    root.real = error ? root.given : real.string();
+    auto real = realPath(root.given);
+    if (auto* path = std::get_if<std::string>(&real)) root.real = std::move(*path);
   }
   auto directories = directoriesToWatch();
   for (int tries = 0; tries < kMostWatchTries; ++tries) {
-    isComplete = watch_.watch(directories);
+    isComplete = watch_.watch(directories.paths) && directories.areAll;
     auto present = directoriesToWatch();
     if (present == directories) break;
     directories = std::move(present);
   }
+  watched_ = std::move(directories.paths);
   if (isComplete == watchIsComplete_) return;
   watchIsComplete_ = isComplete;
   if (isComplete) {

@@ -8,7 +8,8 @@
 // kMostBundleDirectories reach are not noticed.
 //
 // When the kernel has no watch to give, of which a user has only so many, the directories are looked at every kLookWithoutWatch until it
-// has; the log says when that begins and when it is over. Meanwhile a bundle that is written in place may be seen in part.
+// has; the log says when that begins and when it is over. Meanwhile a bundle that is written in place may be seen in part. So they are when
+// something there cannot be looked at (Seen.h): it counts as it was meanwhile (BundleScan.h).
 #pragma once
 
 #include <array>
@@ -17,6 +18,7 @@
 #include <memory>
 #include <mutex>
 #include <optional>
+#include <set>
 #include <string>
 #include <thread>
 #include <vector>
@@ -30,7 +32,7 @@
 
 namespace docuvend::linux_platform {
 
-inline constexpr std::chrono::seconds kLookWithoutWatch{3};
+inline constexpr std::chrono::seconds kLookWithoutWatch{3};  // also after one that did not see everything
 
 // The property lists and the log outlive it. The first look is over when the constructor returns.
 class InstalledBundles final : public BundleRegistry {
@@ -55,8 +57,16 @@ class InstalledBundles final : public BundleRegistry {
   [[nodiscard]] std::optional<Settling::Time> nextLook() const;
   void takeChanges();
   void lookAgain();
+  [[nodiscard]] BundleMap look(const std::set<std::string>& unsettled);
   void renewWatch();
-  [[nodiscard]] std::vector<std::string> directoriesToWatch() const;
+
+  struct Directories {
+    std::vector<std::string> paths;
+    bool areAll = true;  // otherwise some are there because they were before
+
+    friend bool operator==(const Directories&, const Directories&) = default;
+  };
+  [[nodiscard]] Directories directoriesToWatch() const;
   [[nodiscard]] std::string realPathOf(const DirectoryChange& change) const;
   [[nodiscard]] std::string bundleAround(const std::string& path) const;
 
@@ -69,7 +79,9 @@ class InstalledBundles final : public BundleRegistry {
   BundleScan scan_;
   DirectoryWatch watch_;
   Settling settling_;
+  std::vector<std::string> watched_;  // what is to be watched
   bool watchIsComplete_ = true;
+  bool lookIsComplete_ = true;
   Settling::Time lastLook_;
 
   std::mutex mutex_;
