@@ -278,6 +278,55 @@ TEST_F(ExtensionProcessTest, OneThatIsLetGoEndsWithLessToSayThanOneThatDies) {
               ::testing::ElementsAre(FakeLogEntry{QXLogType::info, "[INFO] The process of com.orvane.test was ended by signal 15."}));
 }
 
+TEST_F(ExtensionProcessTest, OneWhoseBundleIsGoneIsEndedAtOnceAndEachOfItsMessagesFailsOnce) {
+  start(times(kLong, kLong));
+  auto answered = sendMessage();
+  auto unanswered = sendMessage("_identifierForItemAtURL:completion:");
+  const auto request = peer->read<RequestFrame>();
+  ASSERT_TRUE(request);
+  ASSERT_TRUE(peer->read<RequestFrame>());
+  // The answer to the first lies in the socket, and is not looked at before it is too late.
+  std::promise<void> mayGoOn;
+  std::promise<void> isHeldUp;
+  reactor->post([&mayGoOn, &isHeldUp] {
+    isHeldUp.set_value();
+    mayGoOn.get_future().wait();
+  });
+  isHeldUp.get_future().wait();
+  peer->write(Frame(ReplyFrame{request->callID, {QXValue()}}));
+  process->endWithItsBundle();
+  mayGoOn.set_value();
+  // A second failure of one of them would throw.
+  for (auto* failed : {&answered, &unanswered}) {
+    ASSERT_EQ(failed->wait_for(std::chrono::seconds(60)), std::future_status::ready);
+    const QXError error = failed->get();
+    EXPECT_EQ(error.domain, kExtensionHostErrorDomain);
+    EXPECT_EQ(error.code, static_cast<std::int64_t>(ExtensionHostErrorCode::bundleIsGone));
+    EXPECT_NE(error.description().find("The bundle of com.orvane.test was removed or replaced."), std::string::npos);
+  }
+  EXPECT_TRUE(gone.take());
+  settle();
+  EXPECT_EQ(replies.count(), 0U);
+  EXPECT_EQ(lost.take(), ProcessLifetime::Cause::died);
+  EXPECT_EQ(lost.count(), 0U);
+  EXPECT_THAT(log.entries(),
+              ::testing::ElementsAre(FakeLogEntry{QXLogType::defaultType,
+                                                  "[NOTICE] The bundle of com.orvane.test was removed or replaced: its process is ended."},
+                                     FakeLogEntry{QXLogType::info, "[INFO] The process of com.orvane.test was ended by signal 9."}));
+}
+
+TEST_F(ExtensionProcessTest, OneThatWasLetGoHasNoMorePatienceWhenItsBundleIsGone) {
+  ExtensionTimes patient = times(kLong, kLong);
+  patient.endGrace = kLong;
+  start(patient);
+  process->end();
+  process->endWithItsBundle();
+  EXPECT_TRUE(gone.take());
+  EXPECT_EQ(lost.count(), 0U);
+  EXPECT_THAT(log.entries(),
+              ::testing::ElementsAre(FakeLogEntry{QXLogType::info, "[INFO] The process of com.orvane.test was ended by signal 9."}));
+}
+
 TEST_F(ExtensionProcessTest, WhatApplicationsAskForLeavesRoomForNoticesAndTheSetup) {
   constexpr const char* kName = "_identifierForItemAtURL:completion:";
   constexpr const char* kNotice = "_itemChangedAtURL:completion:";

@@ -36,6 +36,21 @@ class LinuxExtensionHostTest : public ::testing::Test {
     result.answerLimit = answerLimit;
     return result;
   }
+  static ExtensionTimes withGrace(milliseconds updateGrace) {
+    ExtensionTimes result = times(/*linger=*/std::chrono::hours(1));
+    result.updateGrace = updateGrace;
+    return result;
+  }
+  // The bundle as it is found after an edit in its directory.
+  static Bundle edited(Bundle bundle) {
+    bundle.version += ".1";
+    return bundle;
+  }
+  // Another bundle in its place, as `docuvendctl install` puts it there.
+  static Bundle replaced(Bundle bundle) {
+    bundle.incarnation = "another";
+    return edited(std::move(bundle));
+  }
 };
 
 bool isOfKind(const std::optional<QXError>& error, ExtensionHostErrorCode code) {
@@ -353,7 +368,7 @@ TEST_F(LinuxExtensionHostTest, AnExecutableThatDoesNotServeFailsTheMessages) {
 }
 
 TEST_F(LinuxExtensionHostTest, AnUpdatedExtensionsOldProcessEndsWithItsLastRequest) {
-  RealExtensions real(times(std::chrono::hours(1)));
+  RealExtensions real(withGrace(std::chrono::hours(1)));
   Bundle bundle = real.makeBundle("com.orvane.test");
   const auto old = real.extension();
   std::string process;
@@ -365,6 +380,186 @@ TEST_F(LinuxExtensionHostTest, AnUpdatedExtensionsOldProcessEndsWithItsLastReque
     EXPECT_EQ(conversation.identifier("process"), process);
   }
   EXPECT_TRUE(real.awaitLog("The process of com.orvane.test exited with status 0."));
+}
+
+TEST_F(LinuxExtensionHostTest, ARemovedExtensionsProcessIsEndedAtOnceWhateverItHasNotAnswered) {
+  RealExtensions real(withGrace(std::chrono::hours(1)));
+  const auto extension = real.extension();
+  const Conversation conversation(extension);
+  auto first = conversation.start("wait");
+  auto second = conversation.start("wait");
+  ASSERT_NE(conversation.identifier("process"), "");
+  real.install({});
+  for (auto* waiting : {&first, &second}) {
+    const auto failed = await(std::move(*waiting));
+    ASSERT_TRUE(failed);
+    EXPECT_TRUE(isOfKind(failed->error, ExtensionHostErrorCode::bundleIsGone)) << (failed->error ? failed->error->description() : "");
+  }
+  EXPECT_EQ(extension->extensionContextForRequest(conversation.request()), nullptr);
+  EXPECT_TRUE(isOfKind(Conversation(extension).error(), ExtensionHostErrorCode::bundleIsGone));
+  EXPECT_TRUE(nobodyRuns(real.home()));
+  EXPECT_TRUE(real.awaitLog("[NOTICE] The bundle of com.orvane.test was removed or replaced: its process is ended."));
+}
+
+TEST_F(LinuxExtensionHostTest, WhatAMessageToARemovedExtensionComesToIsItsError) {
+  RealExtensions real;
+  const Conversation conversation(real.extension());
+  ASSERT_NE(conversation.identifier("process"), "");
+  real.install({});
+  ASSERT_TRUE(real.awaitLog("The process of com.orvane.test was ended by signal"));
+  const auto late = await(conversation.identify("process"));
+  ASSERT_TRUE(late);
+  EXPECT_TRUE(isOfKind(late->error, ExtensionHostErrorCode::bundleIsGone)) << (late->error ? late->error->description() : "");
+}
+
+TEST_F(LinuxExtensionHostTest, AReplacedExtensionsProcessIsEndedAtOnceAndRequestsGoToTheNextOnes) {
+  RealExtensions real(withGrace(std::chrono::hours(1)));
+  Reports reports;
+  const Bundle bundle = real.makeBundle("com.orvane.test");
+  real.install({bundle});
+  const auto match = real.match(reports);
+  const auto before = reports.await(0);
+  ASSERT_TRUE(before && before->size() == 1);
+  const Conversation conversation(before->front());
+  const std::string process = conversation.identifier("process");
+  auto waiting = conversation.start("wait");
+  real.install({replaced(bundle)});
+  const auto after = reports.await(1);
+  ASSERT_TRUE(after && after->size() == 1);
+  const auto failed = await(std::move(waiting));
+  ASSERT_TRUE(failed);
+  EXPECT_TRUE(isOfKind(failed->error, ExtensionHostErrorCode::bundleIsGone)) << (failed->error ? failed->error->description() : "");
+  const Conversation next(after->front());
+  ASSERT_FALSE(next.error()) << next.error()->description();
+  EXPECT_NE(next.identifier("process"), process);
+  EXPECT_TRUE(isOfKind(Conversation(before->front()).error(), ExtensionHostErrorCode::bundleIsGone));
+}
+
+TEST_F(LinuxExtensionHostTest, ASlowMatchHandlerKeepsNoProcessWhoseBundleIsGone) {
+  RealExtensions real;
+  const auto extension = real.extension();
+  const QXRpcInterface host = qxInterfaceOf<_QXDocuvendHostProtocol>();
+  const QXRpcInterface vendor = qxInterfaceOf<_QXDocuvendVendor>();
+  std::promise<void> mayGoOn;
+  const auto held = mayGoOn.get_future().share();
+  Reports reports;
+  const Conversation conversation(extension);
+  auto waiting = conversation.start("wait");
+  ASSERT_NE(conversation.identifier("process"), "");
+  const auto slow = real.host().beginMatching({}, {host, vendor}, [&reports, held](Reports::Set set, const std::optional<QXError>&) {
+    const bool isEmpty = set.empty();
+    reports.add(std::move(set));
+    if (isEmpty) held.wait();
+  });
+  ASSERT_TRUE(reports.await(0));
+  real.install({});
+  const auto failed = await(std::move(waiting));
+  mayGoOn.set_value();
+  ASSERT_TRUE(failed);
+  EXPECT_TRUE(isOfKind(failed->error, ExtensionHostErrorCode::bundleIsGone));
+}
+
+TEST_F(LinuxExtensionHostTest, AnExtensionWhoseMatchWasDroppedEndsWithItsBundleToo) {
+  RealExtensions real;
+  Reports reports;
+  real.install({real.makeBundle("com.orvane.test")});
+  auto match = real.match(reports);
+  const auto set = reports.await(0);
+  ASSERT_TRUE(set && set->size() == 1);
+  match.reset();
+  const Conversation conversation(set->front());
+  auto waiting = conversation.start("wait");
+  ASSERT_NE(conversation.identifier("process"), "");
+  real.install({});
+  const auto failed = await(std::move(waiting));
+  ASSERT_TRUE(failed);
+  EXPECT_TRUE(isOfKind(failed->error, ExtensionHostErrorCode::bundleIsGone));
+}
+
+TEST_F(LinuxExtensionHostTest, AnEditedExtensionsProcessMayEndWhatItIsAbout) {
+  RealExtensions real(withGrace(std::chrono::hours(1)));
+  Reports reports;
+  const Bundle bundle = real.makeBundle("com.orvane.test");
+  real.install({bundle});
+  const auto match = real.match(reports);
+  const auto before = reports.await(0);
+  ASSERT_TRUE(before && before->size() == 1);
+  auto conversation = std::make_unique<Conversation>(before->front());
+  const std::string process = conversation->identifier("process");
+  auto waiting = conversation->start("wait");
+  real.install({edited(bundle)});
+  const auto after = reports.await(1);
+  ASSERT_TRUE(after && after->size() == 1);
+  EXPECT_NE(Conversation(after->front()).identifier("process"), process) << "a new request is the edited one's";
+  EXPECT_EQ(Conversation(before->front()).identifier("process"), process);
+  real.release();
+  const auto answer = await(std::move(waiting));
+  ASSERT_TRUE(answer);
+  EXPECT_FALSE(answer->error) << answer->error->description();
+  conversation.reset();
+  EXPECT_TRUE(real.awaitLog("The process of com.orvane.test exited with status 0.")) << "it does not linger";
+}
+
+TEST_F(LinuxExtensionHostTest, AnEditedExtensionsProcessIsEndedWhenTheGraceIsOver) {
+  RealExtensions real(withGrace(milliseconds(1)));
+  const auto extension = real.extension();
+  const Conversation conversation(extension);
+  auto waiting = conversation.start("wait");
+  ASSERT_NE(conversation.identifier("process"), "");
+  real.install({edited(real.makeBundle("com.orvane.test"))});
+  const auto failed = await(std::move(waiting));
+  ASSERT_TRUE(failed);
+  EXPECT_TRUE(isOfKind(failed->error, ExtensionHostErrorCode::bundleIsGone)) << (failed->error ? failed->error->description() : "");
+  EXPECT_TRUE(isOfKind(Conversation(extension).error(), ExtensionHostErrorCode::bundleIsGone));
+}
+
+TEST_F(LinuxExtensionHostTest, AnEditedExtensionThatIsRemovedHasNoMoreGrace) {
+  RealExtensions real(withGrace(std::chrono::hours(1)));
+  Reports reports;
+  const Bundle bundle = real.makeBundle("com.orvane.test");
+  real.install({bundle});
+  const auto match = real.match(reports);
+  const auto before = reports.await(0);
+  ASSERT_TRUE(before && before->size() == 1);
+  const Conversation conversation(before->front());
+  auto waiting = conversation.start("wait");
+  ASSERT_NE(conversation.identifier("process"), "");
+  real.install({edited(bundle)});
+  ASSERT_TRUE(reports.await(1));
+  EXPECT_NE(conversation.identifier("process"), "");
+  real.install({});
+  const auto failed = await(std::move(waiting));
+  ASSERT_TRUE(failed);
+  EXPECT_TRUE(isOfKind(failed->error, ExtensionHostErrorCode::bundleIsGone));
+}
+
+TEST_F(LinuxExtensionHostTest, ARequestThatWaitsForAProcessFailsWhenTheBundleIsRemovedAndNoneIsStarted) {
+  std::promise<std::optional<QXError>> answer;
+  RealExtensions real;
+  const Bundle other = real.makeBundle("com.orvane.a");
+  const Bundle last = real.makeBundle("com.orvane.c");
+  const auto set = real.extensions({other, real.makeBundle("com.orvane.b"), last});
+  ASSERT_EQ(set.size(), 3U);
+  std::promise<void> mayGoOn;
+  std::promise<void> isHeldUp;
+  // The first request's completion holds up the thread that starts processes.
+  set[0]->beginExtensionRequest([&mayGoOn, &isHeldUp](std::optional<QXUUID>, std::optional<QXError>) {
+    isHeldUp.set_value();
+    mayGoOn.get_future().wait();
+  });
+  isHeldUp.get_future().wait();
+  set[1]->beginExtensionRequest(
+      [&answer](const std::optional<QXUUID>&, std::optional<QXError> error) { answer.set_value(std::move(error)); });
+  real.install({other, last});
+  const auto error = await(answer.get_future());
+  mayGoOn.set_value();
+  ASSERT_TRUE(error);
+  EXPECT_TRUE(isOfKind(*error, ExtensionHostErrorCode::bundleIsGone));
+  EXPECT_TRUE(isOfKind(Conversation(set[1]).error(), ExtensionHostErrorCode::bundleIsGone));
+  // The thread starts one after another, and makes the container of what it starts.
+  ASSERT_FALSE(Conversation(set[2]).error());
+  EXPECT_TRUE(std::filesystem::exists(last.container));
+  EXPECT_FALSE(std::filesystem::exists(real.home() + "/containers/com.orvane.b"));
 }
 
 TEST_F(LinuxExtensionHostTest, NoProcessOutlivesTheHost) {
@@ -464,18 +659,13 @@ TEST_F(LinuxExtensionHostTest, TheStatusOfAnExtensionThatBacksOffSaysForHowLong)
   EXPECT_EQ(status, (QXDictionary{{"state", "backing off"}, {"openRequests", 0}, {"badLivesInARow", 2}}));
 }
 
-TEST_F(LinuxExtensionHostTest, ARemovedExtensionHasAStatusAsLongAsItHasRequests) {
+TEST_F(LinuxExtensionHostTest, ARemovedExtensionHasAStatusAsLongAsItHasAProcess) {
   RealExtensions real;
   const auto extension = real.extension();
-  {
-    const Conversation conversation(extension);
-    ASSERT_FALSE(conversation.error());
-    Reports later;
-    real.install({});
-    const auto match = real.match(later);  // looked at in the same pass or in a later one
-    ASSERT_TRUE(later.await(0));
-    EXPECT_FALSE(real.status().empty());
-  }
+  const Conversation conversation(extension);
+  ASSERT_FALSE(conversation.error());
+  EXPECT_FALSE(real.status().empty());
+  real.install({});
   const auto deadline = std::chrono::steady_clock::now() + kPatience;
   while (!real.host().status().empty() && std::chrono::steady_clock::now() < deadline) std::this_thread::yield();
   EXPECT_EQ(real.host().status(), QXDictionary{});

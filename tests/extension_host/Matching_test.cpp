@@ -44,6 +44,7 @@ TEST(Matching, AnythingThatAProcessDependsOnMakesAnotherInstallation) {
   EXPECT_TRUE(isSameInstallation(bundle, bundle));
   const std::vector<std::pair<const char*, std::function<void(Bundle&)>>> changes = {
       {"identifier", [](Bundle& changed) { changed.identifier = "b"; }},
+      {"incarnation", [](Bundle& changed) { changed.incarnation = "2"; }},
       {"version", [](Bundle& changed) { changed.version = "2"; }},
       {"directory", [](Bundle& changed) { changed.directory = "/d"; }},
       {"executable", [](Bundle& changed) { changed.executable = "/e"; }},
@@ -56,6 +57,47 @@ TEST(Matching, AnythingThatAProcessDependsOnMakesAnotherInstallation) {
     Bundle changed = bundle;
     change(changed);
     EXPECT_FALSE(isSameInstallation(bundle, changed)) << name;
+  }
+}
+
+TEST(Matching, AnEditLeavesTheBundleTheSameAndTakesNothingFromAProcess) {
+  Bundle bundle = bundleWith(QXDictionary{{"point", "p"}});
+  bundle.identifier = "com.orvane.a";
+  bundle.incarnation = "1";
+  bundle.version = "1";
+  bundle.entitlements = {{"k", true}};
+  bundle.groups = {{"g", "/g"}, {"h", "/h"}};
+  using Changes = std::vector<std::pair<const char*, std::function<void(Bundle&)>>>;
+  const Changes edits = {
+      {"nothing", [](Bundle&) {}},
+      {"version", [](Bundle& changed) { changed.version = "2"; }},
+      {"executable", [](Bundle& changed) { changed.executable = "/e"; }},
+      {"info", [](Bundle& changed) { changed.info.emplace("k", "v"); }},
+      {"a group more", [](Bundle& changed) { changed.groups.emplace("f", "/f"); }},
+  };
+  for (const auto& [name, change] : edits) {
+    Bundle changed = bundle;
+    change(changed);
+    EXPECT_TRUE(isEditOf(bundle, changed)) << name;
+  }
+  const Changes others = {
+      {"identifier", [](Bundle& changed) { changed.identifier = "b"; }},
+      {"incarnation", [](Bundle& changed) { changed.incarnation = "2"; }},
+      {"directory", [](Bundle& changed) { changed.directory = "/d"; }},
+      {"container", [](Bundle& changed) { changed.container = "/c"; }},
+      {"an entitlement less", [](Bundle& changed) { changed.entitlements.clear(); }},
+      {"a group less", [](Bundle& changed) { changed.groups.erase("g"); }},
+      {"a group's directory", [](Bundle& changed) { changed.groups["g"] = "/other"; }},
+      {"a group for another",
+       [](Bundle& changed) {
+         changed.groups.erase("g");
+         changed.groups.emplace("f", "/f");
+       }},
+  };
+  for (const auto& [name, change] : others) {
+    Bundle changed = bundle;
+    change(changed);
+    EXPECT_FALSE(isEditOf(bundle, changed)) << name;
   }
 }
 

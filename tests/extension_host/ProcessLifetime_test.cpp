@@ -66,34 +66,89 @@ TEST_F(ProcessLifetimeTest, AnIdleProcessLingersFromTheEndOfItsLastRequest) {
   startRunning(1);
   ASSERT_EQ(lifetime.begin(request(2), now), Begin::join);
   lifetime.finish(request(1), now);
-  EXPECT_FALSE(lifetime.idleDeadline());
+  EXPECT_FALSE(lifetime.deadline());
   now += kOne;
   lifetime.finish(request(2), now);
-  EXPECT_EQ(lifetime.idleDeadline(), now + times.linger);
+  EXPECT_EQ(lifetime.deadline(), now + times.linger);
 }
 
 TEST_F(ProcessLifetimeTest, FinishingTwiceOrTheUnknownDoesNotLengthenTheLinger) {
   startRunning(1);
   lifetime.finish(request(1), now);
-  const auto deadline = lifetime.idleDeadline();
+  const auto deadline = lifetime.deadline();
   lifetime.finish(request(1), now + kOne);
   lifetime.finish(request(9), now + kOne);
-  EXPECT_EQ(lifetime.idleDeadline(), deadline);
+  EXPECT_EQ(lifetime.deadline(), deadline);
 }
 
 TEST_F(ProcessLifetimeTest, ARequestDuringTheLingerKeepsTheProcess) {
   startRunning(1);
   lifetime.finish(request(1), now);
   EXPECT_EQ(lifetime.begin(request(2), now + times.linger - kOne), Begin::join);
-  EXPECT_FALSE(lifetime.idleDeadline());
+  EXPECT_FALSE(lifetime.deadline());
 }
 
-TEST_F(ProcessLifetimeTest, ARetiredExtensionsProcessDoesNotLinger) {
+TEST_F(ProcessLifetimeTest, ARetiredProcessServesRequestsUntilItsEndAndDoesNotLinger) {
   startRunning(1);
-  lifetime.retire();
-  EXPECT_FALSE(lifetime.idleDeadline());
+  const auto end = now + 2 * kOne;
+  lifetime.retire(end);
+  EXPECT_TRUE(lifetime.isRetired());
+  EXPECT_EQ(lifetime.deadline(), end);
+  now += kOne;
+  EXPECT_FALSE(lifetime.isOver(now));
+  EXPECT_EQ(lifetime.begin(request(2), now), Begin::join);
   lifetime.finish(request(1), now);
-  EXPECT_EQ(lifetime.idleDeadline(), now);
+  EXPECT_EQ(lifetime.deadline(), end);
+  lifetime.finish(request(2), now);
+  EXPECT_EQ(lifetime.deadline(), now);
+}
+
+TEST_F(ProcessLifetimeTest, ARetiredProcessIsOverAtItsEndWhateverIsOpenAndItsRequestsAreForgotten) {
+  startRunning(1);
+  lifetime.retire(now + kOne);
+  now += kOne;
+  EXPECT_TRUE(lifetime.isOver(now));
+  EXPECT_TRUE(lifetime.isOpen(request(1)));
+  lifetime.ended();
+  EXPECT_FALSE(lifetime.isOpen(request(1)));
+  EXPECT_EQ(lifetime.requests(), 0U);
+  EXPECT_FALSE(lifetime.deadline());
+  lifetime.lost(Cause::died, now);
+  EXPECT_EQ(lifetime.badLivesInARow(), 0) << "it did not die by itself";
+  EXPECT_EQ(lifetime.gone(), Next::nothing);
+}
+
+TEST_F(ProcessLifetimeTest, WhatIsOverRefusesRequestsForGood) {
+  lifetime.retire(now);
+  EXPECT_EQ(lifetime.begin(request(1), now), Begin::refuse);
+  EXPECT_EQ(lifetime.begin(request(1), now + 1000 * times.longestBackOff), Begin::refuse);
+  EXPECT_EQ(lifetime.requests(), 0U);
+}
+
+TEST_F(ProcessLifetimeTest, WhatIsOverStartsNoProcessForThoseWhoWaitedForTheNextOne) {
+  startRunning(1);
+  lifetime.lost(Cause::died, now);
+  ASSERT_EQ(lifetime.begin(request(2), now), Begin::wait);
+  lifetime.retire(now);
+  lifetime.ended();
+  EXPECT_EQ(lifetime.gone(), Next::nothing);
+}
+
+TEST_F(ProcessLifetimeTest, AProcessThatIsStillStartingWhenItIsOverStartsWithoutRequests) {
+  ASSERT_EQ(lifetime.begin(request(1), now), Begin::start);
+  lifetime.retire(now);
+  lifetime.ended();
+  lifetime.started(now);
+  EXPECT_FALSE(lifetime.isOpen(request(1)));
+  EXPECT_EQ(lifetime.deadline(), now);
+}
+
+TEST_F(ProcessLifetimeTest, TheEarliestEndOfARetiredProcessCounts) {
+  startRunning(1);
+  lifetime.retire(now + 2 * kOne);
+  lifetime.retire(now + kOne);
+  lifetime.retire(now + 3 * kOne);
+  EXPECT_EQ(lifetime.deadline(), now + kOne);
 }
 
 TEST_F(ProcessLifetimeTest, DeathForgetsTheRequests) {

@@ -120,6 +120,8 @@ inline const char* nameOf(linux_platform::ExtensionHostErrorCode code) {
       return "ended";
     case stopped:
       return "stopped";
+    case bundleIsGone:
+      return "bundleIsGone";
   }
   return nullptr;
 }

@@ -17,10 +17,15 @@ enum class ExtensionHostErrorCode : std::int64_t {
   notAnswering = 3,  // its process was ended because an answer took too long
   ended = 4,         // its process ended
   stopped = 5,       // the extension host is going away
+  bundleIsGone = 6,  // its bundle was removed or replaced; the one that is installed now, if any, is another extension
 };
 
 [[nodiscard]] inline QXError extensionHostError(ExtensionHostErrorCode code, std::string description) {
   return QXError::make(kExtensionHostErrorDomain, static_cast<std::int64_t>(code), std::move(description));
+}
+
+[[nodiscard]] inline QXError bundleIsGoneError(const std::string& identifier) {
+  return extensionHostError(ExtensionHostErrorCode::bundleIsGone, "The bundle of " + identifier + " was removed or replaced.");
 }
 
 }  // namespace docuvend::linux_platform

@@ -1,11 +1,11 @@
 // How a process ends
 //
 //   alive ──(end)──────────────▶ closed ──(grace)──▶ terminated ──(grace)──▶ killed ──▶ reaped
-//     └──(connection over, death, overdue answer)──────────────────────────▶ killed ──▶ reaped
+//     └──(connection over, death, overdue answer, bundle gone)─────────────▶ killed ──▶ reaped
 //
-// A process whose connection is over without our doing can do nothing more for us, so it is killed at once; one that we let go may finish
-// what it is about. Every signal goes through the pidfd, so it can reach no other process. From any stage the process may die by itself;
-// whatever comes, it is reaped exactly once, by the watch on the pidfd or by the destructor.
+// A process whose connection is over without our doing can do nothing more for us, and one whose bundle is gone must not, so they are
+// killed at once; one that we let go may finish what it is about. Every signal goes through the pidfd, so it can reach no other process.
+// From any stage the process may die by itself; whatever comes, it is reaped exactly once, by the watch on the pidfd or by the destructor.
 //
 // Killing and reaping happen under the event lock, so what is killed has not been reaped.
 //
@@ -191,10 +191,20 @@ void ExtensionProcess::end() {
 
 void ExtensionProcess::endAtOnce() {
   const std::lock_guard lock(eventMutex_);
+  endAtOnceBecause(extensionHostError(ExtensionHostErrorCode::stopped, "The extension host is stopping."));
+}
+
+void ExtensionProcess::endWithItsBundle() {
+  const std::lock_guard lock(eventMutex_);
+  if (stage_ == Stage::alive) qxLog(log_, "[NOTICE] The bundle of %@ was removed or replaced: its process is ended.", identifier_);
+  endAtOnceBecause(bundleIsGoneError(identifier_));
+}
+
+void ExtensionProcess::endAtOnceBecause(const QXError& why) {
   if (stage_ == Stage::killed) return;
   isLetGo_ = true;
   if (std::exchange(stage_, Stage::killed) == Stage::alive) handlers_.onLost(ProcessLifetime::Cause::died);
-  closeAndKill(extensionHostError(ExtensionHostErrorCode::stopped, "The extension host is stopping."));
+  closeAndKill(why);
 }
 
 std::shared_ptr<QXRpcProxy> ExtensionProcess::remoteObjectProxy(QXErrorHandler errorHandler) {

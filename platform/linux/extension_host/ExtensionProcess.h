@@ -64,8 +64,10 @@ class ExtensionProcess : public std::enable_shared_from_this<ExtensionProcess> {
   void resume();
   // Closes the connection; then, if that does not make the process end by itself, by signal.
   void end();
-  // Without any such patience.
+  // Without any such patience, because the host stops.
   void endAtOnce();
+  // The same, because its bundle was removed or replaced: an answer that is on its way is not taken any more. The log tells of it.
+  void endWithItsBundle();
   // Looks whether the connection is over. Messages are told of that before anybody else is, so whoever tries again at once must look.
   void noticeEnd();
 
@@ -92,6 +94,7 @@ class ExtensionProcess : public std::enable_shared_from_this<ExtensionProcess> {
   void lookForOverdueAnswers();
   void askForSignOfLife();
   // With the event lock.
+  void endAtOnceBecause(const QXError& why);
   void closeAndKill(const QXError& why);
   [[nodiscard]] AnswerDeadlines::Message expectAnswer(AnswerLine line, const std::string& operationName);
   void gotAnswer(const AnswerDeadlines::Message& message);

@@ -88,7 +88,7 @@ void LinuxExtension::beginExtensionRequest(BeginCompletion completion) {
     const std::lock_guard lock(mutex_);
     begin = isStopped_ ? ProcessLifetime::Begin::refuse : lifetime_.begin(request, Clock::now());
     if (begin == ProcessLifetime::Begin::join) joined = process_;
-    if (begin == ProcessLifetime::Begin::refuse) refusal = isStopped_ ? hostIsStopping() : backingOffError();
+    if (begin == ProcessLifetime::Begin::refuse) refusal = refusalError();
     if (begin == ProcessLifetime::Begin::start || begin == ProcessLifetime::Begin::wait) {
       waiting_.push_back({request, LogSubject::carrying(std::move(completion))});
     }
@@ -112,8 +112,8 @@ void LinuxExtension::beginExtensionRequest(BeginCompletion completion) {
 void LinuxExtension::cancelExtensionRequest(const QXUUID& request) {
   const std::lock_guard lock(mutex_);
   lifetime_.finish(request, Clock::now());
-  // A timer that is set looks at the deadline of its time and is set again if that lies ahead.
-  if (!idleTimerIsSet_) setIdleTimer(lifetime_.idleDeadline());
+  // A timer that is set looks at the deadline of its time and is set again if that lies ahead. The grace of a retired one may be far ahead.
+  if (!endTimerIsSet_ || lifetime_.isRetired()) setEndTimer();
 }
 
 std::shared_ptr<QXExtensionContext> LinuxExtension::extensionContextForRequest(const QXUUID& request) {
@@ -127,25 +127,29 @@ std::shared_ptr<QXExtensionContext> LinuxExtension::extensionContextForRequest(c
       std::make_shared<ExtensionConnection>(process_, bundle_.entitlements, std::move(onFailedMessage)));
 }
 
-void LinuxExtension::retire() {
-  const std::lock_guard lock(mutex_);
-  lifetime_.retire();
-  setIdleTimer(lifetime_.idleDeadline());
+void LinuxExtension::retire(Retirement how) {
+  {
+    const std::lock_guard lock(mutex_);
+    const auto now = Clock::now();
+    lifetime_.retire(how == Retirement::atOnce ? now : now + services_->times.updateGrace);
+  }
+  endWhenDue();
 }
 
-void LinuxExtension::setIdleTimer(const std::optional<ProcessLifetime::Time>& deadline) {
-  idleTimerIsSet_ = deadline.has_value();
-  if (deadline) idleTimer_->setFor(*deadline);
+void LinuxExtension::setEndTimer() {
+  const std::optional<ProcessLifetime::Time> deadline = lifetime_.deadline();
+  endTimerIsSet_ = deadline.has_value();
+  if (deadline) endTimer_->setFor(*deadline);
 }
 
-bool LinuxExtension::hasIdleTimer() {
+bool LinuxExtension::hasEndTimer() {
   const std::lock_guard lock(mutex_);
-  if (!idleTimer_ || !idleTimer_->isUsable()) {
-    idleTimer_ = std::make_unique<Timer>(services_->reactor, [weak = weak_from_this()] {
-      if (const auto strongSelf = weak.lock()) strongSelf->endWhenIdleForLong();
+  if (!endTimer_ || !endTimer_->isUsable()) {
+    endTimer_ = std::make_unique<Timer>(services_->reactor, [weak = weak_from_this()] {
+      if (const auto strongSelf = weak.lock()) strongSelf->endWhenDue();
     });
   }
-  return idleTimer_->isUsable();
+  return endTimer_->isUsable();
 }
 
 void LinuxExtension::stop() {
@@ -172,6 +176,10 @@ void LinuxExtension::startOnSpawner() {
 }
 
 void LinuxExtension::start() {
+  if (isOver()) {
+    didNotStart(bundleIsGoneError(bundle_.identifier));
+    return;
+  }
   auto made = makeProcess();
   if (auto* error = std::get_if<QXError>(&made)) {
     didNotStart(notStarted(bundle_.identifier, std::move(*error)));
@@ -184,7 +192,7 @@ std::variant<std::shared_ptr<ExtensionProcess>, QXError> LinuxExtension::makePro
   // A confinement that root makes keeps far too little out.
   if (geteuid() == 0) return QXError::system(EPERM, "extensions are not started by root");
 
-  if (!hasIdleTimer()) return couldNotBeWatched();
+  if (!hasEndTimer()) return couldNotBeWatched();
   std::array<int, 2> sockets{};
   if (socketpair(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC | SOCK_NONBLOCK, 0, sockets.data()) != 0) {
     return QXError::system(errno, "a socket for an extension could not be made");
@@ -226,14 +234,16 @@ void LinuxExtension::didStart(std::shared_ptr<ExtensionProcess> process) {
   bool isTooLate = false;
   {
     const std::lock_guard lock(mutex_);
-    lifetime_.started(Clock::now());
-    ready.swap(waiting_);
+    const auto now = Clock::now();
+    lifetime_.started(now);
+    if (!lifetime_.isOver(now)) ready.swap(waiting_);
     isTooLate = isStopped_;
     if (!isTooLate) process_ = process;
   }
   process->resume();
   if (isTooLate) process->endAtOnce();
   process->watchLiveness();
+  endWhenDue();
   for (const Waiting& waiting : ready) waiting.completion(waiting.request, /*error=*/std::nullopt);
 }
 
@@ -245,6 +255,11 @@ void LinuxExtension::didNotStart(const QXError& why) {
     failed.swap(waiting_);
   }
   for (const Waiting& waiting : failed) waiting.completion(/*request=*/std::nullopt, why);
+}
+
+bool LinuxExtension::isOver() const {
+  const std::lock_guard lock(mutex_);
+  return lifetime_.isOver(Clock::now());
 }
 
 bool LinuxExtension::hasRequests() const {
@@ -268,18 +283,27 @@ void LinuxExtension::processIsGone() {
   if (next == ProcessLifetime::Next::start) startOnSpawner();
 }
 
-void LinuxExtension::endWhenIdleForLong() {
+void LinuxExtension::endWhenDue() {
   std::shared_ptr<ExtensionProcess> idle;
+  std::shared_ptr<ExtensionProcess> retired;
+  std::vector<Waiting> refused;
   {
     const std::lock_guard lock(mutex_);
-    const std::optional<ProcessLifetime::Time> deadline = lifetime_.idleDeadline();
-    if (deadline && *deadline <= Clock::now()) {
+    const auto now = Clock::now();
+    const std::optional<ProcessLifetime::Time> deadline = lifetime_.deadline();
+    if (lifetime_.isOver(now)) {
+      lifetime_.ended();
+      retired = process_;
+      refused.swap(waiting_);
+    } else if (deadline && *deadline <= now) {
       lifetime_.endedIdle();
       idle = process_;
     }
-    setIdleTimer(idle ? std::nullopt : deadline);
+    setEndTimer();
   }
   if (idle) idle->end();
+  if (retired) retired->endWithItsBundle();
+  for (const Waiting& waiting : refused) waiting.completion(/*request=*/std::nullopt, bundleIsGoneError(bundle_.identifier));
 }
 
 std::optional<QXDictionary> LinuxExtension::status() const {
@@ -301,6 +325,11 @@ std::optional<QXDictionary> LinuxExtension::status() const {
 std::chrono::milliseconds LinuxExtension::backOffLeft() const {
   const auto now = Clock::now();
   return std::chrono::ceil<std::chrono::milliseconds>(lifetime_.refusedUntil(now).value_or(now) - now);
+}
+
+QXError LinuxExtension::refusalError() const {
+  if (isStopped_) return hostIsStopping();
+  return lifetime_.isOver(Clock::now()) ? bundleIsGoneError(bundle_.identifier) : backingOffError();
 }
 
 QXError LinuxExtension::backingOffError() const {

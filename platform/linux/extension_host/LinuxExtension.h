@@ -57,8 +57,14 @@ class LinuxExtension : public QXExtension, public std::enable_shared_from_this<L
   void cancelExtensionRequest(const QXUUID& request) override;
   [[nodiscard]] std::shared_ptr<QXExtensionContext> extensionContextForRequest(const QXUUID& request) override;
 
-  // The bundle was updated or removed: requests are served as before, but the process does not linger.
-  void retire();
+  enum class Retirement {
+    atOnce,      // the bundle was removed, or another is in its place
+    afterGrace,  // it was edited where it is, and the process has nothing that the edited one has not
+  };
+  // The bundle is not what it was. At once: its process is ended, messages and requests that wait fail, and so do requests from now on.
+  // After the grace: the same then (ExtensionTimes::updateGrace); until then requests are served as before, but the process does not
+  // linger. May be called again; the first end counts. Completions of requests that wait for a process run before it returns.
+  void retire(Retirement how);
   // What LinuxExtensionHost::status says of it; nothing once it is retired and has neither a process nor requests.
   [[nodiscard]] std::optional<QXDictionary> status() const;
   // The host goes: ends the process at once; requests fail from now on.
@@ -74,31 +80,34 @@ class LinuxExtension : public QXExtension, public std::enable_shared_from_this<L
 
   [[nodiscard]] std::shared_ptr<ExtensionProcess> presentProcess() const;
   // False: there is none to be had, and a process would never be let go.
-  [[nodiscard]] bool hasIdleTimer();
+  [[nodiscard]] bool hasEndTimer();
   void startOnSpawner();
   void start();
   [[nodiscard]] std::variant<std::shared_ptr<ExtensionProcess>, QXError> makeProcess();
   void didStart(std::shared_ptr<ExtensionProcess> process);
   void didNotStart(const QXError& why);
+  [[nodiscard]] bool isOver() const;
   [[nodiscard]] bool hasRequests() const;
   void processIsLost(ProcessLifetime::Cause cause);
   void processIsGone();
-  void endWhenIdleForLong();
+  // Ends the process when it has been idle for long, or is over.
+  void endWhenDue();
   // With the lock.
-  void setIdleTimer(const std::optional<ProcessLifetime::Time>& deadline);
+  void setEndTimer();
   [[nodiscard]] std::chrono::milliseconds backOffLeft() const;
+  [[nodiscard]] QXError refusalError() const;
   [[nodiscard]] QXError backingOffError() const;
 
   // Constant after construction.
   const Bundle bundle_;
   const QXExtensionContextClass contextClass_;
   const std::shared_ptr<ExtensionServices> services_;
-  mutable std::mutex mutex_;          // guards all below; no handler and no operation of a process is called with it
-  std::unique_ptr<Timer> idleTimer_;  // none before the first process
+  mutable std::mutex mutex_;         // guards all below; no handler and no operation of a process is called with it
+  std::unique_ptr<Timer> endTimer_;  // none before the first process
   ProcessLifetime lifetime_;
   std::vector<Waiting> waiting_;
   std::shared_ptr<ExtensionProcess> process_;
-  bool idleTimerIsSet_ = false;
+  bool endTimerIsSet_ = false;
   bool isStopped_ = false;
 };
 

@@ -1,6 +1,8 @@
-// One thread looks at the installed bundles when the registry says that something changed, or when a match begins. It looks at all matches
-// then: each compares what is installed with the set that it reported last, takes over the objects of what is still the same, and reports
-// only if an object came or went. Changes that arrive meanwhile make it look again; two that arrive together make it look once.
+// One thread looks at the installed bundles when the registry says that something changed, or when a match begins. First it retires every
+// extension whose bundle is not what it was, whichever match made it and whether or not that is still there: a slow handler must not keep
+// the process of a bundle that is gone. Then it looks at all matches: each compares what is installed with the set that it reported last,
+// takes over the objects of what is still the same, and reports only if an object came or went. Changes that arrive meanwhile make it look
+// again; two that arrive together make it look once.
 #include "platform/linux/extension_host/LinuxExtensionHost.h"
 
 #include <algorithm>
@@ -43,7 +45,8 @@ struct LinuxExtensionHost::State {
 
   // The matching thread.
   void run();
-  void update(MatchState& match);
+  void retireOutdated(const std::vector<Bundle>& installed);
+  void update(MatchState& match, const std::vector<Bundle>& installed);
 
   BundleRegistry& bundles;
   const std::shared_ptr<ExtensionServices> services;
@@ -80,8 +83,10 @@ void LinuxExtensionHost::State::run() {
       std::erase_if(matches, [](const std::weak_ptr<MatchState>& match) { return match.expired(); });
       present = matches;
     }
+    const std::vector<Bundle> installed = bundles.all();
+    retireOutdated(installed);
     for (const auto& weak : present) {
-      if (const auto match = weak.lock()) update(*match);
+      if (const auto match = weak.lock()) update(*match, installed);
     }
   }
 }
@@ -101,17 +106,30 @@ Extensions LinuxExtensionHost::State::extensions() {
   return result;
 }
 
-void LinuxExtensionHost::State::update(MatchState& match) {
+void LinuxExtensionHost::State::retireOutdated(const std::vector<Bundle>& installed) {
+  for (const auto& extension : extensions()) {
+    const Bundle& before = extension->bundle();
+    const auto now = std::find_if(installed.begin(), installed.end(),
+                                  [&before](const Bundle& bundle) { return bundle.identifier == before.identifier; });
+    if (now == installed.end()) {
+      extension->retire(LinuxExtension::Retirement::atOnce);
+    } else if (!isSameInstallation(before, *now)) {
+      extension->retire(isEditOf(before, *now) ? LinuxExtension::Retirement::afterGrace : LinuxExtension::Retirement::atOnce);
+    }
+  }
+}
+
+void LinuxExtensionHost::State::update(MatchState& match, const std::vector<Bundle>& installed) {
   Extensions leftovers = match.reported.value_or(Extensions{});
   Extensions present;
   bool isChanged = !match.reported;
-  for (Bundle& bundle : bundles.all()) {
+  for (const Bundle& bundle : installed) {
     if (!hasAttributes(bundle, match.attributes)) continue;
     const auto same = std::find_if(leftovers.begin(), leftovers.end(), [&bundle](const std::shared_ptr<LinuxExtension>& extension) {
       return isSameInstallation(extension->bundle(), bundle);
     });
     if (same == leftovers.end()) {
-      present.push_back(LinuxExtension::create(std::move(bundle), match.contextClass, services));
+      present.push_back(LinuxExtension::create(bundle, match.contextClass, services));
       keep(present.back());
       isChanged = true;
     } else {
@@ -119,7 +137,6 @@ void LinuxExtensionHost::State::update(MatchState& match) {
       leftovers.erase(same);
     }
   }
-  for (const auto& extension : leftovers) extension->retire();
   if (!isChanged && leftovers.empty()) return;
   match.reported = present;
   match.handler(std::vector<std::shared_ptr<QXExtension>>(present.begin(), present.end()), /*error=*/std::nullopt);

@@ -16,8 +16,15 @@ bool hasAttributes(const Bundle& bundle, const QXExtensionHost::Attributes& attr
 
 bool isSameInstallation(const Bundle& a, const Bundle& b) {
   // The groups may change with another bundle's installation.
-  return a.identifier == b.identifier && a.version == b.version && a.directory == b.directory && a.executable == b.executable &&
-         a.info == b.info && a.entitlements == b.entitlements && a.groups == b.groups && a.container == b.container;
+  return a.identifier == b.identifier && a.incarnation == b.incarnation && a.version == b.version && a.directory == b.directory &&
+         a.executable == b.executable && a.info == b.info && a.entitlements == b.entitlements && a.groups == b.groups &&
+         a.container == b.container;
+}
+
+bool isEditOf(const Bundle& before, const Bundle& now) {
+  return before.identifier == now.identifier && before.directory == now.directory && before.incarnation == now.incarnation &&
+         before.container == now.container && before.entitlements == now.entitlements &&
+         std::includes(now.groups.begin(), now.groups.end(), before.groups.begin(), before.groups.end());
 }
 
 }  // namespace docuvend::linux_platform

@@ -11,6 +11,7 @@ constexpr int kBadLivesBeforeBackOff = 2;
 }  // namespace
 
 ProcessLifetime::Begin ProcessLifetime::begin(const QXUUID& request, Time now) {
+  if (isOver(now)) return Begin::refuse;
   if (phase_ == Phase::running) {
     open_.insert(request);
     return Begin::join;
@@ -65,9 +66,18 @@ ProcessLifetime::Next ProcessLifetime::gone() {
   return phase_ == Phase::starting ? Next::start : Next::nothing;
 }
 
-std::optional<ProcessLifetime::Time> ProcessLifetime::idleDeadline() const {
-  if (phase_ != Phase::running || !open_.empty()) return std::nullopt;
-  return retired_ ? idleSince_ : idleSince_ + times_.linger;
+void ProcessLifetime::retire(Time end) { retiredUntil_ = retiredUntil_ ? std::min(*retiredUntil_, end) : end; }
+
+void ProcessLifetime::ended() {
+  if (phase_ == Phase::running) phase_ = Phase::ending;
+  open_.clear();
+  waiting_.clear();
+}
+
+std::optional<ProcessLifetime::Time> ProcessLifetime::deadline() const {
+  if (phase_ != Phase::running) return std::nullopt;
+  if (!open_.empty()) return retiredUntil_;
+  return retiredUntil_ ? std::min(idleSince_, *retiredUntil_) : idleSince_ + times_.linger;
 }
 
 std::optional<ProcessLifetime::Time> ProcessLifetime::refusedUntil(Time now) const {

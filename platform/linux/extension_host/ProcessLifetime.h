@@ -5,6 +5,9 @@
 //
 // A process that died quickly, could not be started, or was ended because it did not answer counts as a bad life. The first in a row has
 // no consequence; from the second on, requests are refused for a while that doubles each time. A good life ends the row.
+//
+// What is installed may go, or be another: then the process is retired. Until a time that its owner says it serves requests and is not kept
+// without any; then it is over, whatever is open: requests are refused for good.
 #pragma once
 
 #include <chrono>
@@ -24,7 +27,7 @@ class ProcessLifetime {
     start,   // start a process; the request waits for it
     wait,    // the request waits for the process that is starting, or for the one that follows the one that is ending
     join,    // the process runs and the request is open
-    refuse,  // backing off; the request is forgotten
+    refuse,  // backing off, or over; the request is forgotten
   };
   enum class Cause { died, notAnswering };
   enum class Next { nothing, start };
@@ -47,17 +50,22 @@ class ProcessLifetime {
   // The process is gone. `start`: requests wait for the next one.
   [[nodiscard]] Next gone();
 
-  // When the running process is to be ended, as long as no request begins. None while it has requests or does not run.
-  [[nodiscard]] std::optional<Time> idleDeadline() const;
+  // When the running process is to be ended, as long as no request begins. None when it does not run, and, unless it is retired, while it
+  // has requests.
+  [[nodiscard]] std::optional<Time> deadline() const;
   // The end of the present back-off, if it lies ahead.
   [[nodiscard]] std::optional<Time> refusedUntil(Time now) const;
   [[nodiscard]] int badLivesInARow() const { return badLives_; }
   [[nodiscard]] Phase phase() const { return phase_; }
   // Open ones, and those that wait for a process.
   [[nodiscard]] std::size_t requests() const { return open_.size() + waiting_.size(); }
-  // The installation that this process belongs to was replaced or removed: idle processes are not kept any more.
-  void retire() { retired_ = true; }
-  [[nodiscard]] bool isRetired() const { return retired_; }
+
+  // The installation that this process belongs to was updated, replaced or removed: the process is over at `end`. The earliest end counts.
+  void retire(Time end);
+  [[nodiscard]] bool isRetired() const { return retiredUntil_.has_value(); }
+  [[nodiscard]] bool isOver(Time now) const { return retiredUntil_ && *retiredUntil_ <= now; }
+  // It is over, and the process, if it runs, is being ended: all requests are forgotten, those that wait too.
+  void ended();
 
  private:
   void countBadLife(Time now);
@@ -70,7 +78,7 @@ class ProcessLifetime {
   Time idleSince_;
   int badLives_ = 0;
   std::optional<Time> refusedUntil_;
-  bool retired_ = false;
+  std::optional<Time> retiredUntil_;
 };
 
 }  // namespace docuvend::linux_platform

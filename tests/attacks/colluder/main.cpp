@@ -5,17 +5,20 @@
 //   url          the URL that itemURL answers; without it the one of the file of that name
 //
 // To start providing the item "x" is to exchange the names "x" and "x.decoy" of the storage again and again, until the file "enough" lies
-// in its container; how often is said on the standard error output.
+// in its container; how often is said on the standard error output. To start providing the item "never" is not to answer until that file
+// lies there, and to copy meanwhile what is in the file "secret" of the container to the file "seen".
 #include <fcntl.h>
 #include <stdio.h>
 #include <unistd.h>
 
 #include <cerrno>
+#include <chrono>
 #include <filesystem>
 #include <fstream>
 #include <iterator>
 #include <optional>
 #include <string>
+#include <thread>
 
 #include "sdk/Provider.h"
 
@@ -24,6 +27,7 @@ namespace {
 
 // A test that ended without a word is not waited for.
 constexpr long kMostExchanges = 50'000'000;
+constexpr long kMostLooks = 600'000;
 
 std::optional<std::string> written(const std::string& name) {
   std::ifstream file(name, std::ios::binary);
@@ -42,6 +46,16 @@ std::string nameOf(const QXURL& url) {
   return path.substr(path.rfind('/') + 1);
 }
 
+bool isEnough() { return ::access("enough", F_OK) == 0; }
+
+void lookAround() {
+  std::ofstream("seen") << "nothing yet";
+  for (long look = 0; look < kMostLooks && !isEnough(); ++look) {
+    if (const auto secret = written("secret")) std::ofstream("seen") << *secret;
+    std::this_thread::sleep_for(std::chrono::milliseconds(1));
+  }
+}
+
 class Colluder : public Provider {
  public:
   [[nodiscard]] Failure performInitialSetup() override {
@@ -58,12 +72,16 @@ class Colluder : public Provider {
   [[nodiscard]] Failure providePlaceholder(const QXURL&) override { return std::nullopt; }
 
   [[nodiscard]] Failure startProviding(const QXURL& url) override {
+    if (nameOf(url) == "never") {
+      lookAround();
+      return std::nullopt;
+    }
     const std::string name = storage() + "/" + nameOf(url);
     const std::string decoy = name + ".decoy";
     long count = 0;
     while (count < kMostExchanges && ::renameat2(AT_FDCWD, name.c_str(), AT_FDCWD, decoy.c_str(), RENAME_EXCHANGE) == 0) {
       ++count;
-      if (::access("enough", F_OK) == 0) break;
+      if (isEnough()) break;
     }
     std::fprintf(stderr, "has exchanged %s %ld times\n", nameOf(url).c_str(), count);
     return std::nullopt;
