@@ -12,24 +12,12 @@
 
 namespace docuvend {
 
-// One telling of a provider that a file was written.
-class QXWriteNotice {
- public:
-  QXWriteNotice() = default;
-  QXWriteNotice(const QXWriteNotice&) = delete;
-  QXWriteNotice& operator=(const QXWriteNotice&) = delete;
-  virtual ~QXWriteNotice() = default;
-
-  // The provider may not have heard of it, and is to be told again. On any thread, any number of times.
-  virtual void failed() = 0;
-};
-
 // Names a reader or a writer to the provider; only printed.
 struct QXCoordinationID {
   std::string value;
-  // A writer's is kept as long as the provider is being told of the write: when the last copy goes, the service takes that to be over, and
-  // the provider to have been told unless it was said that this failed. May be dropped on any thread.
-  std::shared_ptr<QXWriteNotice> untilTold = {};
+  // A writer's is kept as long as the provider is being told of the write: when the last copy goes, the service takes that to be over,
+  // however it went. May be dropped on any thread.
+  std::shared_ptr<const void> untilTold = {};
 };
 
 // What a provider object answers. Called on threads of the service's choosing.

@@ -132,9 +132,9 @@ class DVExtensionDocuvend final : public QXDocuvend, public std::enable_shared_f
   void _provideItemAtURL(const QXURL& url, ProvideCompletion completionHandler) override;
   // Tells the provider that owns the URL now, which need not be this one.
   void _writerWithID(const QXCoordinationID& writer, const QXURL& didFinishWritingForURL) override;
-  // Tells the extension, once; nobody hears of a failure but the log and the notice, if one is given. That is let go when the extension has
-  // answered, whatever it says, or cannot: this is what fails the notice.
-  void itemChangedAtURL(const QXURL& url, std::shared_ptr<QXWriteNotice> untilTold = {});
+  // Tells the extension; nobody hears of a failure but the log. What is given to be held is let go when the extension has answered, or
+  // cannot.
+  void itemChangedAtURL(const QXURL& url, std::shared_ptr<const void> untilTold = {});
 
  private:
   explicit DVExtensionDocuvend(std::shared_ptr<QXExtension> extension);
@@ -148,7 +148,7 @@ class DVExtensionDocuvend final : public QXDocuvend, public std::enable_shared_f
 
   void readableItemIDAnswered(const QXURL& url, const std::optional<std::string>& reader, std::optional<QXError> error,
                               ProvideCompletion completionHandler);
-  void changeRequestAnswered(const QXURL& url, const std::shared_ptr<QXWriteNotice>& untilTold, const std::optional<QXError>& error,
+  void changeRequestAnswered(const QXURL& url, const std::shared_ptr<const void>& untilTold, const std::optional<QXError>& error,
                              const std::optional<VendorProxy>& proxy, const FinishHandler& finish);
   void changeAnswered(const QXURL& url, const std::optional<QXError>& error, const FinishHandler& finish);
 

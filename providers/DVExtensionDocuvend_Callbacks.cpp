@@ -49,7 +49,7 @@ void DVExtensionDocuvend::_writerWithID(const QXCoordinationID& writer, const QX
   }
 }
 
-void DVExtensionDocuvend::itemChangedAtURL(const QXURL& url, std::shared_ptr<QXWriteNotice> untilTold) {
+void DVExtensionDocuvend::itemChangedAtURL(const QXURL& url, std::shared_ptr<const void> untilTold) {
   dvLog("[DEBUG] %s", "-[DVExtensionDocuvend itemChangedAtURL:]");
   performExtensionRequest([strongSelf = shared_from_this(), url, untilTold = std::move(untilTold)](
                               std::optional<QXError> error, std::optional<VendorProxy> proxy, FinishHandler finish) {
@@ -58,12 +58,11 @@ void DVExtensionDocuvend::itemChangedAtURL(const QXURL& url, std::shared_ptr<QXW
 }
 
 // Unlike the forwarded operations and the registration, a change ends its request also when there is no proxy.
-void DVExtensionDocuvend::changeRequestAnswered(const QXURL& url, const std::shared_ptr<QXWriteNotice>& untilTold,
+void DVExtensionDocuvend::changeRequestAnswered(const QXURL& url, const std::shared_ptr<const void>& untilTold,
                                                 const std::optional<QXError>& error, const std::optional<VendorProxy>& proxy,
                                                 const FinishHandler& finish) {
   if (error) {
     dvLog("[ERROR] Cannot tell extension %@ that item at URL %@ has changed.", identifier(), url);
-    if (untilTold) untilTold->failed();
     finish();
     return;
   }

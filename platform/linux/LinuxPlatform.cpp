@@ -132,11 +132,9 @@ struct LinuxPlatform::Services {
   LinuxExtensionHost extensionHost{bundles, paths, reactor, log.defaultLog()};
   LinuxStatus status{rpc, extensionHost};
   Remnants remnants{fileSystem, QXURL::fileURL(paths.groupContainers, QXURLKind::directory)};
-  LinuxFileCoordinator fileCoordinator{
-      fileSystem,
-      {[this] { return installedStorages(bundles); }, &KeyedFile::isInPlace,
-       [this](const KeyedFile& file) { return remnants.hasPlaceholder(file); },
-       [this](std::chrono::milliseconds delay, QXTask task) { queues.globalQueue().after(delay, std::move(task)); }, &log.defaultLog()}};
+  LinuxFileCoordinator fileCoordinator{fileSystem,
+                                       {[this] { return installedStorages(bundles); }, &KeyedFile::isInPlace,
+                                        [this](const KeyedFile& file) { return remnants.hasPlaceholder(file); }, &log.defaultLog()}};
   FileAccesses fileAccesses{fileCoordinator};
 
   std::unique_ptr<LinuxSandbox> sandbox;  // made in `create`, never null after it

@@ -2,7 +2,6 @@
 
 #include <gtest/gtest.h>
 
-#include <chrono>
 #include <map>
 #include <memory>
 #include <optional>
@@ -270,68 +269,6 @@ TEST_F(ChangeNoticesTest, LoseNoWriteInWhateverOrderTheyCome) {
     EXPECT_TRUE(untold.empty()) << "seed " << seed;
     EXPECT_TRUE(tried.isEmpty()) << "seed " << seed;
   }
-}
-
-TEST_F(ChangeNoticesTest, WhatHasFailedIsOwedAgainAndTheWaitIsDoubledUpToTheLongest) {
-  ASSERT_TRUE(notices.add(provider, change("x", 1)));
-  std::vector<std::chrono::milliseconds> waits;
-  for (int i = 1; i < ChangeNotices::kMaximumFailures; ++i) {
-    const auto failed = notices.fail(provider, fileNamed("x"));
-    ASSERT_TRUE(failed && failed->wait);
-    EXPECT_EQ(failed->notice.writer.processIdentifier, 1);
-    waits.push_back(*failed->wait);
-    EXPECT_EQ(end("x"), (Begun{{"x", 1}}));
-  }
-  using std::chrono::seconds;
-  EXPECT_EQ(waits, (std::vector<std::chrono::milliseconds>{seconds(1), seconds(2), seconds(4), seconds(8), seconds(16), seconds(32),
-                                                           seconds(60)}));
-  const auto last = notices.fail(provider, fileNamed("x"));
-  ASSERT_TRUE(last);
-  EXPECT_FALSE(last->wait);
-  EXPECT_EQ(last->notice.file.key, fileNamed("x"));
-  EXPECT_EQ(end("x"), Begun{});
-  EXPECT_TRUE(notices.isEmpty());
-}
-
-TEST_F(ChangeNoticesTest, AWriteDuringANoticeThatFailsIsTriedAsOftenAsAnyOther) {
-  ASSERT_TRUE(notices.add(provider, change("x", 1)));
-  for (int i = 1; i < 3 * ChangeNotices::kMaximumFailures; ++i) {
-    EXPECT_FALSE(notices.add(provider, change("x", i + 1)));
-    const auto failed = notices.fail(provider, fileNamed("x"));
-    ASSERT_TRUE(failed);
-    EXPECT_EQ(failed->wait, ChangeNotices::kFirstWait);
-    EXPECT_EQ(end("x"), (Begun{{"x", i + 1}}));
-  }
-}
-
-TEST_F(ChangeNoticesTest, ANoticeThatHasFailedKeepsItsPlaceUntilItEnds) {
-  fill(kEditor);
-  ASSERT_TRUE(notices.fail(provider, fileNamed(kEditor + numbered(0))));
-  EXPECT_FALSE(notices.add(provider, change("y", 1, kEditor)));
-  EXPECT_EQ(end(kEditor + numbered(0)), (Begun{{"y", 1}})) << "and goes behind those that wait then";
-  EXPECT_EQ(end("y"), (Begun{{kEditor + numbered(0), 1}}));
-}
-
-TEST_F(ChangeNoticesTest, WhatHasFailedIsMovedLikeWhatIsOwedAndTriedAsOftenByTheNextOwner) {
-  ASSERT_TRUE(notices.add(provider, change("x", 1)));
-  for (int i = 1; i < ChangeNotices::kMaximumFailures; ++i) {
-    ASSERT_TRUE(notices.fail(provider, fileNamed("x")));
-    if (i + 1 < ChangeNotices::kMaximumFailures) {
-      EXPECT_EQ(end("x"), (Begun{{"x", 1}}));
-    }
-  }
-  const auto untold = notices.untoldOfAllBut({other});
-  ASSERT_EQ(untold.size(), 1U);
-  ASSERT_TRUE(notices.move(untold[0], ChangeNotices::Owner(other)));
-  const auto failed = notices.fail(other, fileNamed("x"));
-  ASSERT_TRUE(failed);
-  EXPECT_EQ(failed->wait, ChangeNotices::kFirstWait);
-  EXPECT_EQ(end("x"), Begun{});
-}
-
-TEST_F(ChangeNoticesTest, WhatIsNotUnderWayCannotFail) {
-  EXPECT_FALSE(notices.fail(provider, fileNamed("x")));
-  EXPECT_TRUE(notices.isEmpty());
 }
 
 }  // namespace

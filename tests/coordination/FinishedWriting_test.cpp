@@ -136,7 +136,7 @@ TEST_F(FinishedWriting, IsAnnouncedByTheOneWhoReplacedTheItemAndByNoOther) {
   const auto saver = client(saving);
   const auto stranger = client(editor("2"));
   expectError(*saver.didFinishWriting(item), FileCoordinationErrorCode::notPermitted);
-  ASSERT_TRUE(std::holds_alternative<UniqueDescriptor>(sandbox.redeem(saving, issued(sibling), TokenUse::writing)));
+  ASSERT_TRUE(std::holds_alternative<UniqueDescriptor>(testing::redeem(sandbox, saving, issued(sibling), TokenUse::writing)));
   ASSERT_EQ(testing::replaceItem(sandbox, saving, issued(document), issued(sibling)), std::nullopt);
   expectError(*stranger.didFinishWriting(item), FileCoordinationErrorCode::notPermitted);
   expectSuccess(*saver.didFinishWriting(item));

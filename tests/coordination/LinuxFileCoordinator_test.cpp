@@ -258,6 +258,22 @@ TEST_F(AwaitedProviderTest, WhatCannotBeKnownOfAFileIsAFailureAndWhatCannotBeKno
   EXPECT_EQ(ownerOf(fileNamed("/c/x.txt")).failure, std::nullopt);
 }
 
+TEST_F(AwaitedProviderTest, OfAWriteWhoseFilesOwnerCannotBeKnownForWantOfMeansTheLogSaysThatNobodyIsTold) {
+  coordinator._addDocuvend(provider);
+  for (const int shortage : {EMFILE, ENFILE, ENOMEM}) {
+    log.clear();
+    QXError none = QXError::system(shortage, "cannot look");
+    none.url = directoryURL("/b/storage");
+    fileSystem.setRelationship(directoryURL("/b/storage"), item.url, none);
+    EXPECT_EQ(ownerOf(item).failure, none);
+    finishWriting(item);
+    EXPECT_EQ(log.entries(), (std::vector<fake_platform::FakeLogEntry>{
+                                 {QXLogType::fault, "[ERROR] Nobody can be told that the item at URL " + item.url.absoluteString() +
+                                                        " has changed. Error: " + none.description()}}));
+  }
+  EXPECT_TRUE(provider->told.empty());
+}
+
 TEST_F(AwaitedProviderTest, EveryChangeOfTheRegistrationsIsTold) {
   int changes = 0;
   coordinator.setRegistrationHandler([&changes] { ++changes; });

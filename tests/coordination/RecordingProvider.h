@@ -48,15 +48,10 @@ class RecordingProvider final : public QXDocuvend {
 
   // What a slow extension is being told.
   bool isSlow = false;
-  std::vector<std::shared_ptr<QXWriteNotice>> unanswered;
+  std::vector<std::shared_ptr<const void>> unanswered;
   void answer(std::size_t index = 0) {
     const auto answered = unanswered.at(index);
     unanswered.erase(unanswered.begin() + static_cast<std::ptrdiff_t>(index));
-  }
-  // It cannot be told.
-  void fail(std::size_t index = 0) {
-    unanswered.at(index)->failed();
-    answer(index);
   }
   // What is unanswered holds this object.
   void answerAll() {

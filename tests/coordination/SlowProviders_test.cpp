@@ -11,7 +11,6 @@
 #include <vector>
 
 #include "platform/fake/FakeFileSystem.h"
-#include "platform/fake/FakeLog.h"
 #include "platform/fake/FakeQueues.h"
 #include "platform/linux/coordination/FileAccesses.h"
 #include "tests/coordination/RecordingProvider.h"
@@ -25,8 +24,6 @@ using testing::partyOf;
 using testing::RecordingProvider;
 
 constexpr std::size_t kMost = ChangeNotices::kMaximumNoticesUnderWay;
-constexpr std::chrono::milliseconds kOne{1};
-constexpr std::chrono::hours kLong{1};
 
 struct SlowProviderTest : ::testing::Test {
   void SetUp() override {
@@ -37,11 +34,6 @@ struct SlowProviderTest : ::testing::Test {
   void TearDown() override {
     provider->answerAll();
     next->answerAll();
-  }
-
-  void pass(std::chrono::nanoseconds duration) {
-    queues.advance(duration);
-    queues.runAll();
   }
 
   static QXURL url(const std::string& name) { return QXURL::fileURL("/storage/" + name, QXURLKind::file); }
@@ -62,24 +54,21 @@ struct SlowProviderTest : ::testing::Test {
 
   std::vector<InstalledStorage> installed = {{"com.example.provider", QXURL::fileURL("/storage", QXURLKind::directory)}};
   fake_platform::FakeFileSystem fileSystem;
-  fake_platform::FakeLog log;
   std::function<void()> onLook;  // when a file's owner is known
-  LinuxFileCoordinator coordinator{
-      fileSystem,
-      {.installedStorages = [this] { return installed; },
-       .isInPlace =
-           [this](const KeyedFile&) {
-             if (onLook) onLook();
-             return true;
-           },
-       .later = [this](std::chrono::milliseconds delay, QXTask task) { queues.globalQueue().after(delay, std::move(task)); },
-       .log = &log.defaultLog()}};
+  LinuxFileCoordinator coordinator{fileSystem,
+                                   {
+                                       .installedStorages = [this] { return installed; },
+                                       .isInPlace =
+                                           [this](const KeyedFile&) {
+                                             if (onLook) onLook();
+                                             return true;
+                                           },
+                                   }};
   FileAccesses accesses{coordinator};
   const std::shared_ptr<RecordingProvider> provider =
       std::make_shared<RecordingProvider>(QXURL::fileURL("/storage", QXURLKind::directory), /*queue=*/nullptr, "com.example.provider");
   const std::shared_ptr<RecordingProvider> next = std::make_shared<RecordingProvider>(QXURL::fileURL("/storage", QXURLKind::directory));
   int processes = 0;
-  fake_platform::FakeQueues queues;  // goes first: a task that waits holds what the coordinator outlives
 };
 
 TEST_F(SlowProviderTest, HasOneNoticeOfAFileAtATimeHoweverOftenItIsWritten) {
@@ -207,82 +196,6 @@ TEST_F(SlowProviderTest, ThatIsUninstalledIsToldNothingMore) {
   EXPECT_EQ(provider->told.size(), kMost);
   coordinator._addDocuvend(next);
   EXPECT_TRUE(next->told.empty()) << "the file was nobody's";
-}
-
-TEST_F(SlowProviderTest, ThatCouldNotBeToldIsToldAgainAfterAWhile) {
-  write("x");
-  provider->fail();
-  pass(ChangeNotices::kFirstWait - kOne);
-  EXPECT_EQ(provider->told.size(), 1U) << "not yet";
-  pass(kOne);
-  ASSERT_EQ(provider->told.size(), 2U);
-  EXPECT_EQ(provider->told[1].second, url("x"));
-  EXPECT_NE(provider->told[1].first, provider->told[0].first) << "another name each time";
-  provider->answer();
-  pass(kLong);
-  EXPECT_EQ(provider->told.size(), 2U);
-  EXPECT_TRUE(log.texts().empty());
-}
-
-TEST_F(SlowProviderTest, ThatCouldNotBeToldHearsWithTheNextTryOfAllThatWasWrittenMeanwhile) {
-  write("x");
-  write("x");
-  provider->fail();
-  write("x");
-  write("x");
-  EXPECT_EQ(provider->told.size(), 1U);
-  pass(ChangeNotices::kFirstWait);
-  ASSERT_EQ(provider->told.size(), 2U);
-  EXPECT_EQ(provider->told[1].first.substr(0, 9), "writer 4-");
-  provider->answer();
-  EXPECT_EQ(provider->told.size(), 2U);
-}
-
-TEST_F(SlowProviderTest, ThatCannotBeToldOfOneFileIsToldOfOthersMeanwhile) {
-  write("x");
-  provider->fail();
-  write("y");
-  ASSERT_EQ(provider->told.size(), 2U);
-  EXPECT_EQ(provider->told[1].second, url("y"));
-  pass(kLong);
-  provider->answerAll();
-}
-
-TEST_F(SlowProviderTest, ThatCanNeverBeToldIsGivenUpWithALineInTheLog) {
-  write("x");
-  for (int i = 1; i < ChangeNotices::kMaximumFailures; ++i) {
-    provider->fail();
-    pass(ChangeNotices::kLongestWait);
-    ASSERT_EQ(provider->told.size(), static_cast<std::size_t>(i) + 1);
-    EXPECT_TRUE(log.texts().empty());
-  }
-  provider->fail();
-  pass(kLong);
-  EXPECT_EQ(provider->told.size(), static_cast<std::size_t>(ChangeNotices::kMaximumFailures));
-  EXPECT_EQ(log.entries(), (std::vector<fake_platform::FakeLogEntry>{
-                               {QXLogType::fault, "[ERROR] The extension com.example.provider was never told that the item at URL " +
-                                                      url("x").absoluteString() + " has changed."}}));
-  write("x");
-  EXPECT_EQ(provider->told.size(), static_cast<std::size_t>(ChangeNotices::kMaximumFailures) + 1) << "of the next write it is told at once";
-}
-
-TEST_F(SlowProviderTest, ThatIsReplacedLeavesWhatItCouldNotBeToldToTheNextOne) {
-  write("x");
-  provider->fail();
-  coordinator._removeDocuvend(provider);
-  coordinator._addDocuvend(next);
-  ASSERT_EQ(next->told.size(), 1U) << "at once";
-  EXPECT_EQ(next->told[0].second, url("x"));
-  pass(kLong);
-  EXPECT_EQ(provider->told.size(), 1U);
-  EXPECT_EQ(next->told.size(), 1U);
-}
-
-TEST_F(SlowProviderTest, OfWhatFailsWithoutSayingSoIsToldOnce) {
-  write("x");
-  provider->answer();
-  pass(kLong);
-  EXPECT_EQ(provider->told.size(), 1U);
 }
 
 }  // namespace

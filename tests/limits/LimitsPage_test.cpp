@@ -77,7 +77,6 @@ std::vector<Limit> limits() {
           {"ChangeNotices::kMaximumUntoldBytes", ChangeNotices::kMaximumUntoldBytes},
           {"ChangeNotices::kMaximumUnconfinedUntoldFiles", ChangeNotices::kMaximumUnconfinedUntoldFiles},
           {"ChangeNotices::kMaximumUnconfinedUntoldBytes", ChangeNotices::kMaximumUnconfinedUntoldBytes},
-          {"ChangeNotices::kMaximumFailures", ChangeNotices::kMaximumFailures},
           {"kMaximumHoldersNamed", FileCoordinationServicer::kMaximumHoldersNamed},
           {"kDVMaximumGrantsOfPage", kDVMaximumGrantsOfPage},
           {"kDVMaximumTextBytesOfPage", kDVMaximumTextBytesOfPage},

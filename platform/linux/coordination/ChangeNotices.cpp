@@ -14,7 +14,6 @@ std::size_t bytesOf(const KeyedFile& file) { return file.url.absoluteString().si
 // The last one's URL is the one by which the file can be found: its directory may have been renamed.
 void merge(FileChange& into, const FileChange& later) {
   into.file.url = later.file.url;
-  into.failures = later.failures;
   for (const auto& [application, process] : later.writers) into.writers.insert_or_assign(application, process);
 }
 
@@ -51,7 +50,7 @@ std::optional<ChangeNotices::Notice> ChangeNotices::add(const Owner& owner, cons
 std::vector<ChangeNotices::Notice> ChangeNotices::end(const Provider& provider, const FileKey& file) {
   const auto ended = underWay_.extract({provider, file});
   if (ended.empty()) return {};
-  const auto& [application, told, owed] = ended.mapped();
+  const auto& [application, owed] = ended.mapped();
   lines_.end(provider, application);
   std::vector<Notice> notices;
   if (auto next = begin(provider, application)) notices.push_back(std::move(*next));
@@ -59,20 +58,6 @@ std::vector<ChangeNotices::Notice> ChangeNotices::end(const Provider& provider, 
     if (auto again = add(provider, *owed)) notices.push_back(std::move(*again));
   }
   return notices;
-}
-
-std::optional<ChangeNotices::Failed> ChangeNotices::fail(const Provider& provider, const FileKey& file) {
-  const auto running = underWay_.find({provider, file});
-  if (running == underWay_.end()) return std::nullopt;
-  UnderWay& underWay = running->second;
-  Failed failed{noticeOf(provider, underWay), std::nullopt};
-  FileChange again = underWay.told;
-  ++again.failures;
-  if (again.failures >= kMaximumFailures && !underWay.owed) return failed;
-  failed.wait = std::min(kFirstWait * (1 << (std::min(again.failures, kMaximumFailures) - 1)), kLongestWait);
-  if (underWay.owed) merge(again, *underWay.owed);
-  underWay.owed = std::move(again);
-  return failed;
 }
 
 std::vector<ChangeNotices::Untold> ChangeNotices::untoldOfAllBut(const std::vector<Provider>& providers) const {
@@ -100,7 +85,6 @@ std::optional<ChangeNotices::Notice> ChangeNotices::move(const Untold& untold, c
     change = std::exchange(running->second.owed, std::nullopt);
   }
   if (!change || !owner) return std::nullopt;
-  change->failures = 0;
   return add(*owner, *change);
 }
 
@@ -142,12 +126,8 @@ std::optional<ChangeNotices::Notice> ChangeNotices::begin(const Provider& provid
   const auto file = lines_.begin(provider, application);
   if (!file) return std::nullopt;
   FileChange change = waitNoMore(waiting_.find({provider, *file}));
-  return noticeOf(provider, underWay_.emplace(Place{provider, *file}, UnderWay{application, std::move(change), /*owed=*/{}}).first->second);
-}
-
-ChangeNotices::Notice ChangeNotices::noticeOf(const Provider& provider, const UnderWay& underWay) {
-  const auto& [application, told, owed] = underWay;
-  return {provider, told.file, AccessHolder{told.writers.at(application), application}};
+  underWay_.emplace(Place{provider, *file}, UnderWay{application, /*owed=*/{}});
+  return Notice{provider, std::move(change.file), AccessHolder{change.writers.at(application), application}};
 }
 
 }  // namespace docuvend::linux_platform

@@ -6,15 +6,11 @@
 // number of notices at a time, whichever files they are of; the rest waits, in the order in which it came, and holds up no other
 // application's, also of a file that both have written. What a provider that is not registered is to be told is kept by its bundle.
 //
-// A notice that has failed is owed again. It stays under way until the time of the next try, so it keeps its place among those that the
-// application may have, and what is written meanwhile is told by the same try.
-//
 // What waits or is kept is at most one change of a file. That is no limit, for a name may be written without a file ever being there: an
 // application that has written too much of which a provider has not been told is to write nothing more there meanwhile. Whoever lets
 // it write asks before; a write that has ended is always told.
 #pragma once
 
-#include <chrono>
 #include <cstddef>
 #include <map>
 #include <optional>
@@ -33,7 +29,6 @@ namespace docuvend::linux_platform {
 struct FileChange {
   KeyedFile file;
   std::map<Application, int> writers;  // of each application the process that wrote last
-  int failures = 0;                    // of the notices of it since the last of these writes
 };
 
 class ChangeNotices {
@@ -47,12 +42,6 @@ class ChangeNotices {
   // All unconfined processes are counted as one. They are trusted, and may write whole trees while a provider is not there.
   static constexpr std::size_t kMaximumUnconfinedUntoldFiles = 16384;
   static constexpr std::size_t kMaximumUnconfinedUntoldBytes = std::size_t{16} << 20U;
-
-  // A notice that has failed so often is given up. The first wait before the next try is doubled by each failure, up to the longest: the
-  // extension host keeps a process that dies again and again from being started no longer than that.
-  static constexpr int kMaximumFailures = 8;
-  static constexpr std::chrono::milliseconds kFirstWait{1'000};
-  static constexpr std::chrono::milliseconds kLongestWait{60'000};
 
   using Provider = ApplicationLines::Provider;
   // A provider's object, or the bundle of a provider that is not registered.
@@ -71,12 +60,6 @@ class ChangeNotices {
   [[nodiscard]] std::optional<Notice> add(const Owner& owner, const FileChange& change);
   // A notice that was under way has ended. Those that are under way now instead; the caller begins them.
   [[nodiscard]] std::vector<Notice> end(const Provider& provider, const FileKey& file);
-  struct Failed {
-    Notice notice;
-    std::optional<std::chrono::milliseconds> wait;  // none: it is given up
-  };
-  // A notice that is under way has failed: it is to be ended after that wait. None when there is no such notice.
-  [[nodiscard]] std::optional<Failed> fail(const Provider& provider, const FileKey& file);
 
   struct Untold {
     Owner owner;
@@ -94,8 +77,7 @@ class ChangeNotices {
   using Place = std::pair<Owner, FileKey>;
   struct UnderWay {
     Application application;         // in whose line it is
-    FileChange told;                 // what it tells
-    std::optional<FileChange> owed;  // what was written since it began, and what it has failed to tell
+    std::optional<FileChange> owed;  // what was written since it began
   };
   // What one application has written and an owner is still to be told.
   struct Backlog {
@@ -109,7 +91,6 @@ class ChangeNotices {
   [[nodiscard]] FileChange waitNoMore(std::map<Place, FileChange>::iterator waiting);
   // The head of that line, when the line has room for it.
   [[nodiscard]] std::optional<Notice> begin(const Provider& provider, const Application& application);
-  [[nodiscard]] static Notice noticeOf(const Provider& provider, const UnderWay& underWay);
 
   std::map<Place, UnderWay> underWay_;                         // of objects
   std::map<Place, FileChange> waiting_;                        // those of objects stand in the lines of their writers

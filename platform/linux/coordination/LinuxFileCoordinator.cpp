@@ -1,6 +1,7 @@
 #include "platform/linux/coordination/LinuxFileCoordinator.h"
 
 #include <algorithm>
+#include <cerrno>
 #include <string>
 #include <utility>
 #include <variant>
@@ -19,6 +20,11 @@ void onItsQueue(const QXDocuvend& provider, QXTask task) {
   }
 }
 
+// It says something of this process, or of the machine, and nothing of the files.
+bool isWantOfMeans(const QXError& error) {
+  return error.domain == kQXSystemErrorDomain && (error.code == EMFILE || error.code == ENFILE || error.code == ENOMEM);
+}
+
 LogSubject::Name subjectOf(const AccessHolder& holder) {
   return holder.bundleIdentifier ? std::make_shared<const std::string>(*holder.bundleIdentifier) : nullptr;
 }
@@ -26,25 +32,18 @@ LogSubject::Name subjectOf(const AccessHolder& holder) {
 }  // namespace
 
 // Whoever drops the last reference ends it, and never while the coordinator has its lock.
-class LinuxFileCoordinator::NoticeUnderWay final : public QXWriteNotice {
+class LinuxFileCoordinator::NoticeUnderWay {
  public:
   NoticeUnderWay(LinuxFileCoordinator& coordinator, std::shared_ptr<QXDocuvend> provider, FileKey file)
       : coordinator_(coordinator), provider_(std::move(provider)), file_(std::move(file)) {}
-  ~NoticeUnderWay() override {
-    if (hasFailed_) {
-      coordinator_.noticeHasFailed(provider_, file_);
-    } else {
-      coordinator_.noticeHasEnded(provider_, file_);
-    }
-  }
-
-  void failed() override { hasFailed_ = true; }
+  NoticeUnderWay(const NoticeUnderWay&) = delete;
+  NoticeUnderWay& operator=(const NoticeUnderWay&) = delete;
+  ~NoticeUnderWay() { coordinator_.noticeHasEnded(provider_, file_); }
 
  private:
   LinuxFileCoordinator& coordinator_;
   const std::shared_ptr<QXDocuvend> provider_;
   const FileKey file_;
-  std::atomic<bool> hasFailed_ = false;
 };
 
 std::optional<ChangeNotices::Owner> FileOwner::known() const {
@@ -146,7 +145,7 @@ bool LinuxFileCoordinator::contains(const QXURL& directory, const QXURL& file, D
   const auto answer = fileSystem_.relationship(directory, file);
   if (const auto* error = std::get_if<QXError>(&answer)) {
     // A directory that is not there, or is none, holds nothing: what a provider makes of its own must not concern others' files.
-    if (error->url == file) failure = *error;
+    if (error->url == file || isWantOfMeans(*error)) failure = *error;
     return false;
   }
   const auto relationship = std::get<QXRelationship>(answer);
@@ -224,9 +223,11 @@ void LinuxFileCoordinator::tellFinishedWriting(const FileOwner& owner, const Acc
     return;
   }
   if (known && hasChangedSince(owner)) tellUntold();
+  const LogSubject subject(subjectOf(writer));
   if (owner.isLost) {
-    const LogSubject subject(subjectOf(writer));
     logError(qxLogMessage("[ERROR] Nobody can be told that the item at URL %@ has changed: it is not where it was.", file.url));
+  } else if (owner.failure) {
+    logError(qxLogMessage("[ERROR] Nobody can be told that the item at URL %@ has changed. Error: %@", file.url, *owner.failure));
   }
   if (told) told();
 }
@@ -234,7 +235,7 @@ void LinuxFileCoordinator::tellFinishedWriting(const FileOwner& owner, const Acc
 void LinuxFileCoordinator::begin(const ChangeNotices::Notice& notice, std::function<void()> told) {
   const auto& [provider, file, writer] = notice;
   const LogSubject subject(subjectOf(writer));
-  auto untilTold = std::make_shared<NoticeUnderWay>(*this, provider, file.key);
+  auto untilTold = std::make_shared<const NoticeUnderWay>(*this, provider, file.key);
   onItsQueue(*provider, [provider = provider, name = nameFor("writer", writer.processIdentifier), untilTold = std::move(untilTold),
                          url = file.url, told = std::move(told)]() mutable {
     provider->_writerWithID({std::move(name), std::move(untilTold)}, url);
@@ -249,26 +250,6 @@ void LinuxFileCoordinator::noticeHasEnded(const std::shared_ptr<QXDocuvend>& pro
     next = notices_.end(provider, file);
   }
   for (const ChangeNotices::Notice& notice : next) begin(notice, /*told=*/{});
-}
-
-// Until the next try the notice is under way as far as anybody knows: what holds it is the task that waits for that.
-void LinuxFileCoordinator::noticeHasFailed(const std::shared_ptr<QXDocuvend>& provider, const FileKey& file) {
-  std::optional<ChangeNotices::Failed> failed;
-  if (outside_.later) {
-    const std::lock_guard lock(mutex_);
-    failed = notices_.fail(provider, file);
-  }
-  if (failed && failed->wait) {
-    outside_.later(*failed->wait, [again = std::make_shared<NoticeUnderWay>(*this, provider, file)]() mutable { again.reset(); });
-    return;
-  }
-  if (failed) {
-    const auto& [gone, written, writer] = failed->notice;
-    const LogSubject subject(subjectOf(writer));
-    logError(qxLogMessage("[ERROR] The extension %@ was never told that the item at URL %@ has changed.", provider->_fileReactorID(),
-                          written.url));
-  }
-  noticeHasEnded(provider, file);
 }
 
 void LinuxFileCoordinator::logError(const QXLogMessage& message) const {

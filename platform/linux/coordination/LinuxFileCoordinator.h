@@ -5,16 +5,14 @@
 // meanwhile it is told when it is registered.
 //
 // An object that is being told of a file's change is not told of that file again until it lets go of the writer's identifier, and is then
-// if the file was written meanwhile; nor of any number of files at a time (ChangeNotices.h). What it could not be told it is told again
-// after a while, a limited number of times. What it was still to be told when it is removed is told to the next one that is registered for
-// the file.
+// if the file was written meanwhile; nor of any number of files at a time (ChangeNotices.h). What it was still to be told when it is
+// removed is told to the next one that is registered for the file.
 //
 // May be used from any thread. Provider objects are called with no lock held, on their own operation queues; one that has none is called
 // on the caller's thread. Outlives every writer's identifier that an object may hold.
 #pragma once
 
 #include <atomic>
-#include <chrono>
 #include <cstddef>
 #include <cstdint>
 #include <functional>
@@ -32,7 +30,6 @@
 #include "platform/linux/coordination/ChangeNotices.h"
 #include "platform/linux/coordination/FileKey.h"
 #include "platform/log.h"
-#include "platform/queue.h"
 
 namespace docuvend::linux_platform {
 
@@ -64,8 +61,6 @@ class LinuxFileCoordinator final : public QXFileCoordinator {
     std::function<bool(const KeyedFile&)> isInPlace = {};
     // Whether a file of nobody's is a placeholder that a provider has left behind. Never when empty.
     std::function<bool(const KeyedFile&)> isRemnant = {};
-    // Runs the task that much later. When empty nothing is told again.
-    std::function<void(std::chrono::milliseconds delay, QXTask task)> later = {};
     // For what nobody else hears of. Null: nothing is logged.
     QXLogHandle* log = nullptr;
   };
@@ -101,8 +96,8 @@ class LinuxFileCoordinator final : public QXFileCoordinator {
   // Why nobody of that application may write the file now: its owner is still to be told of as much as one application may have written.
   [[nodiscard]] std::optional<QXError> refusalOfWrite(const FileOwner& owner, const AccessHolder& writer, const KeyedFile& file) const;
   // Tells the file's owner that a writer has finished with it, under an identifier that no other writer has; `told` runs after that, and
-  // at once when there is no owner (which is logged of a file that is not where it was), or when it will be told later: one that is awaited
-  // or is being told already. It hears of several writes to one file once then.
+  // at once when there is no owner (which is logged when the file is not where it was, or its owner cannot be known), or when it will be
+  // told later: one that is awaited or is being told already. It hears of several writes to one file once then.
   void tellFinishedWriting(const FileOwner& owner, const AccessHolder& writer, const KeyedFile& file, std::function<void()> told);
 
  private:
@@ -115,7 +110,6 @@ class LinuxFileCoordinator final : public QXFileCoordinator {
   [[nodiscard]] bool contains(const QXURL& directory, const QXURL& file, DirectoryItself itself, std::optional<QXError>& failure) const;
   void begin(const ChangeNotices::Notice& notice, std::function<void()> told);
   void noticeHasEnded(const std::shared_ptr<QXDocuvend>& provider, const FileKey& file);
-  void noticeHasFailed(const std::shared_ptr<QXDocuvend>& provider, const FileKey& file);
   void tellUntold();
   void registrationsChanged();
   void callHandler();
