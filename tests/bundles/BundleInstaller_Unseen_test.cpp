@@ -135,7 +135,9 @@ TEST_F(BundleInstallerUnseenTest, WhateverCallFailsABundleIsRemovedOrThereIsAnEr
       std::optional<QXError> result;
       const std::string failed = failing(number, error, [this, &result] { result = uninstall("org.a"); });
       EXPECT_EQ(house_.scan().contains("org.a"), result.has_value()) << failed;
-      if (result) EXPECT_EQ(result->domain, kQXSystemErrorDomain) << failed;
+      if (result) {
+        EXPECT_EQ(result->domain, kQXSystemErrorDomain) << failed;
+      }
       if (failed.empty()) break;
     }
   }
