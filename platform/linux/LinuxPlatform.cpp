@@ -51,7 +51,7 @@ constexpr const char* kAdministrationServiceName = "com.orvane.Administration";
 // What anybody may ask the client service for.
 constexpr const char* kWakeUp = "wakeUpCompletion:";
 constexpr const char* kEndAccess = "endAccess:completionHandler:";
-// A thread that serves a request may wait for a disk; one more at least is left for the others.
+// A thread that serves a request may wait for a disk, of one bundle one at a time; what waits for others who write has threads of its own.
 constexpr unsigned kFewestReactorThreads = 4;
 // What this process and the extensions make is the user's alone, whatever a login leaves to others.
 constexpr mode_t kOwnerOnlyMask = 077;
@@ -137,6 +137,7 @@ struct LinuxPlatform::Services {
                                         [this](const KeyedFile& file) { return remnants.hasPlaceholder(file); }, &log.defaultLog()}};
   FileAccesses fileAccesses{fileCoordinator};
 
+  const std::shared_ptr<QXQueue> settling = queues.serialQueue("com.orvane.docuvend.sandbox.settling");
   std::unique_ptr<LinuxSandbox> sandbox;  // made in `create`, never null after it
 
   // Made in `publish`.
@@ -162,8 +163,10 @@ struct LinuxPlatform::Services {
   }
 
  private:
+  // On the thread that looks for bundles, so that none leaves and comes back unseen. That must not wait for who acts on an old token.
   void followInstalledBundles() {
     const auto error = sandbox->followInstalledBundles();
+    settling->async([this] { sandbox->settleInstalledBundles(); });
     if (!error) return;
     qxLog(log.defaultLog(), "[ERROR] The tokens for a container that a bundle has left may be good again after a restart: %@", *error);
   }

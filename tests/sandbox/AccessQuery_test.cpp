@@ -82,7 +82,7 @@ class AccessQueryTest : public testing::SandboxHouse {
     return token.value_or("");
   }
   void redeemFor(const QXAuditToken& peer, const std::string& path, TokenUse use) {
-    const auto result = sandbox.redeem(peer, issued(path), use);
+    const auto result = testing::redeem(sandbox, peer, issued(path), use);
     EXPECT_TRUE(std::holds_alternative<UniqueDescriptor>(result)) << path;
   }
 
@@ -126,7 +126,7 @@ TEST_F(AccessQueryTest, NeverLooksTheZeroTokenUp) {
   somebody.bytes[0] = 1;
   EXPECT_EQ(open.ask(somebody, kQXSandboxFileWriteData, document), AccessVerdict::allowedByAccess);
   EXPECT_EQ(open.ask(QXAuditToken{}, kQXSandboxFileWriteData, document), AccessVerdict::nobody);
-  const auto result = open.redeem(QXAuditToken{}, issued(document), TokenUse::reading);
+  const auto result = testing::redeem(open, QXAuditToken{}, issued(document), TokenUse::reading);
   EXPECT_TRUE(std::holds_alternative<QXError>(result));
 }
 

@@ -4,6 +4,7 @@
 #include <gtest/gtest.h>
 #include <sys/resource.h>
 
+#include <algorithm>
 #include <chrono>
 #include <condition_variable>
 #include <cstdlib>
@@ -23,6 +24,11 @@ namespace {
 using ::testing::ElementsAre;
 
 constexpr std::chrono::seconds kPatience{60};
+
+const std::string kElsewhere = "/elsewhere/";
+
+// As many owners as may be at work in one directory are in the same.
+std::string directoryOf(std::size_t owner) { return "/" + std::to_string(owner / DiskWork::kMostThreadsOfDirectory) + "/"; }
 
 // Work that says when it begins and waits to be let go.
 class Works {
@@ -77,7 +83,7 @@ TEST(DiskWork, OfOneOwnerRunsOneAfterAnotherInItsOrder) {
   DiskWork disk;
   for (const char* name : {"first", "second", "third"}) {
     works.release(name);
-    disk.submit("a", works.named(name));
+    disk.submit("a", kElsewhere, works.named(name));
   }
   ASSERT_TRUE(works.awaitEnded(3));
   EXPECT_THAT(works.begun(), ElementsAre("first", "second", "third"));
@@ -87,7 +93,8 @@ TEST(DiskWork, OfOneOwnerRunsOneAfterAnotherInItsOrder) {
 TEST(DiskWork, OfOtherOwnersRunsBesideIt) {
   Works works;
   DiskWork disk;
-  for (std::size_t owner = 1; owner <= DiskWork::kMostThreads; ++owner) disk.submit(std::to_string(owner), works.named("long"));
+  for (std::size_t owner = 1; owner <= DiskWork::kMostThreads; ++owner)
+    disk.submit(std::to_string(owner), directoryOf(owner), works.named("long"));
   EXPECT_TRUE(works.awaitBegun(DiskWork::kMostThreads));
   works.release("long");
   EXPECT_TRUE(works.awaitEnded(DiskWork::kMostThreads));
@@ -100,7 +107,7 @@ TEST(DiskWork, IsForWhomItsSubmitterWasAtWork) {
   works.release("a1");
   {
     const LogSubject submitters(std::make_shared<const std::string>("com.example.app"));
-    disk.submit("a", [&subject, work = works.named("a1")] {
+    disk.submit("a", kElsewhere, [&subject, work = works.named("a1")] {
       subject = LogSubject::current();
       work();
     });
@@ -114,12 +121,13 @@ TEST(DiskWork, IsForWhomItsSubmitterWasAtWork) {
 TEST(DiskWork, IsDoneByTurnsHoweverMuchOneOwnerHas) {
   Works works;
   DiskWork disk;
-  for (std::size_t owner = 1; owner < DiskWork::kMostThreads; ++owner) disk.submit(std::to_string(owner), works.named("long"));
+  for (std::size_t owner = 1; owner < DiskWork::kMostThreads; ++owner)
+    disk.submit(std::to_string(owner), directoryOf(owner), works.named("long"));
   ASSERT_TRUE(works.awaitBegun(DiskWork::kMostThreads - 1));
-  disk.submit("a", works.named("a1"));
+  disk.submit("a", kElsewhere, works.named("a1"));
   ASSERT_TRUE(works.awaitBegun(DiskWork::kMostThreads));
-  for (const char* name : {"a2", "a3"}) disk.submit("a", works.named(name));
-  for (const char* name : {"b1", "b2"}) disk.submit("b", works.named(name));
+  for (const char* name : {"a2", "a3"}) disk.submit("a", kElsewhere, works.named(name));
+  for (const char* name : {"b1", "b2"}) disk.submit("b", kElsewhere, works.named(name));
   for (const char* name : {"a1", "a2", "a3", "b1", "b2"}) works.release(name);
   ASSERT_TRUE(works.awaitEnded(5));
   auto begun = works.begun();
@@ -128,14 +136,34 @@ TEST(DiskWork, IsDoneByTurnsHoweverMuchOneOwnerHas) {
   works.release("long");
 }
 
+// However many want something in a directory that is locked, others find a thread.
+TEST(DiskWork, InOneDirectoryTakesItsPartOfTheThreadsAndNoMore) {
+  Works works;
+  DiskWork disk;
+  constexpr std::size_t kOwners = DiskWork::kMostThreads + 1;
+  for (std::size_t owner = 0; owner < kOwners; ++owner) disk.submit(std::to_string(owner), "/locked/", works.named("held"));
+  ASSERT_TRUE(works.awaitBegun(DiskWork::kMostThreadsOfDirectory));
+  works.release("free");
+  disk.submit("b", kElsewhere, works.named("free"));
+  disk.submit("0", kElsewhere, works.named("its own"));
+  ASSERT_TRUE(works.awaitEnded(1));
+  const auto begun = works.begun();
+  EXPECT_EQ(std::count(begun.begin(), begun.end(), "held"), DiskWork::kMostThreadsOfDirectory);
+  EXPECT_THAT(begun, ::testing::Contains("free"));
+  EXPECT_THAT(begun, ::testing::Not(::testing::Contains("its own"))) << "it waits for its owner's turn";
+  works.release("held");
+  works.release("its own");
+  EXPECT_TRUE(works.awaitEnded(kOwners + 2)) << "all of it is done in the end";
+}
+
 TEST(DiskWork, ThatHasNotBegunIsDroppedAtTheEnd) {
   Works works;
   const auto held = std::make_shared<int>(0);
   {
     DiskWork disk;
-    disk.submit("a", works.named("running"));
+    disk.submit("a", kElsewhere, works.named("running"));
     ASSERT_TRUE(works.awaitBegun(1));
-    disk.submit("a", [held] { ++*held; });
+    disk.submit("a", kElsewhere, [held] { ++*held; });
     works.release("running");
   }
   EXPECT_EQ(held.use_count(), 1);

@@ -7,15 +7,19 @@
 #include <unistd.h>
 
 #include <atomic>
+#include <cerrno>
 #include <filesystem>
 #include <functional>
+#include <future>
 #include <memory>
+#include <optional>
 #include <string>
 #include <thread>
 #include <utility>
 #include <vector>
 
 #include "tests/sandbox/SandboxHouse.h"
+#include "tests/sandbox/SystemCalls.h"
 
 namespace docuvend::linux_platform {
 namespace {
@@ -43,14 +47,14 @@ class TakingTokensBack : public testing::SandboxHouse {
     EXPECT_EQ(error, std::nullopt) << error->description();
   }
   [[nodiscard]] bool opens(const std::string& token) const {
-    return std::holds_alternative<UniqueDescriptor>(sandbox->redeem(editor, token, TokenUse::writing));
+    return std::holds_alternative<UniqueDescriptor>(testing::redeem(*sandbox, editor, token, TokenUse::writing));
   }
   static void expectBadToken(const QXError& error) {
     EXPECT_EQ(error.domain, kQXSandboxErrorDomain);
     EXPECT_EQ(error.code, static_cast<std::int64_t>(SandboxErrorCode::badToken)) << error.description();
   }
   void expectTakenBack(const std::string& token, const std::string& what) const {
-    const auto result = sandbox->redeem(editor, token, TokenUse::reading);
+    const auto result = testing::redeem(*sandbox, editor, token, TokenUse::reading);
     ASSERT_TRUE(std::holds_alternative<QXError>(result)) << what;
     expectBadToken(std::get<QXError>(result));
   }
@@ -109,7 +113,7 @@ TEST_F(TakingTokensBack, HoldsAfterARestart) {
 }
 
 TEST_F(TakingTokensBack, LeavesOpenFilesOpen) {
-  const auto open = sandbox->redeem(editor, issued(document), TokenUse::writing);
+  const auto open = testing::redeem(*sandbox, editor, issued(document), TokenUse::writing);
   ASSERT_TRUE(std::holds_alternative<UniqueDescriptor>(open));
   takeBack(storage);
   EXPECT_EQ(::pwrite(std::get<UniqueDescriptor>(open).get(), "CON", 3, 0), 3);
@@ -160,6 +164,7 @@ class LeavingGroups : public TakingTokensBack {
   void changed() {
     bundles.tellOfChange();
     EXPECT_EQ(sandbox->followInstalledBundles(), std::nullopt);
+    sandbox->settleInstalledBundles();
   }
 
   Bundle provider_;
@@ -268,6 +273,39 @@ TEST_F(LeavingGroups, EndsThemInThisProcessWhenItCannotBeWritten) {
   expectTakenBack(token_, "removed");
 }
 
+// Whoever tells of the change, or asks for the next token, is one who serves others.
+TEST_F(LeavingGroups, IsFollowedWithoutWaitingForWhoIsHeldUpByWhoeverIssuesTheNextToken) {
+  ASSERT_TRUE(opens(issued(sibling)));
+  sandbox = std::make_unique<LinuxSandbox>(loadedSession(testing::kNotLong), bundles, peers);
+  const std::string item = issued(document);
+  const std::string by = issued(sibling);
+  ASSERT_EQ(::chmod(document.c_str(), 0600), 0);  // as the sibling has it: the rename is the first to wait
+  const auto answer = std::make_shared<std::promise<std::optional<QXError>>>();
+  auto replaced = answer->get_future();
+  {
+    testing::LockedDirectory locked(storage);
+    sandbox->replaceItem(editor, item, by, [answer](std::optional<QXError> error) { answer->set_value(std::move(error)); });
+    ASSERT_TRUE(locked.awaitWaiting(1));
+    bundles.remove(provider_.identifier);
+    bundles.tellOfChange();
+    EXPECT_TRUE(opens(issued(otherDocument)));
+    EXPECT_EQ(sandbox->followInstalledBundles(), std::nullopt);
+    EXPECT_TRUE(log.entries().empty()) << "nobody has waited";
+    expectTakenBack(item, "removed");
+    sandbox->settleInstalledBundles();
+    EXPECT_EQ(log.entries(), (std::vector<fake_platform::FakeLogEntry>{
+                                 {QXLogType::fault,
+                                  "[ERROR] Tokens were taken back, and what 2 of them had begun before is still under way, the first of "
+                                  "them for " +
+                                      document + "."}}));
+    locked.unlock();
+    replaced.wait();
+  }
+  EXPECT_EQ(replaced.get(), std::nullopt);
+  become(provider_);
+  EXPECT_NE(sandbox->checkWithoutReport(editor, kQXSandboxFileWriteData, document), 0) << "it is not remembered to have written the item";
+}
+
 // The registry's way to the container leads through links; a token has none.
 class TakingTokensBackBehindLinks : public TakingTokensBack {
  protected:
@@ -328,7 +366,7 @@ TEST_F(TakingTokensBack, CutsAContainerBelowTheDirectoryThatIsALinkOutOfIt) {
 
 TEST_F(TakingTokensBack, TakesBackWhatWasGainedByRedeeming) {
   const QXAuditToken another = peers.add(confined("com.example.editor", "2"));
-  static_cast<void>(sandbox->redeem(another, issued(document), TokenUse::writing));
+  static_cast<void>(testing::redeem(*sandbox, another, issued(document), TokenUse::writing));
   ASSERT_TRUE(opens(issued(otherDocument)));
   ASSERT_TRUE(opens(issued(sibling)));
   ASSERT_EQ(testing::replaceItem(*sandbox, editor, issued(document), issued(sibling)), std::nullopt);
@@ -383,7 +421,7 @@ TEST_F(TakingTokensBack, LetsNoOldTokenOpenAnythingOnceItIsDone) {
       redeemers.emplace_back([this, &token, &done, &opened, &openedLate, i] {
         for (bool last = false; !last;) {
           last = done.load();  // one more after that
-          const auto result = sandbox->redeem(editor, token, i == 0 ? TokenUse::reading : TokenUse::writing);
+          const auto result = testing::redeem(*sandbox, editor, token, i == 0 ? TokenUse::reading : TokenUse::writing);
           if (!std::holds_alternative<UniqueDescriptor>(result)) continue;
           ++opened;
           if (last) ++openedLate;
@@ -411,7 +449,7 @@ TEST_F(TakingTokensBack, LetsNoOldTokenChangeTheDirectoryOnceItIsDone) {
     std::atomic<int> replaced{0};
     std::thread saver([this, &item, &by, &stop, &replaced] {
       while (!stop.load()) {
-        static_cast<void>(sandbox->redeem(editor, by, TokenUse::writing));
+        static_cast<void>(testing::redeem(*sandbox, editor, by, TokenUse::writing));
         if (!testing::replaceItem(*sandbox, editor, item, by)) ++replaced;
       }
     });

@@ -64,6 +64,18 @@ TEST_F(Resolution, BeneathADirectoryADirectoryIsAskedFor) {
   EXPECT_EQ(problemOf(openBeneath(container_.get(), "inner/document", Expecting::directory)), ENOTDIR);
 }
 
+// A name that is missing is never looked for at once: that nothing has it is known for certain in its directory alone.
+TEST_F(Resolution, BeneathADirectoryTheCacheAloneIsAskedWhenADirectoryMayBeLocked) {
+  const auto cached = [this](const std::string& path) {
+    return problemOf(openBeneath(container_.get(), path, Expecting::anything, Lookup::inCacheAlone));
+  };
+  ASSERT_EQ(beneath("inner/document"), 0);
+  EXPECT_EQ(cached("inner/document"), 0);
+  EXPECT_EQ(cached("inner/missing"), EAGAIN);
+  EXPECT_EQ(beneath("inner/missing"), ENOENT);
+  EXPECT_EQ(cached("link"), ELOOP);
+}
+
 TEST_F(Resolution, InARootLinksLeadNoFurtherThanIt) {
   EXPECT_EQ(problemOf(openInRoot(container_.get(), "/link/document", FinalLink::followed)), 0);
   EXPECT_EQ(problemOf(openInRoot(container_.get(), "/../../inner/document", FinalLink::followed)), 0) << "above a root is the root";

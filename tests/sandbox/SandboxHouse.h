@@ -6,6 +6,7 @@
 #include <sys/syscall.h>
 #include <unistd.h>
 
+#include <chrono>
 #include <cstdint>
 #include <cstdlib>
 #include <filesystem>
@@ -19,6 +20,7 @@
 #include <stdexcept>
 #include <string>
 #include <utility>
+#include <variant>
 #include <vector>
 
 #include "platform/fake/FakeLog.h"
@@ -27,6 +29,9 @@
 #include "platform/linux/sandbox/LinuxSandbox.h"
 
 namespace docuvend::linux_platform::testing {
+
+// For a wait that comes to its end in the test.
+inline constexpr std::chrono::milliseconds kNotLong{50};
 
 class TemporaryDirectory {
  public:
@@ -63,6 +68,15 @@ inline std::string read(const std::string& path) {
   std::ostringstream text;
   text << std::ifstream(path, std::ios::binary).rdbuf();
   return text.str();
+}
+
+// What the redemption came to, when it has.
+inline std::variant<UniqueDescriptor, QXError> redeem(LinuxSandbox& sandbox, const QXAuditToken& caller, const std::string& token,
+                                                      TokenUse use) {
+  const auto answer = std::make_shared<std::promise<std::variant<UniqueDescriptor, QXError>>>();
+  auto result = answer->get_future();
+  sandbox.redeem(caller, token, use, [answer](auto redeemed) { answer->set_value(std::move(redeemed)); });
+  return result.get();
 }
 
 // What the replacement came to, when it has.
@@ -174,8 +188,9 @@ class SandboxHouse : public ::testing::Test {
   }
 
   // The session of this house, as each start of the daemon finds it.
-  [[nodiscard]] std::unique_ptr<TokenSession> loadedSession() {
-    auto session = TokenSession::load(paths, log.defaultLog());
+  [[nodiscard]] std::unique_ptr<TokenSession> loadedSession(
+      std::chrono::milliseconds longestWaitForUses = TokenSession::kLongestWaitForUses) {
+    auto session = TokenSession::load(paths, log.defaultLog(), longestWaitForUses);
     if (auto* loaded = std::get_if<std::unique_ptr<TokenSession>>(&session)) return std::move(*loaded);
     throw std::runtime_error(std::get<QXError>(session).description());
   }

@@ -8,7 +8,9 @@
 #include <memory>
 #include <optional>
 #include <string>
+#include <thread>
 #include <utility>
+#include <vector>
 
 #include "platform/fake/FakeLog.h"
 #include "platform/fake/FakeRpc.h"
@@ -20,7 +22,6 @@ namespace docuvend::linux_platform {
 namespace {
 
 struct Redeemed {
-  int answers = 0;
   std::optional<QXError> error;
   std::optional<QXDescriptor> file;
 };
@@ -34,6 +35,7 @@ class SandboxServicerTest : public testing::SandboxHouse {
     connectAs(peers.add(confined("com.example.editor", "1")));
   }
   void connectAs(const QXAuditToken& token) {
+    if (connection) earlier.push_back(connection);
     connection = fake_platform::FakeRpcConnection::create();
     connection->setProcessIdentifier(4711);
     connection->setAuditToken(token);
@@ -44,18 +46,16 @@ class SandboxServicerTest : public testing::SandboxHouse {
     EXPECT_TRUE(token) << path;
     return QXData::fromText(token.value_or(""));
   }
-  Redeemed redeem(std::optional<QXData> token, std::optional<bool> forWriting) {
-    Redeemed heard;
+  std::future<Redeemed> redeeming(std::optional<QXData> token, std::optional<bool> forWriting) {
+    const auto answer = std::make_shared<std::promise<Redeemed>>();
     QXRemote<QXSandboxRedemption>(connection->peer())
         .call<&QXSandboxRedemption::redeemToken>(std::move(token), forWriting,
-                                                 [&heard](std::optional<QXError> error, std::optional<QXDescriptor> file) {
-                                                   ++heard.answers;
-                                                   heard.error = std::move(error);
-                                                   heard.file = std::move(file);
+                                                 [answer](std::optional<QXError> error, std::optional<QXDescriptor> file) {
+                                                   answer->set_value({std::move(error), std::move(file)});
                                                  });
-    EXPECT_EQ(heard.answers, 1);
-    return heard;
+    return answer->get_future();
   }
+  Redeemed redeem(std::optional<QXData> token, std::optional<bool> forWriting) { return redeeming(std::move(token), forWriting).get(); }
   // Its answer comes from a thread that waits for the disk.
   std::future<std::optional<QXError>> replacing(std::optional<QXData> item, std::optional<QXData> by) {
     const auto answer = std::make_shared<std::promise<std::optional<QXError>>>();
@@ -81,6 +81,7 @@ class SandboxServicerTest : public testing::SandboxHouse {
   const std::shared_ptr<SandboxListenerDelegate> delegate = std::make_shared<SandboxListenerDelegate>(sandbox, log.defaultLog());
   fake_platform::FakeRpcListener listener;
   std::shared_ptr<fake_platform::FakeRpcConnection> connection;
+  std::vector<std::shared_ptr<fake_platform::FakeRpcConnection>> earlier;  // they stay, for they may be answered yet
 };
 
 TEST_F(SandboxServicerTest, HandsOutTheOpenFile) {
@@ -199,7 +200,6 @@ TEST_F(SandboxServicerTest, MakesAnotherBundlesReplacementWhileOneWaitsForTheDis
   StuckDisk disk;
   auto replacement = replacing(issued(document), issued(sibling));
   ASSERT_TRUE(disk.awaitFlush());
-  const auto waiting = connection;
   connectAs(peers.add(confined("com.example.other", "9")));
   EXPECT_EQ(replace(issued(another), issued(storage + "/.another.txt")), std::nullopt);
   EXPECT_EQ(testing::read(another), "");
@@ -231,6 +231,106 @@ TEST_F(SandboxServicerTest, LogsATokenThatIsTakenBackBeforeTheDiskHasTheReplacem
   EXPECT_EQ(sandbox.invalidateReadWriteExtensions(storage), std::nullopt);
   disk.letGo();
   expectError(replacement.get(), SandboxErrorCode::badToken);
+  EXPECT_EQ(log.entries(), refusals("the token was taken back"));
+}
+
+constexpr std::chrono::seconds kNow{0};
+
+// Whether it is answered already.
+template <class Answer>
+bool isReady(std::future<Answer>& answer) {
+  return answer.wait_for(kNow) == std::future_status::ready;
+}
+
+// A document is written without end, and something is to be done to it or to its directory that needs the lock.
+class LockedStorage : public SandboxServicerTest {
+ protected:
+  void SetUp() override {
+    SandboxServicerTest::SetUp();
+    testing::write(another_, "another");
+    testing::write(elsewhere_, "elsewhere");
+  }
+  [[nodiscard]] QXData newSiblingIn(const std::string& directory, const std::string& name) {
+    testing::write(directory + "/" + name, "");
+    return issued(directory + "/." + name);
+  }
+  void connectAsBundle(const std::string& bundle) { connectAs(peers.add(confined(bundle, bundle))); }
+
+  const std::string another_ = storage + "/another.txt";
+  const std::string elsewhere_ = otherGroup + "/elsewhere.txt";
+};
+
+TEST_F(LockedStorage, KeepsNobodyFromWhatIsThere) {
+  testing::LockedDirectory locked(storage);
+  auto making = redeeming(issued(sibling), true);
+  ASSERT_TRUE(locked.awaitWaiting(1));
+  auto there = redeeming(issued(document), true);
+  EXPECT_TRUE(isReady(there)) << "the same connection is served at once";
+  EXPECT_TRUE(there.get().file);
+  EXPECT_FALSE(isReady(making));
+  locked.unlock();
+  EXPECT_TRUE(making.get().file);
+}
+
+TEST_F(LockedStorage, HoldsUpNoThreadThatServesWhenAFilesModeIsGivenBack) {
+  ASSERT_EQ(::chmod(document.c_str(), 0), 0);
+  testing::LockedDirectory locked(storage);
+  auto redemption = redeeming(issued(document), true);
+  ASSERT_TRUE(locked.awaitWaiting(1));
+  auto there = redeeming(issued(another_), true);
+  EXPECT_TRUE(isReady(there));
+  EXPECT_FALSE(isReady(redemption));
+  locked.unlock();
+  EXPECT_TRUE(redemption.get().file);
+}
+
+TEST_F(LockedStorage, HoldsUpNeitherOtherBundlesNorTheUnconfinedElsewhere) {
+  ASSERT_TRUE(redeem(issued(sibling), true).file);
+  std::vector<std::future<Redeemed>> held;
+  testing::LockedDirectory locked(storage);
+  auto replacement = replacing(issued(document), issued(sibling));
+  // More honest applications than there are threads save other documents in the same directory.
+  for (std::size_t i = 0; i <= DiskWork::kMostThreads; ++i) {
+    connectAsBundle("com.example.saver" + std::to_string(i));
+    held.push_back(redeeming(newSiblingIn(storage, std::to_string(i)), true));
+  }
+  ASSERT_TRUE(locked.awaitWaiting(DiskWork::kMostThreadsOfDirectory));
+  connectAsBundle("com.example.other");
+  EXPECT_TRUE(redeem(newSiblingIn(otherGroup, "others"), true).file);
+  EXPECT_EQ(replace(issued(otherGroup + "/others"), issued(otherGroup + "/.others")), std::nullopt);
+  connectAs(peers.add(thisProcess(Standing::unconfined)));
+  EXPECT_TRUE(redeem(newSiblingIn(otherGroup, "unconfined"), true).file);
+  EXPECT_FALSE(isReady(replacement));
+  locked.unlock();
+  EXPECT_EQ(replacement.get(), std::nullopt);
+  for (auto& redemption : held) EXPECT_TRUE(redemption.get().file);
+}
+
+TEST_F(LockedStorage, KeepsTheOrderInWhichOneBundleAsksForASiblingAndItsReplacement) {
+  testing::LockedDirectory locked(storage);
+  auto making = redeeming(issued(sibling), true);
+  auto replacement = replacing(issued(document), issued(sibling));
+  ASSERT_TRUE(locked.awaitWaiting(1));
+  locked.unlock();
+  EXPECT_TRUE(making.get().file);
+  EXPECT_EQ(replacement.get(), std::nullopt);
+  EXPECT_EQ(testing::read(document), "");
+}
+
+TEST_F(LockedStorage, IsRedeemedForATokenThatWasTakenBackMeanwhileByNobody) {
+  const auto item = issued(document);
+  const auto by = issued(sibling);
+  testing::LockedDirectory locked(storage);
+  auto making = redeeming(by, true);
+  ASSERT_TRUE(locked.awaitWaiting(1));
+  EXPECT_EQ(sandbox.invalidateReadWriteExtensions(otherGroup), std::nullopt) << "that concerns nothing under way";
+  auto revocation = std::async(std::launch::async, [this] { return sandbox.invalidateReadWriteExtensions(storage); });
+  while (!redeem(item, false).error) std::this_thread::yield();
+  locked.unlock();
+  EXPECT_EQ(revocation.get(), std::nullopt) << "it has waited for that";
+  const Redeemed redeemed = making.get();
+  expectError(redeemed.error, SandboxErrorCode::badToken);
+  EXPECT_FALSE(redeemed.file);
   EXPECT_EQ(log.entries(), refusals("the token was taken back"));
 }
 

@@ -8,6 +8,7 @@
 
 #include <array>
 #include <atomic>
+#include <cerrno>
 #include <csignal>
 #include <cstdio>
 #include <filesystem>
@@ -77,7 +78,7 @@ class TokenRedeemerTest : public testing::SandboxHouse {
   }
 
   const TokenKey key = TokenKey::random();
-  TokenSession session{paths.tokenFloors, key, TokenFloors()};
+  TokenSession session{paths.tokenFloors, key, TokenFloors(), log.defaultLog(), testing::kNotLong};
   GroupContainers containers{bundles};
   const TokenRedeemer redeemer{session, containers};
 };
@@ -341,6 +342,64 @@ TEST_F(TokenRedeemerTest, ForcesContentsAndModeBeforeTheRenameAndTheDirectoryAft
   ASSERT_TRUE(std::holds_alternative<ReplacedItem>(result));
   EXPECT_EQ(TokenRedeemer::forceToDisk(std::move(std::get<ReplacedItem>(result))), std::nullopt);
   EXPECT_EQ(flushed, (std::vector<std::string>{sibling + " before it", storage + "/ after it"}));
+}
+
+TEST_F(TokenRedeemerTest, RedeemsAtOnceWhatNeedsNoLock) {
+  const testing::LockedDirectory locked(group);
+  for (const TokenUse use : {TokenUse::reading, TokenUse::writing}) {
+    const auto redeemed = redeemer.redeemAtOnce(tokenFor(document), use);
+    ASSERT_TRUE(redeemed);
+    EXPECT_EQ(contentsOf(std::get<RedeemedFile>(*redeemed).file), "contents");
+  }
+  const auto refused = redeemer.redeemAtOnce("x", TokenUse::reading);
+  ASSERT_TRUE(refused);
+  EXPECT_EQ(std::get<QXError>(*refused).code, static_cast<std::int64_t>(SandboxErrorCode::badToken));
+}
+
+TEST_F(TokenRedeemerTest, DoesNothingAtOnceThatMayHaveToWait) {
+  const testing::LockedDirectory locked(group);
+  EXPECT_FALSE(redeemer.redeemAtOnce(tokenFor(sibling), TokenUse::writing)) << "it would be made";
+  EXPECT_FALSE(std::filesystem::exists(sibling));
+  EXPECT_FALSE(redeemer.redeemAtOnce(tokenFor(storage + "/none.txt"), TokenUse::reading)) << "it would be looked for";
+  EXPECT_FALSE(redeemer.redeemAtOnce(tokenFor(storage + "/none/none.txt"), TokenUse::reading)) << "its directory would be looked for";
+  const UniqueDescriptor bearers = redeemed(tokenFor(document), TokenUse::writing);
+  testing::SystemCalls none;
+  ASSERT_EQ(::fchmod(bearers.get(), 0), 0);
+  EXPECT_FALSE(redeemer.redeemAtOnce(tokenFor(document), TokenUse::reading)) << "its mode would be changed";
+  EXPECT_EQ(modeOf(document), 0U);
+}
+
+// A cut does not wait for ever for those who stand in line for a lock.
+TEST_F(TokenRedeemerTest, HandsNothingOutForATokenThatIsTakenBackWhileTheFileIsLocked) {
+  ASSERT_EQ(::chmod(document.c_str(), 0), 0);
+  for (const std::string& path : {document, sibling}) {
+    testing::SystemCalls calls;
+    int cuts = 0;
+    calls.beforeLocking = [this, &cuts, &path](const std::string& object) {
+      if (object != path && object != storage) return;
+      const auto error = session.takeBack({storage + "/"});
+      ASSERT_TRUE(error);
+      EXPECT_EQ(error->code, EBUSY);
+      ++cuts;
+    };
+    expectError(session.issue(path).value_or(""), TokenUse::writing, SandboxErrorCode::badToken, path);
+    EXPECT_EQ(cuts, 1);
+  }
+  EXPECT_EQ(log.writes(), 2U);
+}
+
+TEST_F(TokenRedeemerTest, RenamesForATokenThatIsTakenBackWhileTheItemIsLockedAndSaysThatItIsNoGood) {
+  ASSERT_TRUE(puts(redeemed(tokenFor(sibling), TokenUse::writing), "new"));
+  testing::SystemCalls calls;
+  calls.beforeLocking = [this](const std::string& object) {
+    if (object == storage) {
+      EXPECT_TRUE(session.takeBack({storage + "/"}));
+    }
+  };
+  const auto result = redeemer.replaceItem(tokenFor(document), tokenFor(sibling));
+  ASSERT_TRUE(std::holds_alternative<ReplacedItem>(result));
+  EXPECT_EQ(read(document), "new") << "nobody can call it back";
+  EXPECT_FALSE(session.isGood(std::get<ReplacedItem>(result).inUse.token));
 }
 
 // One that goes on writing would put it off.

@@ -6,6 +6,8 @@
 
 #include <array>
 #include <atomic>
+#include <cerrno>
+#include <chrono>
 #include <filesystem>
 #include <functional>
 #include <string>
@@ -24,11 +26,11 @@ using testing::write;
 
 class TokenSessionTest : public ::testing::Test {
  protected:
-  [[nodiscard]] std::unique_ptr<TokenSession> loaded() {
-    auto session = TokenSession::load(paths, log.defaultLog());
+  [[nodiscard]] std::unique_ptr<TokenSession> loaded(std::chrono::milliseconds longestWaitForUses = TokenSession::kLongestWaitForUses) {
+    auto session = TokenSession::load(paths, log.defaultLog(), longestWaitForUses);
     if (auto* found = std::get_if<std::unique_ptr<TokenSession>>(&session)) return std::move(*found);
     ADD_FAILURE() << std::get<QXError>(session).description();
-    return std::make_unique<TokenSession>(paths.tokenFloors, TokenKey::random(), TokenFloors());
+    return std::make_unique<TokenSession>(paths.tokenFloors, TokenKey::random(), TokenFloors(), log.defaultLog());
   }
   [[nodiscard]] static std::string issued(TokenSession& session, const std::string& path) {
     auto token = session.issue(path);
@@ -321,9 +323,9 @@ TEST_F(TokenSessionTest, WaitsForWhoeverActsOnAnOldToken) {
     std::atomic<int> acting{0};
     std::thread user([&session, &token, &begun, &acting] {
       for (;;) {
-        const auto use = session->beginUse();
+        const auto use = session->use(token);
         begun.store(true);
-        if (!isGood(*session, token)) return;
+        if (!std::holds_alternative<TokenInUse>(use)) return;
         ++acting;
         std::this_thread::yield();
         --acting;
@@ -336,6 +338,47 @@ TEST_F(TokenSessionTest, WaitsForWhoeverActsOnAnOldToken) {
     user.join();
     token = issued(*session, "/a/b");
   }
+}
+
+TEST_F(TokenSessionTest, WaitsForNobodyWhoActsOnATokenForAnotherDirectory) {
+  const auto session = loaded();
+  const auto acting = session->use(issued(*session, "/a/b"));
+  ASSERT_TRUE(std::holds_alternative<TokenInUse>(acting));
+  EXPECT_EQ(session->takeBack({"/b/", "/a/b/"}), std::nullopt);
+  EXPECT_EQ(session->changePlaces("places", {"/a/"}), std::nullopt) << "that waits for nobody at all";
+  EXPECT_FALSE(session->isGood(std::get<TokenInUse>(acting).token));
+  EXPECT_TRUE(log.entries().empty());
+}
+
+// The kernel may hold him up for as long as somebody likes.
+TEST_F(TokenSessionTest, WaitsForWhoeverActsOnAnOldTokenButNotForEverAndSaysSo) {
+  auto session = loaded(testing::kNotLong);
+  const std::string token = issued(*session, "/a/b");
+  const auto first = session->use(token);
+  const auto second = session->use(issued(*session, "/a/c"));
+  ASSERT_TRUE(std::holds_alternative<TokenInUse>(first));
+  const auto error = session->takeBack({"/a/"});
+  ASSERT_TRUE(error);
+  EXPECT_EQ(error->domain, kQXSystemErrorDomain);
+  EXPECT_EQ(error->code, EBUSY);
+  EXPECT_EQ(log.entries(),
+            (std::vector<fake_platform::FakeLogEntry>{
+                {QXLogType::fault,
+                 "[ERROR] Tokens were taken back, and what 2 of them had begun before is still under way, the first of them for /a/b."}}));
+  expectTakenBack(*session, token);
+  expectTakenBack(*loaded(), token);
+  EXPECT_FALSE(session->isGood(std::get<TokenInUse>(first).token));
+}
+
+TEST_F(TokenSessionTest, SaysOfACutThatItCouldNotBeWrittenRatherThanWhatIsUnderWay) {
+  const auto session = loaded(testing::kNotLong);
+  const auto acting = session->use(issued(*session, "/a/b"));
+  lockDirectory();
+  const auto error = session->takeBack({"/a/"});
+  unlockDirectory();
+  ASSERT_TRUE(error);
+  EXPECT_EQ(error->code, EACCES);
+  EXPECT_EQ(log.writes(), 1U) << "the log says the other";
 }
 
 TEST_F(TokenSessionTest, IssuesGoodTokensWhileOthersCut) {

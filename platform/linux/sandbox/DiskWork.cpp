@@ -1,5 +1,6 @@
 #include "platform/linux/sandbox/DiskWork.h"
 
+#include <algorithm>
 #include <system_error>
 #include <utility>
 
@@ -25,35 +26,50 @@ DiskWork::~DiskWork() {
   for (std::thread& thread : threads_) thread.join();
 }
 
-void DiskWork::submit(const std::string& owner, std::function<void()> work) {
+void DiskWork::submit(const std::string& owner, std::string directory, std::function<void()> work) {
   const std::lock_guard lock(mutex_);
   const auto [line, isNew] = lines_.try_emplace(owner);
-  line->second.push_back(LogSubject::carrying(std::move(work)));
+  line->second.push_back({std::move(directory), LogSubject::carrying(std::move(work))});
   if (!isNew) return;
   waiting_.push_back(owner);
   changed_.notify_one();
 }
 
+std::optional<std::string> DiskWork::takeNextOwner() {
+  const auto mayRun = [this](const std::string& owner) {
+    const auto running = running_.find(lines_.at(owner).front().directory);
+    return running == running_.end() || running->second < kMostThreadsOfDirectory;
+  };
+  const auto next = std::find_if(waiting_.begin(), waiting_.end(), mayRun);
+  if (next == waiting_.end()) return std::nullopt;
+  std::string owner = std::move(*next);
+  waiting_.erase(next);
+  return owner;
+}
+
 void DiskWork::run() {
   std::unique_lock lock(mutex_);
   while (true) {
-    changed_.wait(lock, [this] { return stopping_ || !waiting_.empty(); });
+    std::optional<std::string> owner;
+    changed_.wait(lock, [this, &owner] { return stopping_ || (owner = takeNextOwner()); });
     if (stopping_) return;
-    const std::string owner = std::move(waiting_.front());
-    waiting_.pop_front();
-    const auto line = lines_.find(owner);
-    auto work = std::move(line->second.front());
+    const auto line = lines_.find(*owner);
+    Work work = std::move(line->second.front());
     line->second.pop_front();
+    const auto running = running_.try_emplace(work.directory).first;
+    ++running->second;
     lock.unlock();
-    work();
-    work = {};
+    work.run();
+    work.run = {};
     lock.lock();
+    if (--running->second == 0) running_.erase(running);
     if (line->second.empty()) {
       lines_.erase(line);
     } else {
-      waiting_.push_back(owner);
-      changed_.notify_one();
+      waiting_.push_back(std::move(*owner));
     }
+    // There is room in the directory, for this owner or for another.
+    if (!waiting_.empty()) changed_.notify_all();
   }
 }
 

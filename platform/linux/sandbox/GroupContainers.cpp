@@ -122,7 +122,7 @@ std::variant<GroupContainers::Root, PathRefusal> GroupContainers::rootOf(const s
   return PathRefusal::outsideContainers;
 }
 
-std::variant<PlacedItem, PathRefusal> GroupContainers::place(const std::string& path) {
+std::variant<PlacedItem, PathRefusal> GroupContainers::place(const std::string& path, Lookup lookup) {
   auto plain = normalised(path);
   if (const auto* refusal = std::get_if<PathRefusal>(&plain)) return *refusal;
   auto found = rootOf(std::get<std::string>(plain));
@@ -134,11 +134,12 @@ std::variant<PlacedItem, PathRefusal> GroupContainers::place(const std::string& 
   if (item.path.size() > kMaximumTokenPathLength) return PathRefusal::malformed;
   const auto slash = root.below.rfind('/');
   item.name = slash == std::string::npos ? root.below : root.below.substr(slash + 1);
-  auto directory = openBeneath(root.directory.get(), slash == std::string::npos ? "." : root.below.substr(0, slash), Expecting::directory);
+  auto directory =
+      openBeneath(root.directory.get(), slash == std::string::npos ? "." : root.below.substr(0, slash), Expecting::directory, lookup);
   if (const auto* failure = std::get_if<SystemFailure>(&directory)) return refusalFor(failure->code);
   item.directory = std::move(std::get<UniqueDescriptor>(directory));
 
-  auto entry = placeEntry(item.directory.get(), item.name);
+  auto entry = placeEntry(item.directory.get(), item.name, lookup);
   if (const auto* refusal = std::get_if<PathRefusal>(&entry)) return *refusal;
   item.file = std::move(std::get<std::optional<PlacedFile>>(entry));
   return item;
@@ -166,9 +167,9 @@ std::vector<std::string> GroupContainers::spellingsOf(const std::string& directo
   return {spellings.begin(), spellings.end()};
 }
 
-std::variant<std::optional<PlacedFile>, PathRefusal> placeEntry(int directory, const std::string& name) {
+std::variant<std::optional<PlacedFile>, PathRefusal> placeEntry(int directory, const std::string& name, Lookup lookup) {
   for (int look = 0; look < kLooks; ++look) {
-    auto opened = openBeneath(directory, name, Expecting::anything);
+    auto opened = openBeneath(directory, name, Expecting::anything, lookup);
     if (const auto* failure = std::get_if<SystemFailure>(&opened)) {
       if (failure->code == ENOENT) return std::optional<PlacedFile>();
       return refusalFor(failure->code);

@@ -27,7 +27,7 @@ enum class PathRefusal {
   symbolicLink,
   notRegularFile,
   severalLinks,
-  unsteady,     // renamed again and again while it was looked at
+  unsteady,     // renamed again and again while it was looked at; or not in the kernel's cache, where only that is looked at
   unreachable,  // the system refuses for another reason
 };
 
@@ -50,7 +50,7 @@ class GroupContainers {
  public:
   explicit GroupContainers(BundleRegistry& registry);
 
-  [[nodiscard]] std::variant<PlacedItem, PathRefusal> place(const std::string& path);
+  [[nodiscard]] std::variant<PlacedItem, PathRefusal> place(const std::string& path, Lookup lookup = Lookup::complete);
 
   // Directories without links, each with a final slash: below one of them lies every path that `place` has given, or may give, for a file
   // below that directory, whether or not it exists. Everything ("/") when the directory's path is malformed.
@@ -74,6 +74,7 @@ class GroupContainers {
 };
 
 // What has that name in the directory, if anything; only a regular file with one link will do.
-[[nodiscard]] std::variant<std::optional<PlacedFile>, PathRefusal> placeEntry(int directory, const std::string& name);
+[[nodiscard]] std::variant<std::optional<PlacedFile>, PathRefusal> placeEntry(int directory, const std::string& name,
+                                                                              Lookup lookup = Lookup::complete);
 
 }  // namespace docuvend::linux_platform

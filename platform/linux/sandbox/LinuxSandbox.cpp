@@ -3,6 +3,8 @@
 #include <unistd.h>
 
 #include <cerrno>
+#include <string>
+#include <utility>
 
 #include "platform/linux/sandbox/SandboxErrors.h"
 
@@ -34,9 +36,10 @@ int codeFor(AccessVerdict verdict) {
   return EPERM;
 }
 
-// Whose replacements wait for one another. What is not confined counts as one, as everywhere.
+// Whose work waits for one another's. Processes that are not confined do not belong together, and are trusted not to be many.
 std::string ownerOf(const PeerIdentity& peer) {
-  return peer.standing == Standing::confined ? peer.bundleIdentifier.value_or("") : std::string();
+  if (peer.standing == Standing::confined) return peer.bundleIdentifier.value_or("");
+  return "process " + std::to_string(peer.pid);
 }
 
 QXError nobodyError() { return sandboxError(SandboxErrorCode::notPermitted, "the caller is not known"); }
@@ -57,7 +60,7 @@ LinuxSandbox::LinuxSandbox(std::unique_ptr<TokenSession> session, BundleRegistry
       containers_(registry),
       redeemer_(*session_, containers_),
       query_(registry, peers, ledger_) {
-  places_.followChanges();
+  static_cast<void>(places_.follow());  // what cannot be written is tried again by whoever issues
 }
 
 std::optional<std::string> LinuxSandbox::issueReadWriteExtension(const std::string& path) {
@@ -93,13 +96,22 @@ std::shared_ptr<const PeerIdentity> LinuxSandbox::somebody(const QXAuditToken& c
   return peer;
 }
 
-std::variant<UniqueDescriptor, QXError> LinuxSandbox::redeem(const QXAuditToken& caller, std::string_view token, TokenUse use) {
+void LinuxSandbox::redeem(const QXAuditToken& caller, std::string token, TokenUse use, FileCompletion completion) {
   const auto peer = somebody(caller);
-  if (!peer) return nobodyError();
-  auto redeemed = redeemer_.redeem(token, use);
+  if (!peer) return completion(nobodyError());
+  if (auto redeemed = redeemer_.redeemAtOnce(token, use)) return completion(entered(peer->instance, use, std::move(*redeemed)));
+  auto directory = redeemer_.directoryOf(token);
+  if (auto* error = std::get_if<QXError>(&directory)) return completion(std::move(*error));
+  diskWork_.submit(ownerOf(*peer), std::move(std::get<std::string>(directory)),
+                   [this, instance = peer->instance, token = std::move(token), use, completion = std::move(completion)] {
+                     completion(entered(instance, use, redeemer_.redeem(token, use)));
+                   });
+}
+
+std::variant<UniqueDescriptor, QXError> LinuxSandbox::entered(const std::string& instance, TokenUse use, TokenRedeemer::Redeemed redeemed) {
   if (auto* error = std::get_if<QXError>(&redeemed)) return std::move(*error);
   auto& file = std::get<RedeemedFile>(redeemed);
-  if (use == TokenUse::writing) ledger_.enter(peer->instance, {file.identity, file.path});
+  if (use == TokenUse::writing) ledger_.enter(instance, {file.identity, file.path});
   return std::move(file.file);
 }
 
@@ -107,10 +119,12 @@ void LinuxSandbox::replaceItem(const QXAuditToken& caller, std::string itemToken
   const auto peer = somebody(caller);
   if (!peer) return completion(nobodyError());
   // What waits is no longer than a good token.
-  for (const std::string& token : {itemToken, siblingToken}) {
-    if (auto error = redeemer_.refusalOf(token)) return completion(std::move(error));
+  auto directory = redeemer_.directoryOf(itemToken);
+  auto siblings = redeemer_.directoryOf(siblingToken);
+  for (auto* found : {&directory, &siblings}) {
+    if (auto* error = std::get_if<QXError>(found)) return completion(std::move(*error));
   }
-  diskWork_.submit(ownerOf(*peer),
+  diskWork_.submit(ownerOf(*peer), std::move(std::get<std::string>(directory)),
                    [this, instance = peer->instance, itemToken = std::move(itemToken), siblingToken = std::move(siblingToken),
                     completion = std::move(completion)] { completion(replaceItemNow(instance, itemToken, siblingToken)); });
 }
@@ -120,8 +134,9 @@ std::optional<QXError> LinuxSandbox::replaceItemNow(const std::string& instance,
   auto replaced = redeemer_.replaceItem(itemToken, siblingToken);
   if (auto* error = std::get_if<QXError>(&replaced)) return std::move(*error);
   auto& item = std::get<ReplacedItem>(replaced);
-  // The item is another object now, and the one who put it there may say that it has written it.
-  ledger_.enter(instance, {item.identity, item.path});
+  // The item is another object now, and the one who put it there may say that it has written it; not by a token that was taken back while
+  // the rename stood in line.
+  if (session_->isGood(item.inUse.token)) ledger_.enter(instance, {item.identity, item.path});
   return TokenRedeemer::forceToDisk(std::move(item));
 }
 

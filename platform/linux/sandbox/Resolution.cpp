@@ -25,7 +25,8 @@ OpenedPath resolve(int directory, const std::string& path, std::uint64_t flags, 
   for (int attempt = 0; attempt < kResolutionTries; ++attempt) {
     const long number = ::syscall(SYS_openat2, directory, path.c_str(), &how, sizeof how);
     if (number >= 0) return UniqueDescriptor(static_cast<int>(number));
-    if (errno != EAGAIN && errno != EINTR) return SystemFailure{errno};
+    const bool isToBeTriedAgain = errno == EINTR || (errno == EAGAIN && (restrictions & RESOLVE_CACHED) == 0);
+    if (!isToBeTriedAgain) return SystemFailure{errno};
   }
   return SystemFailure{EAGAIN};
 }
@@ -47,9 +48,10 @@ std::variant<ObjectStatus, SystemFailure> statusOf(int descriptor) {
   return result;
 }
 
-OpenedPath openBeneath(int directory, const std::string& path, Expecting expecting) {
+OpenedPath openBeneath(int directory, const std::string& path, Expecting expecting, Lookup lookup) {
+  constexpr std::uint64_t kBeneath = RESOLVE_BENEATH | RESOLVE_NO_SYMLINKS | RESOLVE_NO_MAGICLINKS | RESOLVE_NO_XDEV;
   return resolve(directory, path, expecting == Expecting::directory ? O_DIRECTORY : 0,
-                 RESOLVE_BENEATH | RESOLVE_NO_SYMLINKS | RESOLVE_NO_MAGICLINKS | RESOLVE_NO_XDEV);
+                 lookup == Lookup::inCacheAlone ? kBeneath | RESOLVE_CACHED : kBeneath);
 }
 
 OpenedPath openInRoot(int root, const std::string& path, FinalLink finalLink) {

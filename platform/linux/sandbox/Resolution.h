@@ -39,8 +39,12 @@ using OpenedPath = std::variant<UniqueDescriptor, SystemFailure>;
 
 enum class Expecting { anything, directory };
 
-// O_PATH of what `path` names below the directory: no symbolic link, no way up, no other mount.
-[[nodiscard]] OpenedPath openBeneath(int directory, const std::string& path, Expecting expecting);
+// A name that the kernel has not in its cache is looked for in its directory, which may be locked by whoever changes something there.
+enum class Lookup { complete, inCacheAlone };
+
+// O_PATH of what `path` names below the directory: no symbolic link, no way up, no other mount. EAGAIN when more than the cache would have
+// to be looked at, and may not be.
+[[nodiscard]] OpenedPath openBeneath(int directory, const std::string& path, Expecting expecting, Lookup lookup = Lookup::complete);
 
 enum class FinalLink { followed, itself };
 

@@ -2,6 +2,7 @@
 
 #include <string>
 #include <utility>
+#include <variant>
 
 #include "platform/QXLogMessage.h"
 
@@ -13,18 +14,20 @@ std::string textOf(const std::optional<QXData>& token) { return token ? token->t
 }  // namespace
 
 void SandboxServicer::redeemToken(std::optional<QXData> token, std::optional<bool> forWriting, FileReply completionHandler) {
-  auto redeemed = sandbox_.redeem(caller(), textOf(token), forWriting.value_or(false) ? TokenUse::writing : TokenUse::reading);
-  if (auto* error = std::get_if<QXError>(&redeemed)) {
-    noteRefusal(*error);
-    if (completionHandler) completionHandler(std::move(*error), /*file=*/{});
-    return;
-  }
-  if (completionHandler) completionHandler(/*error=*/{}, toValue(std::move(std::get<UniqueDescriptor>(redeemed))));
+  // The connection may let go of this before it is done.
+  sandbox_.redeem(
+      caller(), textOf(token), forWriting.value_or(false) ? TokenUse::writing : TokenUse::reading,
+      [self = shared_from_this(), completionHandler = std::move(completionHandler)](std::variant<UniqueDescriptor, QXError> redeemed) {
+        auto* error = std::get_if<QXError>(&redeemed);
+        if (error != nullptr) self->noteRefusal(*error);
+        if (!completionHandler) return;
+        if (error != nullptr) return completionHandler(std::move(*error), /*file=*/{});
+        completionHandler(/*error=*/{}, toValue(std::move(std::get<UniqueDescriptor>(redeemed))));
+      });
 }
 
 void SandboxServicer::replaceItemWithToken(std::optional<QXData> itemToken, std::optional<QXData> bySiblingWithToken,
                                            ErrorReply completionHandler) {
-  // The connection may let go of this before the disk has what is to be there.
   sandbox_.replaceItem(caller(), textOf(itemToken), textOf(bySiblingWithToken),
                        [self = shared_from_this(), completionHandler = std::move(completionHandler)](std::optional<QXError> error) {
                          if (error) self->noteRefusal(*error);

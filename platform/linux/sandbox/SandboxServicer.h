@@ -1,8 +1,8 @@
 // One connection's share of the service "com.orvane.Sandbox".
 //
-// Redeems on the connection's serial context, before the operation returns. A replacement waits for the disk, so it is answered later and
-// elsewhere, and the connection's next requests are served meanwhile. A refused token is logged once per connection, with its reason but
-// never with its text.
+// A file that is there is redeemed on the connection's serial context, before the operation returns. What may have to wait for the disk, or
+// for others who write, is answered later and elsewhere, and the connection's next requests are served meanwhile. A refused token is logged
+// once per connection, with its reason but never with its text.
 #pragma once
 
 #include <atomic>
@@ -18,7 +18,7 @@ namespace docuvend::linux_platform {
 
 class SandboxServicer final : public QXSandboxRedemption, public std::enable_shared_from_this<SandboxServicer> {
  public:
-  // The sandbox and the log outlive it. The connection owns it, with the replacements that are being made for it.
+  // The sandbox and the log outlive it. The connection owns it, with what is being done for it elsewhere.
   SandboxServicer(LinuxSandbox& sandbox, QXLogHandle& log, std::weak_ptr<QXRpcConnection> connection)
       : sandbox_(sandbox), log_(log), connection_(std::move(connection)) {}
 

@@ -45,8 +45,8 @@ std::optional<QXError> TokenPlaces::follow() {
   if (known_ == now) return std::nullopt;
   const auto left = leftSince(now);
   auto error = session_.changePlaces(described(now), left);
-  // Nobody is in the middle of entering what he redeemed with an old token: the change has waited for that.
   ledger_.forgetBelow(left);
+  unsettled_.insert(unsettled_.end(), left.begin(), left.end());
   known_ = std::move(now);
   return error;
 }
@@ -56,8 +56,21 @@ void TokenPlaces::followChanges() {
   if (stale_->load()) static_cast<void>(follow());
 }
 
+void TokenPlaces::settle() {
+  std::vector<std::string> left;
+  {
+    const std::lock_guard lock(mutex_);
+    left.swap(unsettled_);
+  }
+  // The log says who is late.
+  static_cast<void>(session_.waitForUses(left));
+  // What somebody entered who had looked at his token before. Who is late looks again, and enters nothing.
+  ledger_.forgetBelow(left);
+}
+
 std::optional<QXError> TokenPlaces::takeBack(const std::optional<std::string>& directory) {
   auto error = follow();
+  settle();
   auto cutError = session_.takeBack(containers_.spellingsOf(directory.value_or(std::string(kEverything))));
   ledger_.forgetAll();
   return cutError ? cutError : error;

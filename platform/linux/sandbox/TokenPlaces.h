@@ -13,6 +13,7 @@
 #include <set>
 #include <string>
 #include <utility>
+#include <vector>
 
 #include "platform/QXError.h"
 #include "platform/linux/bundles/Bundle.h"
@@ -29,10 +30,12 @@ class TokenPlaces {
 
   // Afterwards the session knows what is installed now, and what was issued for containers that a bundle has left since is taken back.
   // After an error the old tokens are refused by this process; a restart may make them good again, and nothing is issued until it is
-  // written down.
+  // written down. Waits for nobody who acts on such a token.
   [[nodiscard]] std::optional<QXError> follow();
   // The same, if the registry has told of a change since.
   void followChanges();
+  // Waits for those, as TokenSession does.
+  void settle();
 
   // Of what is installed now. None: everything.
   [[nodiscard]] std::optional<QXError> takeBack(const std::optional<std::string>& directory);
@@ -50,7 +53,9 @@ class TokenPlaces {
   const std::shared_ptr<std::atomic<bool>> stale_ = std::make_shared<std::atomic<bool>>(true);
 
   std::mutex mutex_;
-  std::optional<Memberships> known_;  // guarded by mutex_; none until the first look
+  // Guarded by mutex_.
+  std::optional<Memberships> known_;    // none until the first look
+  std::vector<std::string> unsettled_;  // was left, and nobody has waited yet for those who act on tokens below it
 };
 
 }  // namespace docuvend::linux_platform

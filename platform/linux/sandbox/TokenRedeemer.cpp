@@ -6,10 +6,15 @@
 // A rename has no such form: it takes names. Both names are single components in one directory that is held open, so nothing outside that
 // directory can be meant, and what has the item's name afterwards is compared with the sibling that was examined.
 //
-// A token may be taken back at any moment, too. Whatever comes of it happens within one use of the session, which began before the token
-// was looked at: a cut that the token has not seen yet waits for the use to end. Forcing a sibling's contents to disk takes as long as its
+// A token may be taken back at any moment, too. Whatever comes of it happens within a use of it, which began before the floors were looked
+// at: a cut that the token has not seen yet waits for the use to end. Forcing a sibling's contents to disk takes as long as its
 // writer likes, so that comes before the use, and with it the item's mode, which needs no flush of its own then; the directory is forced
 // when the use is over. A crash in between finds the item as it was or as it is to be.
+//
+// What makes, renames or changes a file stands in line, in the kernel, with those who write it: a rename for the file that it replaces, and
+// meanwhile it has the directory locked, so that whoever makes or looks for another name there stands in line too. No call can be told not
+// to wait. So what is done at once is only what needs no such lock: a file that the kernel knows by its name, and that this user may open.
+// A cut gives up its wait in time; whoever comes out of the line then finds that his token is no good, and hands nothing out.
 //
 // Whoever is given an open file owns it, as all of this user's processes do, and may take the owner's own permission from it. It is given
 // back to the file that was looked at when the next one comes with a token: a mode is no wall between bearers.
@@ -20,10 +25,13 @@
 #include <sys/stat.h>
 #include <unistd.h>
 
+#include <array>
 #include <cerrno>
+#include <cstddef>
 #include <cstdio>
 #include <optional>
 #include <string>
+#include <utility>
 
 namespace docuvend::linux_platform {
 namespace {
@@ -52,6 +60,9 @@ struct OpenFile {
 // The name has come to mean another file meanwhile, as when somebody saves atomically.
 struct Exchanged {};
 
+// It would have to be waited for.
+struct WouldWait {};
+
 // Gives the owner's permission back to a file of this user's that lacks it. False when that is not why it cannot be opened.
 bool giveOwnersAccessBack(const PlacedFile& placed) {
   const auto examined = statusOf(placed.path.get());
@@ -65,10 +76,13 @@ UniqueDescriptor openObject(const PlacedFile& placed, int access) {
   return UniqueDescriptor(::open(descriptorPath(placed.path.get()).c_str(), access | kNeverWaiting));
 }
 
+using Opening = std::variant<OpenFile, QXError, Exchanged, WouldWait>;
+
 // Opens the object itself and makes sure that it is still a regular file with one link.
-std::variant<OpenFile, Exchanged, QXError> openPlaced(const PlacedFile& placed, int access) {
+Opening openPlaced(const PlacedFile& placed, int access, Lookup lookup) {
   UniqueDescriptor file = openObject(placed, access);
   if (!file && errno == EACCES) {
+    if (lookup == Lookup::inCacheAlone) return WouldWait{};
     // The refusal stands when there is nothing to give back.
     if (giveOwnersAccessBack(placed)) {
       file = openObject(placed, access);
@@ -91,7 +105,7 @@ std::variant<OpenFile, Exchanged, QXError> openPlaced(const PlacedFile& placed, 
 }
 
 // Makes the missing sibling, unless something has its name by now.
-std::variant<OpenFile, Exchanged, QXError> createSibling(const PlacedItem& sibling) {
+Opening createSibling(const PlacedItem& sibling) {
   UniqueDescriptor file(
       ::openat(sibling.directory.get(), sibling.name.c_str(), O_RDWR | O_CREAT | O_EXCL | O_NOFOLLOW | O_NOCTTY | O_CLOEXEC, kSiblingMode));
   if (!file) {
@@ -169,72 +183,89 @@ class BorrowedMode {
 
 QXError goneError() { return sandboxError(SandboxErrorCode::gone, "the file does not exist"); }
 
-}  // namespace
-
-std::variant<std::string, QXError> TokenRedeemer::pathOf(std::string_view token) const {
-  auto opened = session_.opened(token);
-  if (auto* good = std::get_if<SandboxToken>(&opened)) return std::move(good->path);
-  const bool takenBack = std::get<TokenRefusal>(opened) == TokenRefusal::takenBack;
+QXError badTokenError(TokenRefusal refusal) {
+  const bool takenBack = refusal == TokenRefusal::takenBack;
   return sandboxError(SandboxErrorCode::badToken, takenBack ? "the token was taken back" : "the token is not valid");
 }
 
-std::variant<PlacedItem, QXError> TokenRedeemer::placed(std::string_view token) const {
-  auto path = pathOf(token);
-  if (auto* error = std::get_if<QXError>(&path)) return std::move(*error);
-  auto place = containers_.place(std::get<std::string>(path));
-  if (const auto* refusal = std::get_if<PathRefusal>(&place)) return sandboxErrorFor(*refusal);
-  return std::move(std::get<PlacedItem>(place));
+std::string directoryOfPath(const std::string& path) { return path.substr(0, path.rfind('/') + 1); }
+
+// The item's file, or the sibling that is made for it.
+Opening openItem(const PlacedItem& item, TokenUse tokenUse, Lookup lookup) {
+  if (item.file) return openPlaced(*item.file, accessMode(tokenUse), lookup);
+  if (lookup == Lookup::inCacheAlone) return WouldWait{};
+  if (tokenUse != TokenUse::writing || !itemOfSiblingExists(item)) return goneError();
+  return createSibling(item);
 }
 
-std::variant<RedeemedFile, QXError> TokenRedeemer::redeem(std::string_view token, TokenUse tokenUse) const {
-  for (int attempt = 0; attempt < kTries; ++attempt) {
-    auto use = session_.beginUse();
-    auto place = placed(token);
-    if (auto* error = std::get_if<QXError>(&place)) return std::move(*error);
-    const auto& item = std::get<PlacedItem>(place);
-    if (item.file) {
-      auto opened = openPlaced(*item.file, accessMode(tokenUse));
-      if (auto* error = std::get_if<QXError>(&opened)) return std::move(*error);
-      if (std::holds_alternative<Exchanged>(opened)) continue;
-      auto& [file, identity] = std::get<OpenFile>(opened);
-      return RedeemedFile{std::move(file), identity, item.path, std::move(use)};
-    }
-    if (tokenUse != TokenUse::writing || !itemOfSiblingExists(item)) return goneError();
-    auto created = createSibling(item);
-    if (auto* error = std::get_if<QXError>(&created)) return std::move(*error);
-    if (auto* made = std::get_if<OpenFile>(&created)) {
-      return RedeemedFile{std::move(made->file), made->identity, item.path, std::move(use)};
-    }
+using Attempt = std::variant<RedeemedFile, QXError, Exchanged, WouldWait>;
+
+Attempt attempt(TokenSession& session, GroupContainers& containers, std::string_view text, TokenUse tokenUse, Lookup lookup) {
+  auto begun = session.use(text);
+  if (const auto* refusal = std::get_if<TokenRefusal>(&begun)) return badTokenError(*refusal);
+  auto& [token, use] = std::get<TokenInUse>(begun);
+  auto place = containers.place(token.path, lookup);
+  if (const auto* refusal = std::get_if<PathRefusal>(&place)) {
+    if (lookup == Lookup::inCacheAlone && *refusal == PathRefusal::unsteady) return WouldWait{};
+    return sandboxErrorFor(*refusal);
+  }
+  auto& item = std::get<PlacedItem>(place);
+  auto opened = openItem(item, tokenUse, lookup);
+  if (auto* error = std::get_if<QXError>(&opened)) return std::move(*error);
+  if (std::holds_alternative<Exchanged>(opened)) return Exchanged{};
+  if (std::holds_alternative<WouldWait>(opened)) return WouldWait{};
+  if (!session.isGood(token)) return badTokenError(TokenRefusal::takenBack);
+  auto& [file, identity] = std::get<OpenFile>(opened);
+  return RedeemedFile{std::move(file), identity, std::move(item.path), std::move(use)};
+}
+
+}  // namespace
+
+TokenRedeemer::Redeemed TokenRedeemer::redeem(std::string_view token, TokenUse tokenUse) const {
+  for (int tried = 0; tried < kTries; ++tried) {
+    auto result = attempt(session_, containers_, token, tokenUse, Lookup::complete);
+    if (auto* file = std::get_if<RedeemedFile>(&result)) return std::move(*file);
+    if (auto* error = std::get_if<QXError>(&result)) return std::move(*error);
   }
   return sandboxErrorFor(PathRefusal::unsteady);
 }
 
-bool TokenRedeemer::isFor(std::string_view token, const std::string& path) const {
-  const auto use = session_.beginUse();
-  const auto named = placed(token);
-  const auto* item = std::get_if<PlacedItem>(&named);
-  if (item == nullptr) return false;
-  const auto meant = containers_.place(path);
-  const auto* file = std::get_if<PlacedItem>(&meant);
-  return file != nullptr && file->path == item->path;
-}
-
-std::optional<QXError> TokenRedeemer::refusalOf(std::string_view token) const {
-  auto path = pathOf(token);
-  if (auto* error = std::get_if<QXError>(&path)) return std::move(*error);
+std::optional<TokenRedeemer::Redeemed> TokenRedeemer::redeemAtOnce(std::string_view token, TokenUse tokenUse) const {
+  auto result = attempt(session_, containers_, token, tokenUse, Lookup::inCacheAlone);
+  if (auto* file = std::get_if<RedeemedFile>(&result)) return std::move(*file);
+  if (auto* error = std::get_if<QXError>(&result)) return std::move(*error);
   return std::nullopt;
 }
 
-std::variant<ReplacedItem, QXError> TokenRedeemer::replaceItem(std::string_view itemToken, std::string_view siblingToken) const {
-  auto itemPlace = placed(itemToken);
-  if (auto* error = std::get_if<QXError>(&itemPlace)) return std::move(*error);
-  auto siblingPlace = placed(siblingToken);
-  if (auto* error = std::get_if<QXError>(&siblingPlace)) return std::move(*error);
-  auto& item = std::get<PlacedItem>(itemPlace);
-  const auto& sibling = std::get<PlacedItem>(siblingPlace);
+bool TokenRedeemer::isFor(std::string_view token, const std::string& path) const {
+  const auto begun = session_.use(token);
+  const auto* inUse = std::get_if<TokenInUse>(&begun);
+  if (inUse == nullptr) return false;
+  const auto named = containers_.place(inUse->token.path);
+  const auto meant = containers_.place(path);
+  const auto* item = std::get_if<PlacedItem>(&named);
+  const auto* file = std::get_if<PlacedItem>(&meant);
+  return item != nullptr && file != nullptr && file->path == item->path;
+}
 
-  const std::string directoryPath = item.path.substr(0, item.path.size() - item.name.size());
-  if (sibling.path != directoryPath + "." + item.name) {
+std::variant<std::string, QXError> TokenRedeemer::directoryOf(std::string_view token) const {
+  const auto opened = session_.opened(token);
+  if (const auto* refusal = std::get_if<TokenRefusal>(&opened)) return badTokenError(*refusal);
+  return directoryOfPath(std::get<SandboxToken>(opened).path);
+}
+
+std::variant<ReplacedItem, QXError> TokenRedeemer::replaceItem(std::string_view itemToken, std::string_view siblingToken) const {
+  std::array<PlacedItem, 2> places;
+  for (std::size_t i = 0; i < places.size(); ++i) {
+    const auto opened = session_.opened(i == 0 ? itemToken : siblingToken);
+    if (const auto* refusal = std::get_if<TokenRefusal>(&opened)) return badTokenError(*refusal);
+    auto place = containers_.place(std::get<SandboxToken>(opened).path);
+    if (const auto* refusal = std::get_if<PathRefusal>(&place)) return sandboxErrorFor(*refusal);
+    places[i] = std::move(std::get<PlacedItem>(place));
+  }
+  auto& [item, sibling] = places;
+
+  if (sibling.path != directoryOfPath(item.path) + "." + item.name) {
     return sandboxError(SandboxErrorCode::notSiblings, "the tokens do not name an item and its hidden sibling");
   }
   if (!item.file || !sibling.file) return goneError();
@@ -244,7 +275,7 @@ std::variant<ReplacedItem, QXError> TokenRedeemer::replaceItem(std::string_view 
   const auto& source = std::get<std::optional<PlacedFile>>(entry);
   if (!source || source->identity != sibling.file->identity) return goneError();
 
-  auto opened = openPlaced(*source, O_RDONLY);
+  auto opened = openPlaced(*source, O_RDONLY, Lookup::complete);
   if (auto* error = std::get_if<QXError>(&opened)) return std::move(*error);
   if (std::holds_alternative<Exchanged>(opened)) return goneError();
   const auto& file = std::get<OpenFile>(opened);
@@ -252,9 +283,10 @@ std::variant<ReplacedItem, QXError> TokenRedeemer::replaceItem(std::string_view 
   if (auto error = mode.take()) return *std::move(error);
   if (auto error = flush(file.file.get(), "the hidden sibling cannot be written")) return *std::move(error);
 
-  auto use = session_.beginUse();
-  for (const std::string_view token : {itemToken, siblingToken}) {
-    if (auto error = refusalOf(token)) return *std::move(error);
+  auto itemInUse = session_.use(itemToken);
+  const auto siblingInUse = session_.use(siblingToken);
+  for (const auto* begun : {&std::as_const(itemInUse), &siblingInUse}) {
+    if (const auto* refusal = std::get_if<TokenRefusal>(begun)) return badTokenError(*refusal);
   }
   if (auto error = mode.take()) return *std::move(error);
   if (::renameat(item.directory.get(), sibling.name.c_str(), item.directory.get(), item.name.c_str()) != 0) {
@@ -266,11 +298,11 @@ std::variant<ReplacedItem, QXError> TokenRedeemer::replaceItem(std::string_view 
   if (const auto* refusal = std::get_if<PathRefusal>(&after)) return sandboxErrorFor(*refusal);
   const auto& now = std::get<std::optional<PlacedFile>>(after);
   if (!now || now->identity != source->identity) return sandboxError(SandboxErrorCode::gone, "the item was exchanged meanwhile");
-  return ReplacedItem{source->identity, item.path, std::move(use), std::move(item.directory)};
+  return ReplacedItem{source->identity, item.path, std::move(std::get<TokenInUse>(itemInUse)), std::move(item.directory)};
 }
 
 std::optional<QXError> TokenRedeemer::forceToDisk(ReplacedItem replaced) {
-  { const auto over = std::move(replaced.use); }
+  { const auto over = std::move(replaced.inUse); }
   return flushDirectory(replaced.directory.get());
 }
 

@@ -1,6 +1,7 @@
 // Turns tokens into open files, and renames a hidden sibling over its item.
 //
-// Whoever brings a good token is served; who that is does not matter here. May be used from any thread; blocks for the disk only.
+// Whoever brings a good token is served; who that is does not matter here. May be used from any thread. `redeem` and `replaceItem` may wait
+// in the kernel for as long as somebody else writes the same file, or changes the same directory; all else does not.
 #pragma once
 
 #include <optional>
@@ -23,9 +24,9 @@ struct RedeemedFile {
 };
 
 struct ReplacedItem {
-  ObjectIdentity identity;  // what is the item now; its contents and mode are on disk
-  std::string path;         // of the item
-  UsesInFlight::Use use;
+  ObjectIdentity identity;     // what is the item now; its contents and mode are on disk
+  std::string path;            // of the item
+  TokenInUse inUse;            // the item's
   UniqueDescriptor directory;  // of the item; that it is the item is not on disk yet
 };
 
@@ -34,13 +35,16 @@ class TokenRedeemer {
   // Both outlive it.
   TokenRedeemer(TokenSession& session, GroupContainers& containers) : session_(session), containers_(containers) {}
 
-  [[nodiscard]] std::variant<RedeemedFile, QXError> redeem(std::string_view token, TokenUse tokenUse) const;
+  using Redeemed = std::variant<RedeemedFile, QXError>;
+  [[nodiscard]] Redeemed redeem(std::string_view token, TokenUse tokenUse) const;
+  // The same, unless something would have to be waited for: then none, and nothing is changed.
+  [[nodiscard]] std::optional<Redeemed> redeemAtOnce(std::string_view token, TokenUse tokenUse) const;
 
   // Whether the token is good now and names the file at that path, however the path is spelled. The file need not be there.
   [[nodiscard]] bool isFor(std::string_view token, const std::string& path) const;
 
-  // Why the token is not good now; none when it is. What it names is not looked at.
-  [[nodiscard]] std::optional<QXError> refusalOf(std::string_view token) const;
+  // The directory of what a token names that is good now, or why it is not. Neither is looked at.
+  [[nodiscard]] std::variant<std::string, QXError> directoryOf(std::string_view token) const;
 
   // The item's new file has the permission bits of the old one.
   [[nodiscard]] std::variant<ReplacedItem, QXError> replaceItem(std::string_view itemToken, std::string_view siblingToken) const;
@@ -49,9 +53,6 @@ class TokenRedeemer {
   [[nodiscard]] static std::optional<QXError> forceToDisk(ReplacedItem replaced);
 
  private:
-  [[nodiscard]] std::variant<std::string, QXError> pathOf(std::string_view token) const;
-  [[nodiscard]] std::variant<PlacedItem, QXError> placed(std::string_view token) const;
-
   TokenSession& session_;
   GroupContainers& containers_;
 };

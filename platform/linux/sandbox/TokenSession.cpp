@@ -1,5 +1,10 @@
-// A cut has three steps, and their order is what makes it one. The floors rise in memory: from then on no old token passes. Uses
-// that had passed before are waited for: whoever opens or renames after that has passed the new floors. At last the floors are written.
+// A cut has three steps. The floors rise in memory: from then on no old token passes. The floors are written: from then on none passes
+// after a restart either. Uses below the directories that had passed before are waited for: whoever opens or renames there after that has
+// passed the new floors. A use is known by the path that its token names, and begins before the floors are looked at.
+//
+// The kernel may hold a use up for as long as somebody writes a file, for a rename and a change of mode stand in line with the writers. So
+// the wait has an end, after which the cut says what it does not know to be over. Such a use finds its token taken back when it goes on,
+// and hands nothing out; what the kernel had begun to rename is renamed.
 //
 // The number of new tokens follows the file, not the memory: it is raised when the floors that belong to it are on disk. So the file's
 // number is never less than that of any token, and a cut that got lost with a crash or on a full disk leaves no token behind
@@ -54,14 +59,15 @@ std::variant<TokenFloors, QXError> loadFloors(const std::string& path, const Tok
 
 }  // namespace
 
-std::variant<std::unique_ptr<TokenSession>, QXError> TokenSession::load(const Paths& paths, QXLogHandle& log) {
+std::variant<std::unique_ptr<TokenSession>, QXError> TokenSession::load(const Paths& paths, QXLogHandle& log,
+                                                                        std::chrono::milliseconds longestWaitForUses) {
   auto key = TokenKey::load(paths.tokenKey);
   if (const auto* error = std::get_if<QXError>(&key)) {
     if (error->code != ENOENT) return *error;
   } else {
     auto floors = loadFloors(paths.tokenFloors, std::get<TokenKey>(key));
     if (auto* known = std::get_if<TokenFloors>(&floors)) {
-      return std::make_unique<TokenSession>(paths.tokenFloors, std::get<TokenKey>(key), std::move(*known));
+      return std::make_unique<TokenSession>(paths.tokenFloors, std::get<TokenKey>(key), std::move(*known), log, longestWaitForUses);
     }
     qxLog(log, "[NOTICE] No sandbox token issued until now is good any more: %@", std::get<QXError>(floors));
   }
@@ -69,11 +75,17 @@ std::variant<std::unique_ptr<TokenSession>, QXError> TokenSession::load(const Pa
   key = TokenKey::renew(paths.tokenKey);
   if (const auto* error = std::get_if<QXError>(&key)) return *error;
   if (auto error = saveFloors(paths.tokenFloors, TokenFloors(), std::get<TokenKey>(key))) return *std::move(error);
-  return std::make_unique<TokenSession>(paths.tokenFloors, std::get<TokenKey>(key), TokenFloors());
+  return std::make_unique<TokenSession>(paths.tokenFloors, std::get<TokenKey>(key), TokenFloors(), log, longestWaitForUses);
 }
 
-TokenSession::TokenSession(std::string floorsFile, const TokenKey& key, TokenFloors floors)
-    : floorsFile_(std::move(floorsFile)), key_(key), floors_(std::move(floors)), onDisk_(floors_) {}
+TokenSession::TokenSession(std::string floorsFile, const TokenKey& key, TokenFloors floors, QXLogHandle& log,
+                           std::chrono::milliseconds longestWaitForUses)
+    : floorsFile_(std::move(floorsFile)),
+      key_(key),
+      log_(log),
+      longestWaitForUses_(longestWaitForUses),
+      floors_(std::move(floors)),
+      onDisk_(floors_) {}
 
 // The number that a new token for the path may have: a good one that is on disk.
 std::optional<TokenNumber> TokenSession::issuableNumber(const std::string& path) {
@@ -100,10 +112,22 @@ std::optional<std::string> TokenSession::issue(const std::string& path) {
 std::variant<SandboxToken, TokenRefusal> TokenSession::opened(std::string_view text) const {
   auto read = SandboxToken::opened(text, key_);
   const auto* token = std::get_if<SandboxToken>(&read);
-  if (token == nullptr) return read;
-  const std::lock_guard lock(mutex_);
-  if (!floors_.isGood(token->path, token->number)) return TokenRefusal::takenBack;
+  if (token != nullptr && !isGood(*token)) return TokenRefusal::takenBack;
   return read;
+}
+
+std::variant<TokenInUse, TokenRefusal> TokenSession::use(std::string_view text) {
+  auto read = SandboxToken::opened(text, key_);
+  if (const auto* refusal = std::get_if<TokenRefusal>(&read)) return *refusal;
+  auto& token = std::get<SandboxToken>(read);
+  auto use = uses_.begin(token.path);
+  if (!isGood(token)) return TokenRefusal::takenBack;
+  return TokenInUse{std::move(token), std::move(use)};
+}
+
+bool TokenSession::isGood(const SandboxToken& token) const {
+  const std::lock_guard lock(mutex_);
+  return floors_.isGood(token.path, token.number);
 }
 
 std::optional<QXError> TokenSession::takeBack(const std::vector<std::string>& directories) {
@@ -111,8 +135,17 @@ std::optional<QXError> TokenSession::takeBack(const std::vector<std::string>& di
     const std::lock_guard lock(mutex_);
     for (const std::string& directory : directories) floors_.raise(directory);
   }
-  uses_.waitForEarlier();
-  return save();
+  auto error = save();
+  auto lateness = waitForUses(directories);
+  return error ? error : lateness;
+}
+
+std::optional<QXError> TokenSession::waitForUses(const std::vector<std::string>& directories) {
+  const auto late = uses_.waitForEarlier(directories, longestWaitForUses_);
+  if (late.empty()) return std::nullopt;
+  qxLog(log_, "[ERROR] Tokens were taken back, and what %d of them had begun before is still under way, the first of them for %@.",
+        late.size(), late.front());
+  return QXError::system(EBUSY, "the tokens were taken back, and what some of them had begun before is still under way");
 }
 
 bool TokenSession::hadOtherPlaces(std::string_view places) const {
@@ -126,7 +159,6 @@ std::optional<QXError> TokenSession::changePlaces(std::string_view places, const
     for (const std::string& directory : left) floors_.raise(directory);
     floors_.setPlaces(key_.authenticate(places));
   }
-  if (!left.empty()) uses_.waitForEarlier();
   return save();
 }
 
