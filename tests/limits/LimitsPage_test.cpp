@@ -30,6 +30,7 @@
 #include "platform/linux/sandbox/RedemptionLedger.h"
 #include "platform/linux/sandbox/SandboxToken.h"
 #include "platform/linux/sandbox/TokenFloors.h"
+#include "platform/linux/sandbox/TokenSession.h"
 #include "platform/linux/wire/Limits.h"
 
 namespace docuvend::linux_platform {
@@ -89,6 +90,7 @@ std::vector<Limit> limits() {
           {"kMaximumTokenPathLength", kMaximumTokenPathLength},
           {"SandboxToken::kMaximumTextLength", SandboxToken::kMaximumTextLength},
           {"TokenFloors::kMaximumDirectories", TokenFloors::kMaximumDirectories},
+          {"TokenSession::kLongestWaitForUses", static_cast<std::uint64_t>(TokenSession::kLongestWaitForUses.count())},
           {"RedemptionLedger::kMaximumObjectsPerInstance", RedemptionLedger::kMaximumObjectsPerInstance},
           {"RedemptionLedger::kMaximumInstances", RedemptionLedger::kMaximumInstances},
           {"kPropertyListMaximumBytes", kPropertyListMaximumBytes},
@@ -101,6 +103,7 @@ std::vector<Limit> limits() {
           {"kApplicationOpenFiles", kApplicationOpenFiles},
           {"kConfinedPendingSignals", kConfinedPendingSignals},
           {"DiskWork::kMostThreads", DiskWork::kMostThreads},
+          {"DiskWork::kMostThreadsOfDirectory", DiskWork::kMostThreadsOfDirectory},
           {"kExtensionProcesses", kExtensionProcesses},
           {"kExtensionOpenFiles", kExtensionOpenFiles},
           {"kExtensionMemory", kExtensionMemory.value_or(kMemoryWithoutSanitizer)},
