@@ -513,6 +513,45 @@ TEST_F(LinuxExtensionHostTest, AnEditedExtensionsProcessIsEndedWhenTheGraceIsOve
   EXPECT_TRUE(isOfKind(Conversation(extension).error(), ExtensionHostErrorCode::bundleIsGone));
 }
 
+TEST_F(LinuxExtensionHostTest, AnExtensionThatIsEditedWhileItsProcessStartsHasTheGraceAndNoMore) {
+  RealExtensions real(withGrace(milliseconds(500)));
+  const Bundle other = real.makeBundle("com.orvane.a");
+  const Bundle bundle = real.makeBundle("com.orvane.b");
+  real.install({other, bundle});
+  Reports reports;
+  const auto match = real.match(reports);
+  const auto set = reports.await(0);
+  ASSERT_TRUE(set && set->size() == 2);
+  std::promise<void> mayGoOn;
+  std::promise<void> isHeldUp;
+  // The first request's completion holds up the thread that starts processes.
+  set->front()->beginExtensionRequest([&mayGoOn, &isHeldUp](std::optional<QXUUID>, std::optional<QXError>) {
+    isHeldUp.set_value();
+    mayGoOn.get_future().wait();
+  });
+  isHeldUp.get_future().wait();
+  std::promise<Begun> begun;
+  set->back()->beginExtensionRequest([&begun](std::optional<QXUUID> request, std::optional<QXError> error) {
+    begun.set_value({request, std::move(error)});
+  });
+  real.install({other, edited(bundle)});
+  ASSERT_TRUE(reports.await(1));
+  mayGoOn.set_value();
+  // A machine that is too busy to start it within the grace does not start it at all.
+  const auto started = await(begun.get_future());
+  ASSERT_TRUE(started);
+  const auto context = started->request ? set->back()->extensionContextForRequest(*started->request) : nullptr;
+  if (context) {
+    std::promise<QXError> failed;
+    const QXRemote<_QXDocuvendVendor> vendor(
+        context->auxiliaryConnection()->remoteObjectProxy([&failed](const QXError& error) { failed.set_value(error); }));
+    vendor.call<&_QXDocuvendVendor::_startProvidingItemAtURL>(QXURL::fileURL("/wait", QXURLKind::file), [](std::optional<QXError>) {});
+    const auto error = await(failed.get_future());
+    EXPECT_TRUE(isOfKind(error, ExtensionHostErrorCode::bundleIsGone)) << (error ? error->description() : "");
+  }
+  EXPECT_TRUE(isOfKind(Conversation(set->back()).error(), ExtensionHostErrorCode::bundleIsGone));
+}
+
 TEST_F(LinuxExtensionHostTest, AnEditedExtensionThatIsRemovedHasNoMoreGrace) {
   RealExtensions real(withGrace(std::chrono::hours(1)));
   Reports reports;

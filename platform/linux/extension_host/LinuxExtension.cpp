@@ -234,16 +234,15 @@ void LinuxExtension::didStart(std::shared_ptr<ExtensionProcess> process) {
   bool isTooLate = false;
   {
     const std::lock_guard lock(mutex_);
-    const auto now = Clock::now();
-    lifetime_.started(now);
-    if (!lifetime_.isOver(now)) ready.swap(waiting_);
+    lifetime_.started(Clock::now());
+    ready.swap(waiting_);
     isTooLate = isStopped_;
     if (!isTooLate) process_ = process;
   }
   process->resume();
   if (isTooLate) process->endAtOnce();
   process->watchLiveness();
-  endWhenDue();
+  endWhenDue();  // retired meanwhile
   for (const Waiting& waiting : ready) waiting.completion(waiting.request, /*error=*/std::nullopt);
 }
 
