@@ -442,16 +442,16 @@ TEST_F(LinuxExtensionHostTest, ASlowMatchHandlerKeepsNoProcessWhoseBundleIsGone)
   const QXRpcInterface vendor = qxInterfaceOf<_QXDocuvendVendor>();
   std::promise<void> mayGoOn;
   const auto held = mayGoOn.get_future().share();
-  Reports reports;
+  const auto reports = std::make_shared<Reports>();  // the handler may still be at work when the test is over
   const Conversation conversation(extension);
   auto waiting = conversation.start("wait");
   ASSERT_NE(conversation.identifier("process"), "");
-  const auto slow = real.host().beginMatching({}, {host, vendor}, [&reports, held](Reports::Set set, const std::optional<QXError>&) {
+  const auto slow = real.host().beginMatching({}, {host, vendor}, [reports, held](Reports::Set set, const std::optional<QXError>&) {
     const bool isEmpty = set.empty();
-    reports.add(std::move(set));
+    reports->add(std::move(set));
     if (isEmpty) held.wait();
   });
-  ASSERT_TRUE(reports.await(0));
+  ASSERT_TRUE(reports->await(0));
   real.install({});
   const auto failed = await(std::move(waiting));
   mayGoOn.set_value();
