@@ -115,6 +115,27 @@ TEST_F(ConnectionLimiterTest, APeerWhoseRequestsStillRunFindsItsLaneAgain) {
   EXPECT_EQ(admit("one").lane, busy);
 }
 
+TEST_F(ConnectionLimiterTest, OnePeersConnectionsShareItsRoomForDescriptorsAndAnotherHasItsOwn) {
+  const auto first = admit("a");
+  const auto socket = std::make_shared<const UniqueDescriptor>();
+  const auto share = first.untaken->take(socket, kMaximumUntakenDescriptors);
+  EXPECT_TRUE(share);
+  EXPECT_FALSE(admit("a").untaken->take(socket, 1));
+  EXPECT_TRUE(admit("b").untaken->take(socket, 1));
+}
+
+TEST_F(ConnectionLimiterTest, APeerThatComesBackFindsTheDescriptorsThatItHasNotTaken) {
+  const auto socket = std::make_shared<const UniqueDescriptor>();
+  {
+    const auto gone = admit("a");
+    const auto share = gone.untaken->take(socket, kMaximumUntakenDescriptors);
+    share->setSent();
+  }
+  fill("b");
+  places.clear();  // whose end it is does not matter
+  EXPECT_FALSE(admit("a").untaken->take(socket, 1));
+}
+
 TEST_F(ConnectionLimiterTest, APeerThatLeftNothingBehindIsForgotten) {
   std::weak_ptr<CallBudget> budget;
   {

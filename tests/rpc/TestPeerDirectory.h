@@ -23,6 +23,11 @@ class TestPeerDirectory final : public linux_platform::PeerDirectory {
     bundleIdentifier_ = std::move(bundleIdentifier);
     entitlements_ = std::move(entitlements);
   }
+  // Whether there are descriptors to look at who connects with.
+  void setCanLook(bool canLook) {
+    const std::lock_guard lock(mutex_);
+    canLook_ = canLook;
+  }
   // May be declared by unconfined peers.
   void install(const std::string& bundleIdentifier, QXDictionary entitlements) {
     const std::lock_guard lock(mutex_);
@@ -31,6 +36,7 @@ class TestPeerDirectory final : public linux_platform::PeerDirectory {
 
   std::shared_ptr<const linux_platform::PeerIdentity> identify(int) override {
     const std::lock_guard lock(mutex_);
+    if (!canLook_) return nullptr;
     auto identity = std::make_shared<linux_platform::PeerIdentity>();
     identity->pid = ::getpid();
     identity->uid = ::geteuid();
@@ -80,6 +86,7 @@ class TestPeerDirectory final : public linux_platform::PeerDirectory {
   std::map<std::string, QXDictionary> installed_;
   std::set<std::string> replaced_;
   std::uint8_t connections_ = 0;
+  bool canLook_ = true;
 };
 
 }  // namespace docuvend::tests

@@ -89,6 +89,7 @@ class EndpointTest : public testing::Test {
     std::shared_ptr<Endpoint> endpoint;
     std::shared_ptr<Mailbox<QXError>> closed = std::make_shared<Mailbox<QXError>>();
     std::shared_ptr<Mailbox<QXError>> blamed = std::make_shared<Mailbox<QXError>>();
+    std::shared_ptr<Mailbox<bool>> unpassed = std::make_shared<Mailbox<bool>>();
     std::shared_ptr<Mailbox<Hello>> hellos = std::make_shared<Mailbox<Hello>>();
   };
 
@@ -101,6 +102,7 @@ class EndpointTest : public testing::Test {
     };
     handlers.onClose = [closed = side.closed](const QXError& reason) { closed->put(reason); };
     handlers.onMisbehaviour = [blamed = side.blamed](const QXError& reason) { blamed->put(reason); };
+    handlers.onDescriptorsRefused = [unpassed = side.unpassed] { unpassed->put(true); };
     side.endpoint = Endpoint::create(*reactor, std::move(socket), std::move(hello), std::move(handlers), std::move(rules));
     return side;
   }

@@ -106,7 +106,7 @@ TEST_F(FrameReaderTest, ADescriptorBesideABegunFrameMustBeOneThatItDeclares) {
   EXPECT_EQ(std::get<Malformed>(next).reason, "descriptors that no frame declares");
 }
 
-TEST(FrameWriterTest, WhatIsNotTakenIsKeptWithItsTagUntilItIs) {
+TEST(FrameWriterTest, WhatIsNotTakenIsKeptWithItsNumberUntilItIs) {
   auto [one, two] = tests::socketPair();
   const RawPeer peer(std::move(two));
   const auto block = [](std::uint64_t number) {
@@ -114,7 +114,7 @@ TEST(FrameWriterTest, WhatIsNotTakenIsKeptWithItsTagUntilItIs) {
         encodeFrame(RequestFrame{number, false, "data:", {QXValue(QXData{std::vector<std::uint8_t>(kMaximumFrameBytes / 2)})}}));
   };
   FrameWriter writer;
-  for (std::uint64_t i = 1; i <= 4; ++i) writer.add(block(i), i);
+  for (std::uint64_t i = 1; i <= 4; ++i) writer.add(block(i), {.request = i});
   EXPECT_EQ(writer.unwritten(), (std::vector<std::uint64_t>{1, 2, 3, 4}));
   EXPECT_EQ(writer.write(one.get()), FrameWriter::Progress::blocked);
   EXPECT_GT(writer.pendingBytes(), 0U);
@@ -128,12 +128,12 @@ TEST(FrameWriterTest, WhatIsNotTakenIsKeptWithItsTagUntilItIs) {
   EXPECT_TRUE(writer.unwritten().empty());
 }
 
-TEST(FrameWriterTest, ASocketWhosePeerHasLeftIsBrokenWithoutASignal) {
+TEST(FrameWriterTest, ASocketWhosePeerHasLeftIsOverWithoutASignal) {
   auto [one, two] = tests::socketPair();
   two.reset();
   FrameWriter writer;
   writer.add(std::get<EncodedFrame>(encodeFrame(ReplyFrame{1, {}})));
-  EXPECT_EQ(writer.write(one.get()), FrameWriter::Progress::broken);
+  EXPECT_EQ(writer.write(one.get()), FrameWriter::Progress::over);
 }
 
 }  // namespace

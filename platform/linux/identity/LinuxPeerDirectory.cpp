@@ -5,6 +5,7 @@
 #include <unistd.h>
 
 #include <algorithm>
+#include <cerrno>
 #include <cstring>
 #include <fstream>
 #include <utility>
@@ -51,7 +52,7 @@ LinuxPeerDirectory::LinuxPeerDirectory(BundleRegistry& bundles, QXLogHandle& log
 
 std::shared_ptr<const PeerIdentity> LinuxPeerDirectory::identify(int socket) {
   auto identity = std::make_shared<PeerIdentity>();
-  readPeer(socket, *identity);
+  if (readPeer(socket, *identity) == Look::wantsDescriptors) return nullptr;
   if (identity->standing == Standing::nobody) return identity;
   const std::lock_guard lock(mutex_);
   syncPrune();
@@ -61,7 +62,7 @@ std::shared_ptr<const PeerIdentity> LinuxPeerDirectory::identify(int socket) {
   return identity;
 }
 
-void LinuxPeerDirectory::readPeer(int socket, PeerIdentity& identity) {
+LinuxPeerDirectory::Look LinuxPeerDirectory::readPeer(int socket, PeerIdentity& identity) {
   ucred credentials{};
   socklen_t size = sizeof(credentials);
   if (::getsockopt(socket, SOL_SOCKET, SO_PEERCRED, &credentials, &size) != 0) return becomeNobody(identity, "it has no credentials");
@@ -70,10 +71,12 @@ void LinuxPeerDirectory::readPeer(int socket, PeerIdentity& identity) {
   if (credentials.pid <= 0) return becomeNobody(identity, "its process number is not known here");
   if (credentials.uid != ::geteuid()) return becomeNobody(identity, "it belongs to another user");
   identity.pidfd = openPeer(socket, credentials.pid, facilities_);
-  if (!identity.pidfd) return becomeNobody(identity, "it has ended");
+  if (!identity.pidfd) return isWantOfDescriptors(errno) ? Look::wantsDescriptors : becomeNobody(identity, "it has ended");
 
   auto reading = readProcess(credentials.pid, identity.pidfd, facilities_);
-  if (const auto* unread = std::get_if<Unread>(&reading)) return becomeNobody(identity, unread->reason);
+  if (const auto* unread = std::get_if<Unread>(&reading)) {
+    return unread->isForWantOfDescriptors ? Look::wantsDescriptors : becomeNobody(identity, unread->reason);
+  }
   auto& [standing, description, serial] = std::get<ProcessReading>(reading);
   if (description) {
     auto bundle = bundles_.find(description->bundleIdentifier);
@@ -89,6 +92,7 @@ void LinuxPeerDirectory::readPeer(int socket, PeerIdentity& identity) {
   }
   identity.standing = standing;
   identity.token = makeToken(identity.pid, identity.uid, serial);
+  return Look::done;
 }
 
 // At the usual level, for whoever wonders why a program that was at work is refused; the bundle's share of the log is what it costs.
@@ -104,9 +108,10 @@ bool LinuxPeerDirectory::isCurrent(const PeerIdentity& peer) {
   return bundle && bundle->incarnation == peer.incarnation;
 }
 
-void LinuxPeerDirectory::becomeNobody(PeerIdentity& identity, const std::string& reason) {
+LinuxPeerDirectory::Look LinuxPeerDirectory::becomeNobody(PeerIdentity& identity, const std::string& reason) {
   identity.standing = Standing::nobody;
   qxLog(log_, "[DEBUG] PID %d is nobody: %@.", identity.pid, reason);
+  return Look::done;
 }
 
 std::shared_ptr<const PeerIdentity> LinuxPeerDirectory::declare(const PeerIdentity& peer, const std::string& bundleIdentifier) {

@@ -32,9 +32,10 @@ class LinuxPeerDirectory final : public PeerDirectory {
 
  private:
   [[nodiscard]] QXAuditToken makeToken(pid_t pid, uid_t uid, std::uint64_t serial) const;
-  void readPeer(int socket, PeerIdentity& identity);
+  enum class Look { done, wantsDescriptors };
+  [[nodiscard]] Look readPeer(int socket, PeerIdentity& identity);
   void tellOfOutdated(const PeerIdentity& identity, const std::string& bundleIdentifier) const;
-  void becomeNobody(PeerIdentity& identity, const std::string& reason);
+  Look becomeNobody(PeerIdentity& identity, const std::string& reason);
   void syncPrune();
 
   // Constant after construction.

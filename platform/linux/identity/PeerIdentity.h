@@ -45,7 +45,8 @@ class PeerDirectory {
   PeerDirectory& operator=(const PeerDirectory&) = delete;
   virtual ~PeerDirectory() = default;
 
-  // Reads the peer of a connected socket. Never null; a peer that cannot be read is nobody.
+  // Reads the peer of a connected socket. A peer that cannot be read is nobody; null when it is this process that has no descriptors left
+  // to look with: nothing is known of the peer then.
   [[nodiscard]] virtual std::shared_ptr<const PeerIdentity> identify(int socket) = 0;
   // An unconfined peer says which installed bundle it acts for, once per process; logged. The new identity, or null when the peer is not
   // unconfined, the bundle is not installed, or the process has declared another bundle on a connection that is still open.

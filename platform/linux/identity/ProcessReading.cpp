@@ -29,7 +29,10 @@ namespace {
 constexpr std::size_t kLongestProcessStatus = 4096;
 constexpr int kStartTimeField = 22;  // counted from 1; the process's name, in parentheses, is the second
 
-Unread unread(const std::string& what) { return {what + ": " + std::system_category().message(errno)}; }
+Unread unread(const std::string& what) {
+  const int errnoValue = errno;
+  return {what + ": " + std::system_category().message(errnoValue), isWantOfDescriptors(errnoValue)};
+}
 
 std::string processPath(pid_t pid, std::string_view entry) { return "/proc/" + std::to_string(pid) + "/" + std::string(entry); }
 

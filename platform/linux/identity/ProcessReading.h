@@ -3,6 +3,7 @@
 
 #include <sys/types.h>
 
+#include <cerrno>
 #include <cstdint>
 #include <optional>
 #include <string>
@@ -28,7 +29,10 @@ struct ProcessReading {
 // Why a process is nobody, in words.
 struct Unread {
   std::string reason;
+  bool isForWantOfDescriptors = false;  // of this process or of the machine: it says nothing of the process that was looked at
 };
+// Whether errno's value says that.
+[[nodiscard]] inline bool isWantOfDescriptors(int errnoValue) { return errnoValue == EMFILE || errnoValue == ENFILE; }
 
 // `pidfd` holds the process; everything read by its number counts only if the process is still alive when all has been read.
 [[nodiscard]] std::variant<ProcessReading, Unread> readProcess(pid_t pid, const UniqueDescriptor& pidfd,

@@ -1,6 +1,6 @@
 // How many connections one peer may hold open, and how many requests, of how many bytes, it may have without an answer over all of them
-// together. Limits of the second kind keep a peer from using up what the daemon may ask of a provider: they are well below that. May be
-// used from any thread.
+// together. Limits of the second kind keep a peer from using up what the daemon may ask of a provider: they are well below that.
+// Descriptors that a peer is sent are counted over all its connections in the same way. May be used from any thread.
 #pragma once
 
 #include <cstddef>
@@ -11,6 +11,7 @@
 
 #include "platform/linux/wire/CallBudget.h"
 #include "platform/linux/wire/Reactor.h"
+#include "platform/linux/wire/UntakenDescriptors.h"
 
 namespace docuvend::linux_platform {
 
@@ -24,6 +25,8 @@ inline constexpr std::size_t kMaximumUnconfinedCallBytes = std::size_t{4} << 20U
 // So are all that have no identity. Anybody may become one of these, and all that they may do is wake the daemon.
 inline constexpr std::size_t kMaximumConnectionsOfNobody = 16;
 inline constexpr std::size_t kMaximumCallsOfNobody = 16;
+// Of a peer that is not trusted: sent over any of its connections, ended ones too, and not taken.
+inline constexpr std::size_t kMaximumUntakenDescriptors = 128;
 
 class ConnectionLimiter : public std::enable_shared_from_this<ConnectionLimiter> {
  public:
@@ -50,8 +53,9 @@ class ConnectionLimiter : public std::enable_shared_from_this<ConnectionLimiter>
     Verdict verdict;
     // When admitted.
     std::unique_ptr<Place> place;
-    std::shared_ptr<CallBudget> budget;   // the peer's
-    std::shared_ptr<Reactor::Lane> lane;  // the peer's
+    std::shared_ptr<CallBudget> budget;           // the peer's
+    std::shared_ptr<Reactor::Lane> lane;          // the peer's
+    std::shared_ptr<UntakenDescriptors> untaken;  // the peer's
   };
   struct Limits {
     std::size_t connections;
@@ -67,10 +71,13 @@ class ConnectionLimiter : public std::enable_shared_from_this<ConnectionLimiter>
   struct Count {
     std::shared_ptr<CallBudget> budget;
     std::shared_ptr<Reactor::Lane> lane;
+    std::shared_ptr<UntakenDescriptors> untaken;
     std::size_t open = 0;
     bool refusing = false;
 
-    [[nodiscard]] bool isForgettable() const { return open == 0 && budget.use_count() == 1 && lane.use_count() == 1; }
+    [[nodiscard]] bool isForgettable() const {
+      return open == 0 && budget.use_count() == 1 && lane.use_count() == 1 && untaken.use_count() == 1 && untaken->isEmpty();
+    }
   };
   void giveBack(const std::string& peer);
 

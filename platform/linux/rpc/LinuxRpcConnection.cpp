@@ -10,11 +10,15 @@ namespace {
 
 Endpoint::Handlers handlersFor(QXLogHandle& log, int loggedProcess, LogSubject::Name subject, LinuxRpcConnection::EndHandler onEnd) {
   Endpoint::Handlers handlers;
-  handlers.onMisbehaviour = [&log, loggedProcess, name = std::move(subject)](const QXError& reason) {
+  handlers.onMisbehaviour = [&log, loggedProcess, name = subject](const QXError& reason) {
     const LogSubject subject(name);
     const auto text = reason.texts.find("description");
     qxLog(log, "[NOTICE] Closing the connection of PID %d: %@", loggedProcess,
           text == reason.texts.end() ? reason.description() : text->second);
+  };
+  handlers.onDescriptorsRefused = [&log, loggedProcess, name = std::move(subject)] {
+    const LogSubject subject(name);
+    qxLog(log, "[ERROR] PID %d was not given an open file: too many of this user's lie unread in sockets.", loggedProcess);
   };
   handlers.onClose = std::move(onEnd);
   return handlers;

@@ -95,7 +95,6 @@ void LinuxRpcListener::acceptWaiting() {
 bool LinuxRpcListener::acceptOne() {
   UniqueDescriptor socket(::accept4(socket_, nullptr, nullptr, SOCK_CLOEXEC));
   if (socket) {
-    isStarved_ = false;
     admit(std::move(socket));
     return true;
   }
@@ -117,17 +116,26 @@ bool LinuxRpcListener::acceptOne() {
 // Without a descriptor for it the client would stay first in line for ever and keep a thread busy: it gets the spare one, and is dropped.
 // Where even that is of no use, this thread waits a little, so that others may release something.
 void LinuxRpcListener::acceptAndDrop(int errnoValue) {
-  if (!std::exchange(isStarved_, true)) {
-    qxLog(surroundings_.log, "[NOTICE] Refusing connections: %@", QXError::system(errnoValue, "cannot accept").texts.at("description"));
-  }
+  tellOfStarvation(QXError::system(errnoValue, "cannot accept"));
   spare_.reset();
   const bool dropped = static_cast<bool>(UniqueDescriptor(::accept4(socket_, nullptr, nullptr, SOCK_CLOEXEC)));
   spare_ = spareDescriptor();
   if (!dropped) std::this_thread::sleep_for(kPauseWithoutDescriptors);
 }
 
+void LinuxRpcListener::tellOfStarvation(const QXError& error) {
+  if (std::exchange(isStarved_, true)) return;
+  qxLog(surroundings_.log, "[NOTICE] Refusing connections: %@", error.texts.at("description"));
+}
+
 void LinuxRpcListener::admit(UniqueDescriptor socket) {
   auto peer = surroundings_.peers.identify(socket.get());
+  if (!peer) {
+    tellOfStarvation(QXError::system(EMFILE, "cannot look at who connects"));
+    refuse(std::move(socket), qxRpcError(QXRpcErrorCode::tooManyCalls, "no descriptors are left to see who connects with"));
+    return;
+  }
+  isStarved_ = false;
   const LogSubject subject(logSubjectFor(*peer));
   if (!isFor(*peer)) {
     refuseOutsider(*peer, std::move(socket));
@@ -142,7 +150,7 @@ void LinuxRpcListener::admit(UniqueDescriptor socket) {
       qxLog(surroundings_.log, "[NOTICE] Refusing a connection of PID %d: %@ may not open more than %d.", process, counted,
             limits.connections);
     }
-    refuse(std::move(socket), "too many connections");
+    refuse(std::move(socket), refusal("too many connections"));
     return;
   }
   CallRules rules = rulesFor(*peer, admission);
@@ -184,9 +192,12 @@ bool LinuxRpcListener::isFor(const PeerIdentity& peer) const {
 }
 
 CallRules LinuxRpcListener::rulesFor(const PeerIdentity& peer, ConnectionLimiter::Admission& admission) const {
-  CallRules rules{std::move(admission.budget), /*operations=*/{}, service_.releasing, LogSubject::current(), /*lane=*/{}};
+  CallRules rules{std::move(admission.budget), /*operations=*/{}, service_.releasing, LogSubject::current(), /*lane=*/{}, /*untaken=*/{}};
   if (peer.standing == Standing::nobody) rules.operations = service_.operationsForNobody;
-  if (peer.standing != Standing::unconfined) rules.lane = std::move(admission.lane);
+  if (peer.standing != Standing::unconfined) {
+    rules.lane = std::move(admission.lane);
+    rules.untaken = std::move(admission.untaken);
+  }
   return rules;
 }
 
@@ -195,11 +206,11 @@ void LinuxRpcListener::refuseOutsider(const PeerIdentity& peer, UniqueDescriptor
   if (outsiders_.isDue(counted, std::chrono::steady_clock::now())) {
     qxLog(surroundings_.log, "[NOTICE] Refusing a connection of PID %d: %@ is not for %@.", peer.pid, service_.name, counted);
   }
-  refuse(std::move(socket), service_.name + " is for unconfined processes alone");
+  refuse(std::move(socket), refusal(service_.name + " is for unconfined processes alone"));
 }
 
-void LinuxRpcListener::refuse(UniqueDescriptor socket, std::string reason) const {
-  Endpoint::create(surroundings_.reactor, std::move(socket), Hello{}, {})->close(refusal(std::move(reason)));
+void LinuxRpcListener::refuse(UniqueDescriptor socket, const QXError& reason) const {
+  Endpoint::create(surroundings_.reactor, std::move(socket), Hello{}, {})->close(reason);
 }
 
 void LinuxRpcListener::offer(const std::shared_ptr<LinuxRpcConnection>& connection) {

@@ -64,11 +64,12 @@ class LinuxRpcListener final : public QXRpcListener, public std::enable_shared_f
   void acceptWaiting();
   [[nodiscard]] bool acceptOne();
   void acceptAndDrop(int errnoValue);
+  void tellOfStarvation(const QXError& error);
   void admit(UniqueDescriptor socket);
   [[nodiscard]] bool isFor(const PeerIdentity& peer) const;
   [[nodiscard]] CallRules rulesFor(const PeerIdentity& peer, ConnectionLimiter::Admission& admission) const;
   void refuseOutsider(const PeerIdentity& peer, UniqueDescriptor socket);
-  void refuse(UniqueDescriptor socket, std::string reason) const;
+  void refuse(UniqueDescriptor socket, const QXError& reason) const;
   void end(LinuxRpcConnection& connection, const PeerIdentity& peer) const;
   void offer(const std::shared_ptr<LinuxRpcConnection>& connection);
   void forget(std::uint64_t number);
@@ -82,7 +83,7 @@ class LinuxRpcListener final : public QXRpcListener, public std::enable_shared_f
 
   // Only in the listening socket's handler.
   UniqueDescriptor spare_;
-  bool isStarved_ = false;  // logged once until a client is accepted again
+  bool isStarved_ = false;  // logged once until a client is recognised again
   RefusalLines outsiders_;
   std::uint64_t nextNumber_ = 0;
 

@@ -9,6 +9,7 @@
 #include "platform/linux/base/LogSubject.h"
 #include "platform/linux/wire/CallBudget.h"
 #include "platform/linux/wire/Reactor.h"
+#include "platform/linux/wire/UntakenDescriptors.h"
 
 namespace docuvend::linux_platform {
 
@@ -24,6 +25,8 @@ struct CallRules {
   // Of a peer that is not trusted, shared by its connections: one of them is served at a time, and only as long as it takes its answers.
   // Empty for others.
   std::shared_ptr<Reactor::Lane> lane;
+  // Where the descriptors that such a peer is sent are counted, shared in the same way. May be empty: they are not.
+  std::shared_ptr<UntakenDescriptors> untaken = {};
 };
 
 }  // namespace docuvend::linux_platform

@@ -31,6 +31,9 @@ class Endpoint : public std::enable_shared_from_this<Endpoint> {
     // This end closes the connection for what the peer did: bytes that are no frame, a version that is not spoken here, not reading. Before
     // onClose. May be empty.
     std::function<void(const QXError&)> onMisbehaviour;
+    // An answer with descriptors could not be sent, as too many of this user's lie in sockets unread: the peer is told that its request
+    // failed, and the connection goes on. On a thread of the reactor. May be empty.
+    std::function<void()> onDescriptorsRefused;
     // The connection is over, once, after the messages that waited have failed: why, or an error of ECONNRESET kind when the peer left.
     // Also called after `close` and when the endpoint is released; on a thread of the reactor. May be empty.
     std::function<void(const QXError&)> onClose;

@@ -14,7 +14,9 @@
 //
 // Reading belongs to the one thread on which the reactor runs the socket's handler: it takes what is there, and runs every whole frame
 // before the socket is armed again. When that takes long, others have their turn in between; when answers pile up at a peer that is not
-// trusted, its frames wait until it has taken them. (Never at one that is: two ends that wait so for each other would wait for ever.)
+// trusted, or files that it was given, its frames wait until it has taken them. (Never at one that is: two ends that wait so for each other
+// would wait for ever.) For files that lie in the socket there is no event; but with the narrowest of buffers it becomes writable when no
+// more than one or two are left.
 //
 // Writing belongs to whoever holds the mutex: frames are numbered, put in line and offered to the socket
 // under it, so that numbers rise on the wire; what the socket does not take waits for its readiness. A peer that lets more than the
@@ -26,7 +28,8 @@
 //
 // The end comes once. Whoever brings it about takes everything out under the mutex: waiting calls, exported object, registration,
 // socket. A reading thread that is still at work has its own hold on the socket, so the descriptor's number is not reused under it. A
-// socket that cannot be written any more is not the end yet: what the peer said last, perhaps why it left, is still to be read.
+// socket that cannot be written any more is not the end yet: what the peer has said by then, perhaps why it left, is still to be read.
+// Nothing is kept for it any more, and it says nothing further: who takes no answers is not served on.
 
 namespace docuvend::linux_platform {
 
@@ -95,7 +98,7 @@ void Endpoint::State::send(const QXRpcOperation& operation, QXArray arguments, Q
       } else if (!hasRoomFor(std::get<EncodedFrame>(encoded))) {
         problem = qxRpcError(QXRpcErrorCode::tooManyCalls, "the peer has not taken yet what was sent to it before");
       } else {
-        writer_.add(std::get<EncodedFrame>(std::move(encoded)), outgoing_.nextID());
+        writer_.add(std::get<EncodedFrame>(std::move(encoded)), {.request = outgoing_.nextID()});
         outgoing_.add({operation.replies, std::move(reply), failureHandler}, forgotten);
         delivery = write();
       }
@@ -105,19 +108,34 @@ void Endpoint::State::send(const QXRpcOperation& operation, QXArray arguments, Q
   closeUnlessUnderway(delivery);
 }
 
-void Endpoint::State::sendReply(ReplyFrame reply) {
+std::unique_ptr<UntakenDescriptors::Share> Endpoint::State::reserve(std::size_t descriptors) {
+  const auto socket = openSocket();
+  return socket ? untaken_->take(socket, descriptors) : nullptr;
+}
+
+void Endpoint::State::release(std::unique_ptr<UntakenDescriptors::Share> room) {
+  room.reset();
+  const std::lock_guard lock(mutex_);
+  syncGoOn();
+}
+
+void Endpoint::State::sendReply(ReplyFrame reply, std::unique_ptr<UntakenDescriptors::Share> room) {
   const std::uint64_t callID = reply.callID;
   auto encoded = encodeFrame(std::move(reply));
   if (const auto* malformed = std::get_if<Malformed>(&encoded)) {
+    if (room) release(std::move(room));
     sendFailure({callID, qxRpcError(QXRpcErrorCode::invalidReply, malformed->reason)});
     return;
   }
+  auto& frame = std::get<EncodedFrame>(encoded);
+  if (frame.descriptors.empty()) room.reset();
   Delivery delivery = Delivery::underway;
   {
     const std::lock_guard lock(mutex_);
     if (closed_) return;
-    writer_.add(std::get<EncodedFrame>(std::move(encoded)));
+    writer_.add(std::move(frame), {.answerTo = callID}, std::move(room));
     delivery = write();
+    syncGoOn();
   }
   closeUnlessUnderway(delivery);
 }
@@ -143,13 +161,28 @@ void Endpoint::State::write(const Frame& frame) {
 }
 
 Endpoint::State::Delivery Endpoint::State::write() {
-  if (!writingIsOver_) {
-    const auto progress = writer_.write(socket_->get());
-    writingIsOver_ = progress == FrameWriter::Progress::broken;
-    if (progress == FrameWriter::Progress::refused) return Delivery::refused;
-    if (progress == FrameWriter::Progress::blocked && registration_) registration_->rearm(kWritable);
+  const bool wasOver = writer_.isOver();
+  auto progress = writer_.write(socket_->get());
+  while (progress == FrameWriter::Progress::refused) {
+    if (!syncReplaceRefused()) return Delivery::refused;
+    progress = writer_.write(socket_->get());
   }
+  if (progress == FrameWriter::Progress::blocked && registration_) registration_->rearm(kWritable);
+  if (progress == FrameWriter::Progress::over && !wasOver) ::shutdown(socket_->get(), SHUT_RD);
   return writer_.pendingBytes() > kMaximumOutputBytes ? Delivery::overBound : Delivery::underway;
+}
+
+bool Endpoint::State::syncReplaceRefused() {
+  const std::uint64_t callID = writer_.dropRefused().answerTo;
+  if (callID == 0) return false;
+  syncAddFailure(callID, qxRpcError(QXRpcErrorCode::tooManyCalls, "the system passes no more open files on for now"));
+  if (handlers_.onDescriptorsRefused) post_(handlers_.onDescriptorsRefused);
+  return true;
+}
+
+void Endpoint::State::syncAddFailure(std::uint64_t callID, QXError error) {
+  auto encoded = encodeFrame(FailureFrame{callID, std::move(error)});
+  if (auto* frame = std::get_if<EncodedFrame>(&encoded)) writer_.add(std::move(*frame));
 }
 
 bool Endpoint::State::isTakingAnswers() {
@@ -157,9 +190,17 @@ bool Endpoint::State::isTakingAnswers() {
   return !closed_ && syncIsTakingAnswers();
 }
 
-// A peer that cannot be written to any more has nothing to take.
 bool Endpoint::State::syncIsTakingAnswers() const {
-  return !lane_ || writingIsOver_ || writer_.pendingBytes() <= kMaximumOutputBeforeFrame;
+  return !lane_ || (writer_.pendingBytes() <= kMaximumOutputBeforeFrame && syncRoom() == UntakenDescriptors::Room::free);
+}
+
+// One that cannot be written to any more has nothing to take.
+UntakenDescriptors::Room Endpoint::State::syncRoom() const {
+  return untaken_ && !writer_.isOver() ? untaken_->roomOf(socket_) : UntakenDescriptors::Room::free;
+}
+
+void Endpoint::State::syncGoOn() {
+  if (isHeldUp_ && registration_) registration_->rearm(kWritable);
 }
 
 bool Endpoint::State::hasRoomFor(const EncodedFrame& request) const {
@@ -195,7 +236,7 @@ void Endpoint::State::close(const QXError& reason, Farewell farewell, Cause caus
     if (cause == Cause::neverTaken) {
       for (auto& lost : failed) lost.fate = MessageFate::unsent;
     }
-    if (farewell == Farewell::tellPeer && !writingIsOver_) {
+    if (farewell == Farewell::tellPeer && !writer_.isOver()) {
       auto encoded = encodeFrame(EndFrame{reason});
       if (auto* bytes = std::get_if<EncodedFrame>(&encoded)) {
         writer_.add(std::move(*bytes));
@@ -207,7 +248,8 @@ void Endpoint::State::close(const QXError& reason, Farewell farewell, Cause caus
     socket.swap(socket_);
     ::shutdown(socket->get(), SHUT_RDWR);
   }
-  registration.reset();  // while the socket is still held: its number must not be another's
+  if (untaken_) static_cast<void>(untaken_->isEmpty());  // looks, and lets go of what need not be kept
+  registration.reset();                                  // while the socket is still held: its number must not be another's
   incoming.release();
   unheardPong = nullptr;
   post_([failed = std::move(failed), blame = cause == Cause::misbehaviour ? handlers_.onMisbehaviour : nullptr, onClose = handlers_.onClose,

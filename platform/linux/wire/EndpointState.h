@@ -14,6 +14,7 @@
 #include "platform/linux/wire/FrameReader.h"
 #include "platform/linux/wire/FrameWriter.h"
 #include "platform/linux/wire/IncomingCalls.h"
+#include "platform/linux/wire/SendBuffer.h"
 
 namespace docuvend::linux_platform {
 
@@ -32,12 +33,15 @@ class Endpoint::State final : public AnswerSink, public std::enable_shared_from_
         post_(reactor.poster()),
         handlers_(std::move(handlers)),
         lane_(std::move(rules.lane)),
+        untaken_(std::move(rules.untaken)),
         socket_(std::make_shared<const UniqueDescriptor>(std::move(socket))) {}
 
   void sendHello(Hello hello);
   void resume();
   void send(const QXRpcOperation& operation, QXArray arguments, QXRpcReply reply, std::shared_ptr<const FailureHandler> failureHandler);
-  void sendReply(ReplyFrame reply) override;
+  std::unique_ptr<UntakenDescriptors::Share> reserve(std::size_t descriptors) override;
+  void release(std::unique_ptr<UntakenDescriptors::Share> room) override;
+  void sendReply(ReplyFrame reply, std::unique_ptr<UntakenDescriptors::Share> room) override;
   void sendFailure(FailureFrame failure) override;
   void ping(std::function<void()> onPong);
   [[nodiscard]] bool awaitsAnswers();
@@ -73,7 +77,13 @@ class Endpoint::State final : public AnswerSink, public std::enable_shared_from_
 
   // With the mutex held.
   Delivery write();
+  // Whether the answer, whose descriptors the system does not pass on, has been replaced by a failure; a request cannot be.
+  [[nodiscard]] bool syncReplaceRefused();
+  void syncAddFailure(std::uint64_t callID, QXError error);
   [[nodiscard]] bool syncIsTakingAnswers() const;
+  [[nodiscard]] UntakenDescriptors::Room syncRoom() const;
+  // Looks again whether there is room now.
+  void syncGoOn();
   [[nodiscard]] bool hasRoomFor(const EncodedFrame& request) const;
 
   void write(const Frame& frame);
@@ -85,7 +95,8 @@ class Endpoint::State final : public AnswerSink, public std::enable_shared_from_
   Reactor& reactor_;  // used in `resume` alone: it may be gone later
   const Reactor::Poster post_;
   const Handlers handlers_;
-  const std::shared_ptr<Reactor::Lane> lane_;  // null: the peer is trusted
+  const std::shared_ptr<Reactor::Lane> lane_;          // null: the peer is trusted
+  const std::shared_ptr<UntakenDescriptors> untaken_;  // null: they are not counted
 
   // Only on the reading thread.
   FrameReader reader_;
@@ -97,7 +108,8 @@ class Endpoint::State final : public AnswerSink, public std::enable_shared_from_
   std::shared_ptr<const UniqueDescriptor> socket_;
   std::shared_ptr<Reactor::Registration> registration_;
   FrameWriter writer_;
-  bool writingIsOver_ = false;
+  SendBuffer sendBuffer_;
+  bool isHeldUp_ = false;  // for want of room for answers with descriptors
   OutgoingCalls outgoing_;
   std::function<void()> onPong_;    // empty: none is awaited
   std::uint64_t lastPongsEnd_ = 0;  // in the writer's stream

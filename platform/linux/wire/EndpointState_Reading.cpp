@@ -31,7 +31,15 @@ std::uint32_t Endpoint::State::wantedNext() {
     const std::lock_guard lock(mutex_);
     if (closed_) return 0;
     delivery = write();
-    if (writer_.pendingBytes() > 0 && !writingIsOver_) wanted |= kWritable;
+    const auto room = syncRoom();
+    isHeldUp_ = room != UntakenDescriptors::Room::free;
+    const bool waitsForPeer = room == UntakenDescriptors::Room::waitsForPeer;
+    if (waitsForPeer) {
+      sendBuffer_.narrow(socket_->get());
+    } else {
+      sendBuffer_.widen(socket_->get());
+    }
+    if (writer_.pendingBytes() > 0 || waitsForPeer) wanted |= kWritable;
     if (syncIsTakingAnswers()) wanted |= mayHoldFrames_ ? Reactor::kAgain : kReadable;
   }
   closeUnlessUnderway(delivery);

@@ -12,9 +12,13 @@
 
 namespace docuvend::linux_platform {
 
-void FrameWriter::add(EncodedFrame frame, std::uint64_t tag) {
+void FrameWriter::add(EncodedFrame frame, FrameLabel label, std::unique_ptr<UntakenDescriptors::Share> share) {
+  if (isOver_) {
+    if (label.request != 0) lost_.push_back(label.request);
+    return;
+  }
   added_ += frame.bytes.size();
-  queue_.push_back({std::move(frame), tag});
+  queue_.push_back({std::move(frame), label, std::move(share)});
 }
 
 // A frame's descriptors go with its first byte.
@@ -45,26 +49,44 @@ long FrameWriter::writePart(int socket, const Waiting& waiting) {
 }
 
 FrameWriter::Progress FrameWriter::write(int socket) {
+  if (isOver_) return Progress::over;
   while (!queue_.empty()) {
     Waiting& first = queue_.front();
     const long count = writePart(socket, first);
     if (count < 0) {
       if (errno == ETOOMANYREFS) return Progress::refused;
-      return errno == EAGAIN || errno == EWOULDBLOCK ? Progress::blocked : Progress::broken;
+      if (errno == EAGAIN || errno == EWOULDBLOCK) return Progress::blocked;
+      end();
+      return Progress::over;
     }
     first.written += static_cast<std::size_t>(count);
     taken_ += static_cast<std::uint64_t>(count);
+    if (first.share) std::exchange(first.share, nullptr)->setSent();
     if (first.written == first.frame.bytes.size()) queue_.pop_front();
   }
   return Progress::drained;
 }
 
+void FrameWriter::end() {
+  lost_ = unwritten();
+  queue_.clear();
+  taken_ = added_;
+  isOver_ = true;
+}
+
+FrameLabel FrameWriter::dropRefused() {
+  const FrameLabel label = queue_.front().label;
+  taken_ += queue_.front().frame.bytes.size();
+  queue_.pop_front();
+  return label;
+}
+
 std::vector<std::uint64_t> FrameWriter::unwritten() const {
-  std::vector<std::uint64_t> tags;
+  std::vector<std::uint64_t> requests = lost_;
   for (const Waiting& waiting : queue_) {
-    if (waiting.tag != 0) tags.push_back(waiting.tag);
+    if (waiting.label.request != 0) requests.push_back(waiting.label.request);
   }
-  return tags;
+  return requests;
 }
 
 }  // namespace docuvend::linux_platform

@@ -22,13 +22,28 @@ bool contains(const std::vector<std::string>& operations, const std::string& ope
   return std::find(operations.begin(), operations.end(), operation) != operations.end();
 }
 
+std::size_t descriptorsAmong(const std::vector<QXValueKind>& kinds) {
+  return static_cast<std::size_t>(std::count(kinds.begin(), kinds.end(), QXValueKind::descriptor));
+}
+
 }  // namespace
 
 // One request's right to be answered once.
 struct IncomingCalls::Answer {
   Answer(std::weak_ptr<AnswerSink> to, std::uint64_t id, std::shared_ptr<const QXRpcInterface> exported, std::size_t index,
-         std::unique_ptr<CallBudget::Share> taken)
-      : sink(std::move(to)), callID(id), interface(std::move(exported)), operation(index), share(std::move(taken)) {}
+         std::unique_ptr<CallBudget::Share> taken, std::unique_ptr<UntakenDescriptors::Share> reserved)
+      : sink(std::move(to)),
+        callID(id),
+        interface(std::move(exported)),
+        operation(index),
+        share(std::move(taken)),
+        room(std::move(reserved)) {}
+  Answer(const Answer&) = delete;
+  Answer& operator=(const Answer&) = delete;
+  ~Answer() {
+    const auto open = sink.lock();
+    if (room && open) open->release(std::move(room));
+  }
 
   void give(QXArray values) {
     if (given.exchange(true)) return;
@@ -36,9 +51,10 @@ struct IncomingCalls::Answer {
     const auto open = sink.lock();
     if (!open) return;
     if (auto mismatch = qxReplyMismatch(*interface, operation, values)) {
+      if (room) open->release(std::move(room));
       open->sendFailure({callID, qxRpcError(QXRpcErrorCode::invalidReply, *std::move(mismatch))});
     } else {
-      open->sendReply({callID, std::move(values)});
+      open->sendReply({callID, std::move(values)}, std::move(room));
     }
   }
 
@@ -47,7 +63,8 @@ struct IncomingCalls::Answer {
   const std::shared_ptr<const QXRpcInterface> interface;
   const std::size_t operation;
   std::atomic<bool> given = false;
-  std::unique_ptr<CallBudget::Share> share;  // none of a releasing one; of whoever gives the answer, and of the destructor
+  std::unique_ptr<CallBudget::Share> share;         // none of a releasing one; of whoever gives the answer, and of the destructor
+  std::unique_ptr<UntakenDescriptors::Share> room;  // of the same; none where no descriptors are answered, or they are not counted
 };
 
 IncomingCalls::IncomingCalls(CallRules rules)
@@ -96,9 +113,15 @@ void IncomingCalls::run(RequestFrame request, std::size_t bytes, const std::shar
     sink->sendFailure({request.callID, qxRpcError(QXRpcErrorCode::tooManyCalls, "too many requests wait for their answers")});
     return;
   }
+  const std::size_t descriptors = rules_.untaken && request.wantsReply ? descriptorsAmong(interface->operations()[*operation].replies) : 0;
+  auto room = descriptors > 0 ? sink->reserve(descriptors) : nullptr;
+  if (descriptors > 0 && !room) {
+    sink->sendFailure({request.callID, qxRpcError(QXRpcErrorCode::tooManyCalls, "too many open files wait to be taken")});
+    return;
+  }
   // A request that wants no answer is as much work as one that does.
-  const auto answer =
-      std::make_shared<Answer>(request.wantsReply ? sink : nullptr, request.callID, std::move(interface), *operation, std::move(share));
+  const auto answer = std::make_shared<Answer>(request.wantsReply ? sink : nullptr, request.callID, std::move(interface), *operation,
+                                               std::move(share), std::move(room));
   const LogSubject subject(rules_.subject);
   object->invoke(*operation, std::move(request.arguments), [answer](QXArray values) { answer->give(std::move(values)); });
 }

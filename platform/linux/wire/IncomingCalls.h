@@ -3,11 +3,13 @@
 // May be used from any thread; a request runs on the thread that gives it.
 #pragma once
 
+#include <cstddef>
 #include <memory>
 #include <mutex>
 
 #include "platform/linux/wire/CallRules.h"
 #include "platform/linux/wire/Frame.h"
+#include "platform/linux/wire/UntakenDescriptors.h"
 #include "platform/rpc.h"
 
 namespace docuvend::linux_platform {
@@ -20,7 +22,12 @@ class AnswerSink {
   AnswerSink& operator=(const AnswerSink&) = delete;
   virtual ~AnswerSink() = default;
 
-  virtual void sendReply(ReplyFrame reply) = 0;
+  // Room for an answer with so many descriptors, of a peer for whom these are counted. None when there is no room.
+  [[nodiscard]] virtual std::unique_ptr<UntakenDescriptors::Share> reserve(std::size_t descriptors) = 0;
+  // When no such answer comes.
+  virtual void release(std::unique_ptr<UntakenDescriptors::Share> room) = 0;
+  // `room` is what was reserved for it, if anything.
+  virtual void sendReply(ReplyFrame reply, std::unique_ptr<UntakenDescriptors::Share> room) = 0;
   virtual void sendFailure(FailureFrame failure) = 0;
 };
 

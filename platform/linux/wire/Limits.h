@@ -21,6 +21,8 @@ inline constexpr std::size_t kMaximumOutputBytes = std::size_t{4} << 20U;  // wr
 inline constexpr std::size_t kMaximumOutputBeforeRequest = kMaximumOutputBytes / 2;
 // The same of a peer that is not trusted; while there are more, nothing further of what it says is looked at.
 inline constexpr std::size_t kMaximumOutputBeforeFrame = std::size_t{1} << 16U;
+// The same, of answers with descriptors that are due to it, or were sent and are not taken by it yet.
+inline constexpr std::size_t kMaximumUntakenAnswers = 4;
 inline constexpr std::chrono::milliseconds kTurn{1};              // after which further frames wait until others have had theirs
 inline constexpr std::size_t kReadBytes = std::size_t{1} << 16U;  // taken from a socket at a time
 
