@@ -76,6 +76,17 @@ TEST_F(DocuvendRun, SaysThatABundleIsNotInstalledAndWhy) {
                                "/broken: has no Info.plist.\ndocuvend-run: no bundle org.missing is installed\n");
 }
 
+TEST_F(DocuvendRun, SaysWhatItCannotLookAtInsteadOfThatNothingIsInstalled) {
+  BundleHouse::install(house_.paths.userBundles + "/org.a", "org.a");
+  // Those that everybody has, one for the bundle's directory, and none for what is in it.
+  for (const std::string identifier : {"org.a", "org.missing"}) {
+    const auto ending = run({identifier}, {"sh", "-c", "ulimit -n 4; exec \"$@\"", "sh"});
+    EXPECT_EQ(ending.status, 125);
+    EXPECT_EQ(ending.output, "docuvend-run: QXSystemErrorDomain 24: cannot look at " + house_.paths.userBundles +
+                                 "/org.a/Info.plist: Too many open files\n");
+  }
+}
+
 TEST_F(DocuvendRun, ShowsWhatItReadsAndIsGivenInOneLineThatSteersNoTerminal) {
   std::filesystem::create_directories(house_.paths.userBundles + "/bro\nken\x1b[2J\u009b2J");
   const auto ending = run({"org.\r\u202egnissim"});
