@@ -111,8 +111,14 @@ TEST_F(InstalledBundlesUnseenTest, ALinkedHomeThatCannotBeResolvedIsTheSameHome)
   BundleHouse::install(user("a"), "org.a");
   start();
   looks_.failAt("realpath", house_.paths.userBundles, ENOMEM);
+  std::atomic<bool> isAsked = false;
+  watches_.beforeEach([this, &isAsked](const std::string& path) {
+    if (path == house_.root() + "/real/bundles/a") isAsked = true;
+  });
   BundleHouse::write(user("a") + "/Entitlements.plist", BundleHouse::propertyList("<key>right</key><true/>"));
   EXPECT_TRUE(eventually([this] { return logged(begins(ENOMEM, house_.paths.userBundles)) == 1; }));
+  EXPECT_TRUE(isAsked) << "it stays watched where it is";
+  watches_.beforeEach({});
   EXPECT_EQ(bundles_->find("org.a")->directory, house_.root() + "/real/bundles/a");
   looks_.failWith({});
   EXPECT_TRUE(changes_.waitFor([this] { return !bundles_->find("org.a")->entitlements.empty(); }));
