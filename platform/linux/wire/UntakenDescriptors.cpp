@@ -35,13 +35,15 @@ std::unique_ptr<UntakenDescriptors::Share> UntakenDescriptors::take(const Socket
 
 void UntakenDescriptors::leave(const Socket& socket, std::size_t count, bool isSent) {
   const std::lock_guard lock(mutex_);
-  OfSocket& of = sockets_[socket];
+  const auto found = sockets_.find(socket);
+  OfSocket& of = found->second;
   --of.due;
   if (isSent) {
     of.sent.push_back(count);
-  } else {
-    count_ -= count;
+    return;
   }
+  count_ -= count;
+  if (of.due == 0 && of.sent.empty()) sockets_.erase(found);
 }
 
 UntakenDescriptors::Room UntakenDescriptors::roomOf(const Socket& socket) {
