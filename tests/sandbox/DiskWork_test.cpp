@@ -156,6 +156,22 @@ TEST(DiskWork, InOneDirectoryTakesItsPartOfTheThreadsAndNoMore) {
   EXPECT_TRUE(works.awaitEnded(kOwners + 2)) << "all of it is done in the end";
 }
 
+TEST(DiskWork, GoesOnWithEverybodyForWhomOneThatEndsMakesRoom) {
+  Works works;
+  DiskWork disk;
+  for (std::size_t owner = 0; owner <= DiskWork::kMostThreadsOfDirectory; ++owner) {
+    disk.submit(std::to_string(owner), "/locked/", works.named("held " + std::to_string(owner)));
+  }
+  disk.submit("0", kElsewhere, works.named("its own"));
+  ASSERT_TRUE(works.awaitBegun(DiskWork::kMostThreadsOfDirectory));
+  works.release("held 0");
+  EXPECT_TRUE(works.awaitBegun(DiskWork::kMostThreadsOfDirectory + 2))
+      << "the next one in the directory, and what its own owner has elsewhere";
+  works.release("its own");
+  for (std::size_t owner = 1; owner <= DiskWork::kMostThreadsOfDirectory; ++owner) works.release("held " + std::to_string(owner));
+  EXPECT_TRUE(works.awaitEnded(DiskWork::kMostThreadsOfDirectory + 2));
+}
+
 TEST(DiskWork, ThatHasNotBegunIsDroppedAtTheEnd) {
   Works works;
   const auto held = std::make_shared<int>(0);

@@ -39,6 +39,13 @@ void LockedDirectory::pass(const std::string& object) {
   changed_.notify_all();
   changed_.wait_for(lock, kPatience, [this] { return !isLocked_; });
   --waiting_;
+  changed_.notify_all();
+}
+
+LockedDirectory::~LockedDirectory() {
+  unlock();
+  std::unique_lock lock(mutex_);
+  changed_.wait(lock, [this] { return waiting_ == 0; });
 }
 
 bool LockedDirectory::awaitWaiting(std::size_t count) {

@@ -29,7 +29,7 @@ class LockedDirectory {
   explicit LockedDirectory(std::string path);
   LockedDirectory(const LockedDirectory&) = delete;
   LockedDirectory& operator=(const LockedDirectory&) = delete;
-  ~LockedDirectory() { unlock(); }
+  ~LockedDirectory();
 
   // Whether so many calls wait, or come to it in a long time.
   [[nodiscard]] bool awaitWaiting(std::size_t count);
