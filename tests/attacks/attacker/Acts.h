@@ -37,5 +37,6 @@ using Acts = std::map<std::string, Act>;
 [[nodiscard]] Acts pretenceActs();
 [[nodiscard]] Acts mountActs();
 [[nodiscard]] Acts sharedThingsActs();
+[[nodiscard]] Acts untakenActs();
 
 }  // namespace docuvend::attacker

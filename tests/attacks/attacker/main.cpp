@@ -50,6 +50,7 @@ int main(int count, char** arguments) {
   add(acts, pretenceActs());
   add(acts, mountActs());
   add(acts, sharedThingsActs());
+  add(acts, untakenActs());
   const bool isExtension = count == 1;
   Words words(isExtension ? linesOf("acts") : std::vector<std::string>(arguments + 1, arguments + count));
   while (!words.isAtEnd()) {
