@@ -4,6 +4,7 @@
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
 #include <signal.h>
+#include <sys/resource.h>
 #include <sys/socket.h>
 #include <sys/stat.h>
 #include <unistd.h>
@@ -11,6 +12,8 @@
 #include <cstring>
 #include <filesystem>
 #include <ostream>
+#include <utility>
+#include <vector>
 
 #include "platform/linux/launch/LaunchDescription.h"
 #include "tests/launch/PeerTest.h"
@@ -286,6 +289,34 @@ TEST_F(LinuxPeerDirectoryTest, ADescriptionThatIsALinkOrAPipeOrADirectoryIsNobod
 TEST_F(LinuxPeerDirectoryTest, WhatIsNoSocketIsNobody) {
   const UniqueDescriptor file(::open("/dev/null", O_RDONLY | O_CLOEXEC));
   expectNobody(directory_.identify(file.get()));
+}
+
+// Not one descriptor fewer than it takes to look is enough to be taken for nobody.
+TEST_F(LinuxPeerDirectoryTest, OfAPeerThatThereAreNoDescriptorsToLookAtWithNothingIsSaid) {
+  const auto peer = unconfined();
+  ASSERT_EQ(identify(peer)->standing, Standing::unconfined);
+  house_.log.clear();
+  rlimit usual{};
+  ASSERT_EQ(::getrlimit(RLIMIT_NOFILE, &usual), 0);
+  const rlimit tight{100, usual.rlim_max};
+  ASSERT_EQ(::setrlimit(RLIMIT_NOFILE, &tight), 0);
+  std::vector<UniqueDescriptor> fillers;
+  while (true) {
+    UniqueDescriptor filler(::dup(peer.connection.get()));
+    if (!filler) break;
+    fillers.push_back(std::move(filler));
+  }
+  int tries = 0;
+  Identity identity;
+  for (; !identity && !fillers.empty(); ++tries) {
+    identity = identify(peer);
+    fillers.pop_back();
+  }
+  ASSERT_EQ(::setrlimit(RLIMIT_NOFILE, &usual), 0);
+  ASSERT_TRUE(identity);
+  EXPECT_EQ(identity->standing, Standing::unconfined);
+  EXPECT_GT(tries, 2) << "it takes several";
+  EXPECT_THAT(house_.log.texts(QXLogType::debug), IsEmpty());
 }
 
 TEST_F(LinuxPeerDirectoryTest, AnUnconfinedProcessMayDeclareAnInstalledBundle) {
