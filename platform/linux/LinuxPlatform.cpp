@@ -51,8 +51,9 @@ constexpr const char* kAdministrationServiceName = "com.orvane.Administration";
 // What anybody may ask the client service for.
 constexpr const char* kWakeUp = "wakeUpCompletion:";
 constexpr const char* kEndAccess = "endAccess:completionHandler:";
-// A thread that serves a request may wait for a disk, of one bundle one at a time; what waits for others who write has threads of its own.
-constexpr unsigned kFewestReactorThreads = 4;
+// A thread that serves a request may wait for a disk, or look for a name in a directory that is held up: of one bundle one at a time. What
+// has to be made or renamed in such a directory has threads of its own. So many bundles must be held up at once before nobody is served.
+constexpr unsigned kFewestReactorThreads = 16;
 // What this process and the extensions make is the user's alone, whatever a login leaves to others.
 constexpr mode_t kOwnerOnlyMask = 077;
 constexpr const char* kNoThread = "cannot begin a thread";
