@@ -41,15 +41,11 @@ class LinuxExtensionHostTest : public ::testing::Test {
     result.updateGrace = updateGrace;
     return result;
   }
-  // The bundle as it is found after an edit in its directory.
-  static Bundle edited(Bundle bundle) {
+  // The bundle as it is found after `docuvendctl install` of another version.
+  static Bundle updated(Bundle bundle) {
     bundle.version += ".1";
-    return bundle;
-  }
-  // Another bundle in its place, as `docuvendctl install` puts it there.
-  static Bundle replaced(Bundle bundle) {
     bundle.incarnation = "another";
-    return edited(std::move(bundle));
+    return bundle;
   }
 };
 
@@ -412,10 +408,11 @@ TEST_F(LinuxExtensionHostTest, WhatAMessageToARemovedExtensionComesToIsItsError)
   EXPECT_TRUE(isOfKind(late->error, ExtensionHostErrorCode::bundleIsGone)) << (late->error ? late->error->description() : "");
 }
 
-TEST_F(LinuxExtensionHostTest, AReplacedExtensionsProcessIsEndedAtOnceAndRequestsGoToTheNextOnes) {
+TEST_F(LinuxExtensionHostTest, TheProcessOfOneThatHasLostAnEntitlementIsEndedAtOnceAndRequestsGoToTheNextOnes) {
   RealExtensions real(withGrace(std::chrono::hours(1)));
   Reports reports;
-  const Bundle bundle = real.makeBundle("com.orvane.test");
+  Bundle bundle = real.makeBundle("com.orvane.test");
+  bundle.entitlements = {{"right", true}};
   real.install({bundle});
   const auto match = real.match(reports);
   const auto before = reports.await(0);
@@ -423,7 +420,8 @@ TEST_F(LinuxExtensionHostTest, AReplacedExtensionsProcessIsEndedAtOnceAndRequest
   const Conversation conversation(before->front());
   const std::string process = conversation.identifier("process");
   auto waiting = conversation.start("wait");
-  real.install({replaced(bundle)});
+  bundle.entitlements.clear();
+  real.install({updated(bundle)});
   const auto after = reports.await(1);
   ASSERT_TRUE(after && after->size() == 1);
   const auto failed = await(std::move(waiting));
@@ -476,7 +474,7 @@ TEST_F(LinuxExtensionHostTest, AnExtensionWhoseMatchWasDroppedEndsWithItsBundleT
   EXPECT_TRUE(isOfKind(failed->error, ExtensionHostErrorCode::bundleIsGone));
 }
 
-TEST_F(LinuxExtensionHostTest, AnEditedExtensionsProcessMayEndWhatItIsAbout) {
+TEST_F(LinuxExtensionHostTest, AnUpdatedExtensionsProcessMayEndWhatItIsAbout) {
   RealExtensions real(withGrace(std::chrono::hours(1)));
   Reports reports;
   const Bundle bundle = real.makeBundle("com.orvane.test");
@@ -487,10 +485,10 @@ TEST_F(LinuxExtensionHostTest, AnEditedExtensionsProcessMayEndWhatItIsAbout) {
   auto conversation = std::make_unique<Conversation>(before->front());
   const std::string process = conversation->identifier("process");
   auto waiting = conversation->start("wait");
-  real.install({edited(bundle)});
+  real.install({updated(bundle)});
   const auto after = reports.await(1);
   ASSERT_TRUE(after && after->size() == 1);
-  EXPECT_NE(Conversation(after->front()).identifier("process"), process) << "a new request is the edited one's";
+  EXPECT_NE(Conversation(after->front()).identifier("process"), process) << "a new request is the updated one's";
   EXPECT_EQ(Conversation(before->front()).identifier("process"), process);
   real.release();
   const auto answer = await(std::move(waiting));
@@ -500,20 +498,20 @@ TEST_F(LinuxExtensionHostTest, AnEditedExtensionsProcessMayEndWhatItIsAbout) {
   EXPECT_TRUE(real.awaitLog("The process of com.orvane.test exited with status 0.")) << "it does not linger";
 }
 
-TEST_F(LinuxExtensionHostTest, AnEditedExtensionsProcessIsEndedWhenTheGraceIsOver) {
+TEST_F(LinuxExtensionHostTest, AnUpdatedExtensionsProcessIsEndedWhenTheGraceIsOver) {
   RealExtensions real(withGrace(milliseconds(1)));
   const auto extension = real.extension();
   const Conversation conversation(extension);
   auto waiting = conversation.start("wait");
   ASSERT_NE(conversation.identifier("process"), "");
-  real.install({edited(real.makeBundle("com.orvane.test"))});
+  real.install({updated(real.makeBundle("com.orvane.test"))});
   const auto failed = await(std::move(waiting));
   ASSERT_TRUE(failed);
   EXPECT_TRUE(isOfKind(failed->error, ExtensionHostErrorCode::bundleIsGone)) << (failed->error ? failed->error->description() : "");
   EXPECT_TRUE(isOfKind(Conversation(extension).error(), ExtensionHostErrorCode::bundleIsGone));
 }
 
-TEST_F(LinuxExtensionHostTest, AnExtensionThatIsEditedWhileItsProcessStartsHasTheGraceAndNoMore) {
+TEST_F(LinuxExtensionHostTest, AnExtensionThatIsUpdatedWhileItsProcessStartsHasTheGraceAndNoMore) {
   RealExtensions real(withGrace(milliseconds(500)));
   const Bundle other = real.makeBundle("com.orvane.a");
   const Bundle bundle = real.makeBundle("com.orvane.b");
@@ -534,7 +532,7 @@ TEST_F(LinuxExtensionHostTest, AnExtensionThatIsEditedWhileItsProcessStartsHasTh
   set->back()->beginExtensionRequest([&begun](std::optional<QXUUID> request, std::optional<QXError> error) {
     begun.set_value({request, std::move(error)});
   });
-  real.install({other, edited(bundle)});
+  real.install({other, updated(bundle)});
   ASSERT_TRUE(reports.await(1));
   mayGoOn.set_value();
   // A machine that is too busy to start it within the grace does not start it at all.
@@ -563,7 +561,7 @@ TEST_F(LinuxExtensionHostTest, AnEditedExtensionThatIsRemovedHasNoMoreGrace) {
   const Conversation conversation(before->front());
   auto waiting = conversation.start("wait");
   ASSERT_NE(conversation.identifier("process"), "");
-  real.install({edited(bundle)});
+  real.install({updated(bundle)});
   ASSERT_TRUE(reports.await(1));
   EXPECT_NE(conversation.identifier("process"), "");
   real.install({});

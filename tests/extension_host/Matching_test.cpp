@@ -60,7 +60,7 @@ TEST(Matching, AnythingThatAProcessDependsOnMakesAnotherInstallation) {
   }
 }
 
-TEST(Matching, AnEditLeavesTheBundleTheSameAndTakesNothingFromAProcess) {
+TEST(Matching, ASuccessorHasAllThatAProcessHas) {
   Bundle bundle = bundleWith(QXDictionary{{"point", "p"}});
   bundle.identifier = "com.orvane.a";
   bundle.incarnation = "1";
@@ -68,22 +68,22 @@ TEST(Matching, AnEditLeavesTheBundleTheSameAndTakesNothingFromAProcess) {
   bundle.entitlements = {{"k", true}};
   bundle.groups = {{"g", "/g"}, {"h", "/h"}};
   using Changes = std::vector<std::pair<const char*, std::function<void(Bundle&)>>>;
-  const Changes edits = {
+  const Changes successors = {
       {"nothing", [](Bundle&) {}},
       {"version", [](Bundle& changed) { changed.version = "2"; }},
       {"executable", [](Bundle& changed) { changed.executable = "/e"; }},
       {"info", [](Bundle& changed) { changed.info.emplace("k", "v"); }},
+      {"incarnation", [](Bundle& changed) { changed.incarnation = "2"; }},
+      {"directory", [](Bundle& changed) { changed.directory = "/d"; }},
       {"a group more", [](Bundle& changed) { changed.groups.emplace("f", "/f"); }},
   };
-  for (const auto& [name, change] : edits) {
+  for (const auto& [name, change] : successors) {
     Bundle changed = bundle;
     change(changed);
-    EXPECT_TRUE(isEditOf(bundle, changed)) << name;
+    EXPECT_TRUE(isSuccessor(bundle, changed)) << name;
   }
   const Changes others = {
       {"identifier", [](Bundle& changed) { changed.identifier = "b"; }},
-      {"incarnation", [](Bundle& changed) { changed.incarnation = "2"; }},
-      {"directory", [](Bundle& changed) { changed.directory = "/d"; }},
       {"container", [](Bundle& changed) { changed.container = "/c"; }},
       {"an entitlement less", [](Bundle& changed) { changed.entitlements.clear(); }},
       {"a group less", [](Bundle& changed) { changed.groups.erase("g"); }},
@@ -97,7 +97,7 @@ TEST(Matching, AnEditLeavesTheBundleTheSameAndTakesNothingFromAProcess) {
   for (const auto& [name, change] : others) {
     Bundle changed = bundle;
     change(changed);
-    EXPECT_FALSE(isEditOf(bundle, changed)) << name;
+    EXPECT_FALSE(isSuccessor(bundle, changed)) << name;
   }
 }
 

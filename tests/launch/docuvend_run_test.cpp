@@ -80,7 +80,7 @@ TEST_F(DocuvendRun, SaysWhatItCannotLookAtInsteadOfThatNothingIsInstalled) {
   BundleHouse::install(house_.paths.userBundles + "/org.a", "org.a");
   // Those that everybody has, one for the bundle's directory, and none for what is in it.
   for (const std::string identifier : {"org.a", "org.missing"}) {
-    const auto ending = run({identifier}, {"sh", "-c", "ulimit -n 4; exec \"$@\"", "sh"});
+    const auto ending = run({identifier}, {"sh", "-c", "exec 3<&-; ulimit -n 4; exec \"$@\"", "sh"});
     EXPECT_EQ(ending.status, 125);
     EXPECT_EQ(ending.output, "docuvend-run: QXSystemErrorDomain 24: cannot look at " + house_.paths.userBundles +
                                  "/org.a/Info.plist: Too many open files\n");

@@ -18,6 +18,7 @@
 
 #include "common/DVErrors.h"
 #include "platform/linux/bundles/BundleInstaller.h"
+#include "platform/linux/extension_host/ExtensionErrors.h"
 #include "platform/linux/files/LinuxPropertyLists.h"
 #include "sdk/BlockingCall.h"
 #include "tests/system/house/Burden.h"
@@ -149,7 +150,7 @@ TEST_F(LiveRegistry, AnIdleProviderThatIsUpdatedLeavesNoOldProcess) {
   });
 }
 
-TEST_F(LiveRegistry, ARemovalLetsRequestsFinishAndNewOnesFindNothing) {
+TEST_F(LiveRegistry, ARemovalEndsRequestsAndNewOnesFindNothing) {
   start();
   installAndAwait("one");
   ASSERT_EQ(grant("stuck"), std::nullopt);
@@ -158,10 +159,11 @@ TEST_F(LiveRegistry, ARemovalLetsRequestsFinishAndNewOnesFindNothing) {
   uninstall();
   eventually("it is not found", [this] { return isUnknown(); });
   EXPECT_TRUE(isNotFound(errorOf(caller_->ask<&DVDaemon::startProvidingItemAtURL>(item("stuck"), kVaneID, kPickerID))));
-  EXPECT_EQ(house_.processesOf(kProgram).size(), 1U);
-  free();
   ASSERT_EQ(answer.wait_for(kPatience), std::future_status::ready);
-  EXPECT_EQ(answer.get(), std::nullopt);
+  const auto error = answer.get();
+  ASSERT_TRUE(error && error->underlying);
+  EXPECT_EQ(error->underlying->domain, linux_platform::kExtensionHostErrorDomain);
+  EXPECT_EQ(error->underlying->code, static_cast<std::int64_t>(linux_platform::ExtensionHostErrorCode::bundleIsGone));
   eventually("its process has ended", [this] { return house_.processesOf(kProgram).empty(); });
 }
 

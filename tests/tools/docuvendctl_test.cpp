@@ -93,11 +93,11 @@ TEST(Docuvendctl, SaysThatItCannotLookAtABundleInsteadOfThatItIsNone) {
   const std::string bundle = house.root() + "/bundle";
   linux_platform::BundleHouse::install(bundle, "org.a");
   // Those that everybody has, one for the bundle's directory, and none for what is in it.
-  const Ending ending =
-      tests::Process({{"/bin/sh", "-c", "ulimit -n 4; exec \"$@\"", "sh", std::string(DOCUVEND_BIN) + "/docuvendctl", "install", bundle},
-                      {"HOME=" + house.paths.home, "XDG_RUNTIME_DIR=" + house.root() + "/run"},
-                      {}})
-          .wait();
+  const Ending ending = tests::Process({{"/bin/sh", "-c", "exec 3<&-; ulimit -n 4; exec \"$@\"", "sh",
+                                         std::string(DOCUVEND_BIN) + "/docuvendctl", "install", bundle},
+                                        {"HOME=" + house.paths.home, "XDG_RUNTIME_DIR=" + house.root() + "/run"},
+                                        {}})
+                            .wait();
   EXPECT_EQ(ending.status, 9);
   EXPECT_EQ(ending.errors, "docuvendctl: QXSystemErrorDomain 24: cannot look at " + bundle + "/Info.plist: Too many open files\n");
 }

@@ -244,9 +244,9 @@ TEST_F(ProtocolPageTest, SaysWhatAnExtensionIsGivenAndHowLong) {
       {"to answer a ping", seconds(times.answerLimit) + "; then the process is ended"},
       {"without requests, until its connection is closed", seconds(times.linger)},
       {"to end by itself after that, and then again after SIGTERM", seconds(times.endGrace)},
-      {"to answer what is open when its bundle is removed or replaced, also by `docuvendctl install`",
+      {"to answer what is open when its bundle is removed, or an update takes a group or an entitlement from it",
        "none: the process is ended at once"},
-      {"to answer what is open when its bundle is edited in its directory", seconds(times.updateGrace) + "; then the process is ended"}};
+      {"to answer what is open when its bundle is updated otherwise", seconds(times.updateGrace) + "; then the process is ended"}};
   for (const auto& time : expected) EXPECT_EQ(row(heading, time.first), (std::vector{time.first, time.second}));
   EXPECT_EQ(rows(heading).size(), expected.size());
   EXPECT_TRUE(tells("Bundles", "at most " + std::to_string(kLongestIdentifier) + " bytes"));

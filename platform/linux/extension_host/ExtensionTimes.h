@@ -16,9 +16,9 @@ struct ExtensionTimes {
   Duration livenessInterval{10'000};
   // After its connection was closed, a process has this long to end by itself, and again after it was asked to by signal.
   Duration endGrace{2'000};
-  // One whose bundle was edited in its directory may end what it is about for so long. It reaches nothing that the edited one does not, and
-  // whoever edits is whoever installed it: unlike what was removed or replaced, which is ended at once, it is nobody's to fear. But it runs
-  // what is not installed any more, and a message that it never answers would keep it for good.
+  // One whose bundle was updated, by installing another over it or in its directory, may end what it is about for so long: nobody who is
+  // reading is to notice an update. It reaches nothing that the new one does not. But it runs what is not installed any more, which may be
+  // another maker's, and a message that it never answers would keep it for good. What is removed is ended at once.
   Duration updateGrace{10'000};
   // A process that is gone sooner than this after its start died quickly.
   Duration quickDeath{5'000};

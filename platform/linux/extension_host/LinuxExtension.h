@@ -58,8 +58,8 @@ class LinuxExtension : public QXExtension, public std::enable_shared_from_this<L
   [[nodiscard]] std::shared_ptr<QXExtensionContext> extensionContextForRequest(const QXUUID& request) override;
 
   enum class Retirement {
-    atOnce,      // the bundle was removed, or another is in its place
-    afterGrace,  // it was edited where it is, and the process has nothing that the edited one has not
+    atOnce,      // the bundle was removed, or has lost something that the process has
+    afterGrace,  // it was updated
   };
   // The bundle is not what it was. At once: its process is ended, messages and requests that wait fail, and so do requests from now on.
   // After the grace: the same then (ExtensionTimes::updateGrace); until then requests are served as before, but the process does not

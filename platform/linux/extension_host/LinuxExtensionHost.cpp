@@ -114,7 +114,7 @@ void LinuxExtensionHost::State::retireOutdated(const std::vector<Bundle>& instal
     if (now == installed.end()) {
       extension->retire(LinuxExtension::Retirement::atOnce);
     } else if (!isSameInstallation(before, *now)) {
-      extension->retire(isEditOf(before, *now) ? LinuxExtension::Retirement::afterGrace : LinuxExtension::Retirement::atOnce);
+      extension->retire(isSuccessor(before, *now) ? LinuxExtension::Retirement::afterGrace : LinuxExtension::Retirement::atOnce);
     }
   }
 }

@@ -3,11 +3,10 @@
 // A bundle is an extension of a match when its Info.plist's dictionary "QXExtension" has every attribute with that string. Match handlers
 // run on a thread that the host keeps for them, so a slow one delays nothing but the next call.
 //
-// An extension's process does not outlive its bundle. When that is removed, or another is in its place (Bundle::incarnation), or it has
-// lost a group or an entitlement, the process is ended at once, whatever it has not answered: messages that wait fail with bundleIsGone,
-// each through its error handler, an answer that comes later is not taken, and requests of the old object fail. When it was only edited in
-// its directory the old process has a grace for what it is about (ExtensionTimes::updateGrace says why). The object of the bundle that is
-// installed then has a process of its own.
+// An extension's process does not outlive its bundle. When that is removed, or has lost a group or an entitlement, the process is ended at
+// once, whatever it has not answered: messages that wait fail with bundleIsGone, each through its error handler, an answer that comes later
+// is not taken, and requests of the old object fail. When it was updated the old process has a grace for what it is about
+// (ExtensionTimes::updateGrace says why). The object of the bundle that is installed then has a process of its own.
 #pragma once
 
 #include <memory>

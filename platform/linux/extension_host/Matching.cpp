@@ -21,9 +21,8 @@ bool isSameInstallation(const Bundle& a, const Bundle& b) {
          a.container == b.container;
 }
 
-bool isEditOf(const Bundle& before, const Bundle& now) {
-  return before.identifier == now.identifier && before.directory == now.directory && before.incarnation == now.incarnation &&
-         before.container == now.container && before.entitlements == now.entitlements &&
+bool isSuccessor(const Bundle& before, const Bundle& now) {
+  return before.identifier == now.identifier && before.container == now.container && before.entitlements == now.entitlements &&
          std::includes(now.groups.begin(), now.groups.end(), before.groups.begin(), before.groups.end());
 }
 

@@ -12,9 +12,8 @@ namespace docuvend::linux_platform {
 // True when nothing has been installed, updated or decided anew between the two: a process started from one is as good as from the other.
 [[nodiscard]] bool isSameInstallation(const Bundle& a, const Bundle& b);
 
-// True when the one that is installed now is the one before, edited in its directory, and a process that was started from that has nothing
-// which the edited one has not: the entitlements are the same, and it is still in all of its groups. Not after `docuvendctl install`, which
-// may bring another maker's bundle of that identifier.
-[[nodiscard]] bool isEditOf(const Bundle& before, const Bundle& now);
+// True when a process that was started from the bundle before has nothing which the one that is installed now under that identifier has
+// not: the container and the entitlements are the same, and it is still in all of its groups.
+[[nodiscard]] bool isSuccessor(const Bundle& before, const Bundle& now);
 
 }  // namespace docuvend::linux_platform
