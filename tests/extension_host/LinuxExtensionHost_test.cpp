@@ -1,14 +1,15 @@
 #include "platform/linux/extension_host/LinuxExtensionHost.h"
 
+#include <fcntl.h>
 #include <gtest/gtest.h>
 #include <poll.h>
 #include <unistd.h>
 
+#include <array>
 #include <atomic>
 #include <chrono>
 #include <filesystem>
 #include <fstream>
-#include <iterator>
 #include <memory>
 #include <string>
 #include <thread>
@@ -53,6 +54,16 @@ bool isOfKind(const std::optional<QXError>& error, ExtensionHostErrorCode code) 
   return error && error->domain == kExtensionHostErrorDomain && error->code == static_cast<std::int64_t>(code);
 }
 
+// Empty when the process has ended, also while it is read.
+std::string commandLineAt(const std::filesystem::path& process) {
+  const UniqueDescriptor file(::open((process / "cmdline").c_str(), O_RDONLY | O_CLOEXEC));
+  std::string line;
+  std::array<char, 4096> piece{};
+  ssize_t count = 0;
+  while (file && (count = ::read(file.get(), piece.data(), piece.size())) > 0) line.append(piece.data(), static_cast<std::size_t>(count));
+  return line;
+}
+
 // True as soon as no process has the directory in its command line any more.
 bool nobodyRuns(const std::string& directory) {
   const auto deadline = std::chrono::steady_clock::now() + kPatience;
@@ -60,9 +71,7 @@ bool nobodyRuns(const std::string& directory) {
   while (isFound && std::chrono::steady_clock::now() < deadline) {
     isFound = false;
     for (const auto& entry : std::filesystem::directory_iterator("/proc")) {
-      std::ifstream file(entry.path() / "cmdline");
-      const std::string line((std::istreambuf_iterator<char>(file)), std::istreambuf_iterator<char>());
-      isFound = isFound || line.find(directory) != std::string::npos;
+      isFound = isFound || commandLineAt(entry.path()).find(directory) != std::string::npos;
     }
   }
   return !isFound;

@@ -158,7 +158,7 @@ UniqueDescriptor DaemonHouse::launchDaemon(const std::string& logSetting, const 
 }
 
 void DaemonHouse::startDaemonWithoutWaiting(const std::string& logSetting) {
-  (void)launchDaemon(logSetting, administrationSocket());
+  (void)launchDaemon(logSetting, publicSocket(kDVServiceName));  // the last of its services
   ASSERT_TRUE(daemon_->isRunning()) << "the daemon ended at its start";
 }
 
