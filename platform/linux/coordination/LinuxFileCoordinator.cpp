@@ -1,12 +1,12 @@
 #include "platform/linux/coordination/LinuxFileCoordinator.h"
 
 #include <algorithm>
-#include <cerrno>
 #include <string>
 #include <utility>
 #include <variant>
 
 #include "platform/linux/base/LogSubject.h"
+#include "platform/linux/base/Shortage.h"
 #include "platform/linux/coordination/CoordinationErrors.h"
 
 namespace docuvend::linux_platform {
@@ -20,10 +20,7 @@ void onItsQueue(const QXDocuvend& provider, QXTask task) {
   }
 }
 
-// It says something of this process, or of the machine, and nothing of the files.
-bool isWantOfMeans(const QXError& error) {
-  return error.domain == kQXSystemErrorDomain && (error.code == EMFILE || error.code == ENFILE || error.code == ENOMEM);
-}
+bool isWantOfMeans(const QXError& error) { return error.domain == kQXSystemErrorDomain && isShortage(static_cast<int>(error.code)); }
 
 LogSubject::Name subjectOf(const AccessHolder& holder) {
   return holder.bundleIdentifier ? std::make_shared<const std::string>(*holder.bundleIdentifier) : nullptr;

@@ -8,6 +8,7 @@
 #include <utility>
 #include <variant>
 
+#include "platform/linux/base/Shortage.h"
 #include "platform/linux/files/DescriptorStream.h"
 #include "platform/linux/files/FileReplacer.h"
 #include "platform/linux/files/PropertyListParser.h"
@@ -18,16 +19,13 @@ namespace {
 
 constexpr const char* kUnreadableSuffix = ".unreadable-";
 
-// There is none, or it is this process that lacks something.
-bool saysNothingOfTheFile(int error) {
-  return error == ENOENT || error == ENOTDIR || error == EMFILE || error == ENFILE || error == ENOMEM;
-}
+bool isAbsence(int error) { return error == ENOENT || error == ENOTDIR; }
 
 }  // namespace
 
 std::unique_ptr<std::istream> LinuxPropertyLists::openStream(const std::string& path) {
   UniqueDescriptor file(::open(path.c_str(), O_RDONLY | O_NONBLOCK | O_NOCTTY | O_CLOEXEC));
-  if (!file && saysNothingOfTheFile(errno)) return nullptr;
+  if (!file && (isAbsence(errno) || isShortage(errno))) return nullptr;
   struct stat status {};
   if (file && (::fstat(file.get(), &status) != 0 || !S_ISREG(status.st_mode))) file.reset();
   return std::make_unique<DescriptorStream>(std::move(file));
