@@ -20,6 +20,7 @@ TEST(ConfinePolicy, IsReadAsItWasWritten) {
   command.policy.memory = 1ULL << 40U;
   command.policy.openFiles = 9;
   command.policy.pendingSignals = 11;
+  command.policy.lockedMemory = 13;
   command.policy.leases = Leases::taken;
   command.command = {"/bin/x", "--", "--read", ""};
   const auto parsed = parseConfineArguments(confineArguments(command));
@@ -30,11 +31,12 @@ TEST(ConfinePolicy, IsReadAsItWasWritten) {
 TEST(ConfinePolicy, IsWrittenAsWords) {
   EXPECT_THAT(
       confineArguments(
-          {{{{PathAccess::readWrite, "/a"}}, 3, std::nullopt, std::nullopt, std::nullopt, std::nullopt, Leases::refused}, {"/b", "c"}}),
+          {{{{PathAccess::readWrite, "/a"}}, 3, std::nullopt, std::nullopt, std::nullopt, std::nullopt, std::nullopt, Leases::refused},
+           {"/b", "c"}}),
       ElementsAre("--read-write", "/a", "--descriptors", "3", "--", "/b", "c"));
-  EXPECT_THAT(confineArguments({{{}, 4, 1, 2, 3, 5, Leases::taken}, {"/b"}}),
+  EXPECT_THAT(confineArguments({{{}, 4, 1, 2, 3, 5, 6, Leases::taken}, {"/b"}}),
               ElementsAre("--descriptors", "4", "--processes", "1", "--memory", "2", "--open-files", "3", "--pending-signals", "5",
-                          "--leases", "taken", "--", "/b"));
+                          "--locked-memory", "6", "--leases", "taken", "--", "/b"));
 }
 
 TEST(ConfinePolicy, IsNotGuessed) {

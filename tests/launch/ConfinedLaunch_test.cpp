@@ -311,19 +311,22 @@ TEST_F(ConfinedApplication, EndsWithWhoStartedIt) {
 }
 
 constexpr rlim_t kFewSignals = 150;
+constexpr rlim_t kLittleLockedMemory = 8192;
 
-rlim_t pendingSignalsOfALaunch() {
+rlim_t halfOfOwn(__rlimit_resource resource, rlim_t most) {
   rlimit own{};
-  EXPECT_EQ(::getrlimit(RLIMIT_SIGPENDING, &own), 0);
-  return std::min<rlim_t>(own.rlim_cur / 2, kConfinedPendingSignals);
+  EXPECT_EQ(::getrlimit(resource, &own), 0);
+  return std::min<rlim_t>(own.rlim_cur / 2, most);
 }
+rlim_t pendingSignalsOfALaunch() { return halfOfOwn(RLIMIT_SIGPENDING, kConfinedPendingSignals); }
+rlim_t lockedMemoryOfALaunch() { return halfOfOwn(RLIMIT_MEMLOCK, kConfinedLockedMemory); }
 
-// Of this process, and so of what it launches from now on: a machine with little memory begins with few.
-void lowerPendingSignals(rlim_t most) {
+// Of this process, and so of what it launches from now on: a machine with little memory begins with few signals.
+void lower(__rlimit_resource resource, rlim_t most) {
   rlimit own{};
-  ASSERT_EQ(::getrlimit(RLIMIT_SIGPENDING, &own), 0);
+  ASSERT_EQ(::getrlimit(resource, &own), 0);
   own.rlim_cur = most;
-  ASSERT_EQ(::setrlimit(RLIMIT_SIGPENDING, &own), 0);
+  ASSERT_EQ(::setrlimit(resource, &own), 0);
 }
 
 // What the user may have is shared with the daemon.
@@ -340,8 +343,12 @@ TEST_F(ConfinedApplication, IsLimited) {
   EXPECT_EQ(attempt(bundle, "limit", "processes"), std::to_string(std::min<rlim_t>(processes.rlim_cur / 2, kApplicationProcesses)));
   EXPECT_EQ(attempt(bundle, "limit", "memory"), std::to_string(RLIM_INFINITY));
   EXPECT_EQ(attempt(bundle, "limit", "pending signals"), std::to_string(pendingSignalsOfALaunch()));
-  lowerPendingSignals(2 * kFewSignals);
+  EXPECT_EQ(attempt(bundle, "limit", "locked memory"), std::to_string(lockedMemoryOfALaunch()));
+  EXPECT_EQ(attempt(bundle, "limit", "message queues"), "0");
+  lower(RLIMIT_SIGPENDING, 2 * kFewSignals);
+  lower(RLIMIT_MEMLOCK, 2 * kLittleLockedMemory);
   EXPECT_EQ(attempt(bundle, "limit", "pending signals"), std::to_string(kFewSignals));
+  EXPECT_EQ(attempt(bundle, "limit", "locked memory"), std::to_string(kLittleLockedMemory));
 }
 
 class ConfinedExtension : public ConfinedTest {
@@ -378,13 +385,39 @@ TEST_F(ConfinedExtension, SeesNoSocketDirectory) {
 }
 
 TEST_F(ConfinedExtension, IsLimited) {
-  const auto outcomes = run({"limit", "processes", "limit", "memory", "limit", "open files", "limit", "pending signals"});
+  const auto outcomes = run({"limit", "processes", "limit", "memory", "limit", "open files", "limit", "pending signals", "limit",
+                             "locked memory", "limit", "message queues"});
   EXPECT_EQ(outcomes.at("limit processes"), std::to_string(kExtensionProcesses));
   EXPECT_EQ(outcomes.at("limit memory"), std::to_string(kExtensionMemory.value_or(RLIM_INFINITY)));
   EXPECT_EQ(outcomes.at("limit open files"), std::to_string(kExtensionOpenFiles));
   EXPECT_EQ(outcomes.at("limit pending signals"), std::to_string(pendingSignalsOfALaunch()));
-  lowerPendingSignals(2 * kFewSignals);
-  EXPECT_EQ(run({"limit", "pending signals"}).at("limit pending signals"), std::to_string(kFewSignals));
+  EXPECT_EQ(outcomes.at("limit locked memory"), std::to_string(lockedMemoryOfALaunch()));
+  EXPECT_EQ(outcomes.at("limit message queues"), "0");
+  lower(RLIMIT_SIGPENDING, 2 * kFewSignals);
+  lower(RLIMIT_MEMLOCK, 2 * kLittleLockedMemory);
+  const auto lowered = run({"limit", "pending signals", "limit", "locked memory"});
+  EXPECT_EQ(lowered.at("limit pending signals"), std::to_string(kFewSignals));
+  EXPECT_EQ(lowered.at("limit locked memory"), std::to_string(kLittleLockedMemory));
+}
+
+// Both are counted for the user, whose other processes need them.
+TEST_F(ConfinedExtension, AndAnApplicationMakeNoMessageQueueAndLockLittleSharedMemory) {
+  const rlim_t page = static_cast<rlim_t>(::sysconf(_SC_PAGESIZE));
+  const rlim_t most = lockedMemoryOfALaunch() / page * page;
+  ASSERT_GT(most, 0U) << "who runs this may lock nothing";
+  const std::string allowed = std::to_string(most);
+  const std::string tooMuch = std::to_string(most + page);
+  const std::vector<std::string> attempts = {"make-message-queue", "one", "lock-shared-memory", allowed, "lock-shared-memory", tooMuch};
+
+  const auto outside = house_.runUnconfined(attempts);
+  EXPECT_EQ(outside.at("make-message-queue one"), "ok");
+  EXPECT_EQ(outside.at("lock-shared-memory " + allowed), "ok");
+  EXPECT_EQ(outside.at("lock-shared-memory " + tooMuch), "ok");
+  for (const auto& inside : {house_.run(house_.installProbe("org.a"), attempts), run(attempts)}) {
+    EXPECT_EQ(inside.at("make-message-queue one"), "EMFILE");
+    EXPECT_EQ(inside.at("lock-shared-memory " + allowed), "ok");
+    EXPECT_EQ(inside.at("lock-shared-memory " + tooMuch), "ENOMEM");
+  }
 }
 
 // Counted within its own confinement: the user's other processes take nothing away.

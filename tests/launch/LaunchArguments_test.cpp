@@ -140,6 +140,7 @@ TEST_F(LaunchArguments, LimitAnExtensionAndAnApplication) {
   EXPECT_FALSE(application.memory);
   EXPECT_EQ(application.openFiles, kApplicationOpenFiles);
   EXPECT_EQ(application.pendingSignals, kConfinedPendingSignals);
+  EXPECT_EQ(application.lockedMemory, kConfinedLockedMemory);
 
   subject_.kind = LaunchKind::extension;
   const auto extension = confinePolicy(subject_, host_);
@@ -148,6 +149,7 @@ TEST_F(LaunchArguments, LimitAnExtensionAndAnApplication) {
   EXPECT_EQ(extension.memory, kExtensionMemory);
   EXPECT_EQ(extension.openFiles, kExtensionOpenFiles);
   EXPECT_EQ(extension.pendingSignals, kConfinedPendingSignals);
+  EXPECT_EQ(extension.lockedMemory, kConfinedLockedMemory);
 
   host_.landlockLevel = kProcessLimitLevel - 1;
   for (const LaunchKind kind : {LaunchKind::application, LaunchKind::extension}) {
@@ -169,6 +171,21 @@ TEST_F(LaunchArguments, GiveNoLaunchMoreThanHalfOfThePendingSignalsThatItsUserMa
     EXPECT_EQ(confinePolicy(subject_, host_).pendingSignals, 1);
     host_.pendingSignals = std::nullopt;
     EXPECT_EQ(confinePolicy(subject_, host_).pendingSignals, kConfinedPendingSignals);
+  }
+}
+
+// What is shared and locked is counted for the user, wherever his processes are.
+TEST_F(LaunchArguments, GiveNoLaunchMoreThanHalfOfTheMemoryThatItsUserMayLock) {
+  for (const LaunchKind kind : {LaunchKind::application, LaunchKind::extension}) {
+    subject_.kind = kind;
+    host_.lockedMemory = kConfinedLockedMemory * 2 + 2;
+    EXPECT_EQ(confinePolicy(subject_, host_).lockedMemory, kConfinedLockedMemory);
+    host_.lockedMemory = 65536;
+    EXPECT_EQ(confinePolicy(subject_, host_).lockedMemory, 32768);
+    host_.lockedMemory = 1;
+    EXPECT_EQ(confinePolicy(subject_, host_).lockedMemory, 1);
+    host_.lockedMemory = std::nullopt;
+    EXPECT_EQ(confinePolicy(subject_, host_).lockedMemory, kConfinedLockedMemory);
   }
 }
 

@@ -104,6 +104,8 @@ std::vector<Limit> limits() {
           {"kApplicationProcesses", kApplicationProcesses},
           {"kApplicationOpenFiles", kApplicationOpenFiles},
           {"kConfinedPendingSignals", kConfinedPendingSignals},
+          {"kConfinedLockedMemory", kConfinedLockedMemory},
+          {"kConfinedMessageQueueBytes", kConfinedMessageQueueBytes},
           {"DiskWork::kMostThreads", DiskWork::kMostThreads},
           {"DiskWork::kMostThreadsOfDirectory", DiskWork::kMostThreadsOfDirectory},
           {"kExtensionProcesses", kExtensionProcesses},

@@ -57,6 +57,8 @@ int run(const std::vector<std::string>& arguments) {
   if (const auto error = limit(RLIMIT_DATA, policy.memory)) return fail(error->description());
   if (const auto error = limit(RLIMIT_NOFILE, policy.openFiles)) return fail(error->description());
   if (const auto error = limit(RLIMIT_SIGPENDING, policy.pendingSignals)) return fail(error->description());
+  if (const auto error = limit(RLIMIT_MEMLOCK, policy.lockedMemory)) return fail(error->description());
+  if (const auto error = limit(RLIMIT_MSGQUEUE, kConfinedMessageQueueBytes)) return fail(error->description());
   if (const auto error = restrictToRules(policy.rules, landlockLevel())) return fail(error->description());
   if (const auto error = refuseSystemCalls(policy.leases)) return fail(error->description());
   if (::close_range(static_cast<unsigned>(policy.descriptors), UINT_MAX, 0) != 0) return fail("cannot close the other descriptors");

@@ -80,6 +80,7 @@ HostLayout HostLayout::read() {
   layout.processes = limitOn(RLIMIT_NPROC, &rlimit::rlim_cur);
   layout.openFiles = limitOn(RLIMIT_NOFILE, &rlimit::rlim_max);  // the daemon raises its own to this
   layout.pendingSignals = limitOn(RLIMIT_SIGPENDING, &rlimit::rlim_cur);
+  layout.lockedMemory = limitOn(RLIMIT_MEMLOCK, &rlimit::rlim_cur);
   layout.landlockLevel = docuvend::linux_platform::landlockLevel();
   if (::access(kBubblewrap, X_OK) == 0) layout.bubblewrap = kBubblewrap;
   layout.helper = findHelper();

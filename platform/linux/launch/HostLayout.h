@@ -18,8 +18,9 @@ struct HostLayout {
   std::optional<std::uint64_t> processes;  // this process's own limits, which a launch inherits; none where there is no limit
   std::optional<std::uint64_t> openFiles;
   std::optional<std::uint64_t> pendingSignals;
-  std::string bubblewrap;  // absolute path; empty when it is not installed
-  std::string helper;      // absolute path of docuvend-confine; empty when it is not found
+  std::optional<std::uint64_t> lockedMemory;  // bytes
+  std::string bubblewrap;                     // absolute path; empty when it is not installed
+  std::string helper;                         // absolute path of docuvend-confine; empty when it is not found
 
   [[nodiscard]] static HostLayout read();
 

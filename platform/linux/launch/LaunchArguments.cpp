@@ -39,6 +39,7 @@ void setLimits(ConfinePolicy& policy, LaunchKind kind, const HostLayout& host) {
   }
   policy.openFiles = isExtension ? kExtensionOpenFiles : halfOf(host.openFiles, kApplicationOpenFiles);
   policy.pendingSignals = halfOf(host.pendingSignals, kConfinedPendingSignals);
+  policy.lockedMemory = halfOf(host.lockedMemory, kConfinedLockedMemory);
   if (isExtension) policy.memory = kExtensionMemory;
 }
 

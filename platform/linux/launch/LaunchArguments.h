@@ -37,6 +37,10 @@ inline constexpr std::uint64_t kApplicationOpenFiles = 4096;
 // more than half of what the user who launches may have, of an extension's launch too: on a small machine that is fewer.
 inline constexpr std::uint64_t kConfinedPendingSignals = 4096;
 
+// Bytes that a launch may lock into memory. Shared memory that is locked, and what a socket sends without copying it, the kernel counts for
+// the user as well, so this too is never more than half. It is room enough for a library that keeps its secrets out of the swap.
+inline constexpr std::uint64_t kConfinedLockedMemory = std::uint64_t{1} << 20U;
+
 // Where docuvend-confine is found inside.
 inline constexpr const char* kHelperPath = "/.docuvend-confine";
 

@@ -2,11 +2,14 @@
 // of an error, or what was asked for. Only words on standard output; the last word may end the process.
 #include <dirent.h>
 #include <fcntl.h>
+#include <mqueue.h>
 #include <sched.h>
 #include <signal.h>
 #include <sys/ioctl.h>
+#include <sys/ipc.h>
 #include <sys/mount.h>
 #include <sys/resource.h>
+#include <sys/shm.h>
 #include <sys/socket.h>
 #include <sys/stat.h>
 #include <sys/un.h>
@@ -188,6 +191,26 @@ std::string execute(const std::string& path) {
   return outcome(errno == 0 ? 0 : -1);
 }
 
+// The smallest that there is.
+std::string makeMessageQueue() {
+  const std::string name = "/docuvend-probe-" + std::to_string(::getpid());
+  mq_attr size{};
+  size.mq_maxmsg = 1;
+  size.mq_msgsize = 1;
+  std::string result = outcome(::mq_open(name.c_str(), O_CREAT | O_EXCL | O_RDWR | O_CLOEXEC, 0600, &size));
+  ::mq_unlink(name.c_str());
+  return result;
+}
+
+// Gives it back at once.
+std::string lockSharedMemory(std::size_t bytes) {
+  const int segment = ::shmget(IPC_PRIVATE, bytes, 0600);
+  if (segment < 0) return "no segment";
+  std::string result = outcome(::shmctl(segment, SHM_LOCK, nullptr));
+  ::shmctl(segment, IPC_RMID, nullptr);
+  return result;
+}
+
 bool isListedKey(const std::string& description) {
   std::ifstream keys("/proc/keys");
   for (std::string line; std::getline(keys, line);) {
@@ -263,10 +286,13 @@ std::string attempt(const std::string& what, const std::string& subject) {
   if (what == "key") return isListedKey(subject) ? "listed" : "not listed";
   if (what == "call") return docuvend::probe::call(subject);
   if (what == "limit") {
-    const std::map<std::string, __rlimit_resource> resources = {
-        {"processes", RLIMIT_NPROC}, {"memory", RLIMIT_DATA}, {"open files", RLIMIT_NOFILE}, {"pending signals", RLIMIT_SIGPENDING}};
+    const std::map<std::string, __rlimit_resource> resources = {{"processes", RLIMIT_NPROC},       {"memory", RLIMIT_DATA},
+                                                                {"open files", RLIMIT_NOFILE},     {"pending signals", RLIMIT_SIGPENDING},
+                                                                {"locked memory", RLIMIT_MEMLOCK}, {"message queues", RLIMIT_MSGQUEUE}};
     return limitOf(resources.at(subject));
   }
+  if (what == "make-message-queue") return makeMessageQueue();
+  if (what == "lock-shared-memory") return lockSharedMemory(std::stoul(subject));
   if (what == "fork") return forkUntilRefused();
   if (what == "echo") return echoOnce();
   if (what == "variable") {

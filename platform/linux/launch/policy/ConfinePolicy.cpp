@@ -15,11 +15,12 @@ constexpr std::array<std::pair<PathAccess, std::string_view>, 4> kAccessOptions 
     {PathAccess::device, "--device"},
 }};
 constexpr std::string_view kDescriptorsOption = "--descriptors";
-constexpr std::array<std::pair<std::string_view, std::optional<std::uint64_t> ConfinePolicy::*>, 4> kLimitOptions = {{
+constexpr std::array<std::pair<std::string_view, std::optional<std::uint64_t> ConfinePolicy::*>, 5> kLimitOptions = {{
     {"--processes", &ConfinePolicy::processes},
     {"--memory", &ConfinePolicy::memory},
     {"--open-files", &ConfinePolicy::openFiles},
     {"--pending-signals", &ConfinePolicy::pendingSignals},
+    {"--locked-memory", &ConfinePolicy::lockedMemory},
 }};
 constexpr std::string_view kLeasesOption = "--leases";
 constexpr std::string_view kLeasesTaken = "taken";

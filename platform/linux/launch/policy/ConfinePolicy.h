@@ -1,8 +1,8 @@
 // What docuvend-confine is told to do, as its arguments say it. The launcher writes them, docuvend-confine reads them.
 //
 //   docuvend-confine [--read-execute PATH | --read PATH | --read-write PATH | --device PATH]... --descriptors COUNT
-//                    [--processes COUNT] [--memory BYTES] [--open-files COUNT] [--pending-signals COUNT] [--leases taken] -- EXECUTABLE
-//                    [ARGUMENT...]
+//                    [--processes COUNT] [--memory BYTES] [--open-files COUNT] [--pending-signals COUNT]
+//                    [--locked-memory BYTES] [--leases taken] -- EXECUTABLE [ARGUMENT...]
 #pragma once
 
 #include <cstdint>
@@ -23,6 +23,10 @@ enum class PathAccess {
 // Whether a process may take leases for writing on files, which hold up everybody else who opens them. Other leases nobody may take.
 enum class Leases { refused, taken };
 
+// Bytes of POSIX message queues of whatever is confined: it makes none. The kernel counts them for the user, a launch could take them all,
+// and nobody outside sees a queue that is made inside, where there are sockets as well.
+inline constexpr std::uint64_t kConfinedMessageQueueBytes = 0;
+
 struct ConfinePolicy {
   struct Rule {
     PathAccess access;
@@ -36,6 +40,7 @@ struct ConfinePolicy {
   std::optional<std::uint64_t> memory;     // bytes of private writable memory per process
   std::optional<std::uint64_t> openFiles;  // descriptors per process
   std::optional<std::uint64_t> pendingSignals;
+  std::optional<std::uint64_t> lockedMemory;  // bytes
   Leases leases = Leases::refused;
 
   friend bool operator==(const ConfinePolicy&, const ConfinePolicy&) = default;
