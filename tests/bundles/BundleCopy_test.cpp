@@ -4,8 +4,12 @@
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
 
+#include <cerrno>
+
 #include "platform/linux/bundles/BundleErrors.h"
+#include "platform/linux/bundles/OpenInBundle.h"
 #include "tests/bundles/BundleHouse.h"
+#include "tests/bundles/InterposedLooks.h"
 
 namespace docuvend::linux_platform {
 namespace {
@@ -74,6 +78,20 @@ TEST_F(BundleCopyTest, CopiesFilesThatAreLongerThanWhatIsCopiedAtOnce) {
   EXPECT_EQ(copy({}), std::nullopt);
   std::ifstream file(house_.root() + "/target/three", std::ios::binary);
   EXPECT_TRUE(std::string(std::istreambuf_iterator<char>(file), {}) == text);
+}
+
+TEST_F(BundleCopyTest, FollowsALinkAgainThatARenameElsewhereLedAstray) {
+  InterposedLooks looks;
+  int walks = 0;
+  int lost = kMostWalks - 1;
+  looks.failWith([&walks, &lost](const InterposedLooks::Call& call) { return call.name == "openat2" && ++walks <= lost ? EAGAIN : 0; });
+  EXPECT_EQ(copy({}), std::nullopt);
+  EXPECT_EQ(walks, kMostWalks);
+
+  walks = 0;
+  lost = kMostWalks;
+  EXPECT_EQ(copy({}), QXError::system(EAGAIN, "cannot copy \"link\""));
+  EXPECT_EQ(walks, kMostWalks);
 }
 
 }  // namespace

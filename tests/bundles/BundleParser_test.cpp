@@ -6,7 +6,11 @@
 #include <sys/stat.h>
 #include <sys/sysmacros.h>
 
+#include <cerrno>
+
+#include "platform/linux/bundles/OpenInBundle.h"
 #include "tests/bundles/BundleHouse.h"
+#include "tests/bundles/InterposedLooks.h"
 
 namespace docuvend::linux_platform {
 namespace {
@@ -33,6 +37,7 @@ class BundleParser : public ::testing::Test {
   }
 
   BundleHouse house_;
+  InterposedLooks looks_;
   const std::string directory_ = house_.root() + "/bundle";
 };
 
@@ -154,6 +159,37 @@ TEST_F(BundleParser, RefusesAnExecutableThatIsNotItsOwn) {
     EXPECT_THAT(infoProblem(identifier + BundleHouse::entry("QXBundleExecutable", BundleHouse::text(executable))), HasSubstr(expected))
         << executable;
   }
+}
+
+TEST_F(BundleParser, TheWayToTheExecutableIsTheShortest) {
+  BundleHouse::install(directory_, "org.a");
+  std::filesystem::create_directory(directory_ + "/sub");
+  BundleHouse::write(directory_ + "/Info.plist",
+                     BundleHouse::propertyList(BundleHouse::entry("QXBundleIdentifier", BundleHouse::text("org.a")) +
+                                               BundleHouse::entry("QXBundleExecutable", BundleHouse::text("sub/.././program"))));
+  std::vector<std::string> ways;
+  looks_.failWith([&ways](const InterposedLooks::Call& call) {
+    if (call.name == "openat2") ways.push_back(call.path);
+    return 0;
+  });
+  EXPECT_EQ(parse().bundle.executable, directory_ + "/program");
+  EXPECT_THAT(ways, ElementsAre("program"));
+}
+
+TEST_F(BundleParser, ARenameElsewhereSaysNothingOfTheExecutable) {
+  BundleHouse::install(directory_, "org.a");
+  int walks = 0;
+  int lost = kMostWalks - 1;
+  looks_.failWith([&walks, &lost](const InterposedLooks::Call& call) { return call.name == "openat2" && ++walks <= lost ? EAGAIN : 0; });
+  EXPECT_EQ(parse().bundle.executable, directory_ + "/program");
+  EXPECT_EQ(walks, kMostWalks);
+
+  walks = 0;
+  lost = kMostWalks;
+  const auto unseen = parseBundle(directory_, house_.propertyLists);
+  ASSERT_TRUE(std::holds_alternative<QXError>(unseen));
+  EXPECT_EQ(std::get<QXError>(unseen), notSeen(directory_ + "/program", EAGAIN));
+  EXPECT_EQ(walks, kMostWalks);
 }
 
 TEST_F(BundleParser, GivesAnotherVersionAfterEachChange) {

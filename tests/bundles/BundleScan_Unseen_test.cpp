@@ -220,6 +220,87 @@ TEST_F(UnseenBundlesTest, ANewBundleWaitsWhileOneOfTheSystemsMayComeBeforeIt) {
   }
 }
 
+// The call that does not see the first of two bundles with one identifier. Empty directory: at the directory of bundles.
+struct Unseen {
+  BundleOrigin origin;
+  std::string call;
+  std::string directory;
+};
+
+class UnseenFirstOfTwo : public UnseenBundlesTest, public ::testing::WithParamInterface<Unseen> {
+ protected:
+  void SetUp() override {
+    BundleHouse::install(first_, "org.x");
+    BundleHouse::install(user("second"), "org.x");
+    ASSERT_EQ(scan_.run().bundles.at("org.x").directory, first_);
+    fs::rename(first_, house_.root() + "/aside");
+  }
+  void expectNobody() {
+    looks_.failAt(GetParam().call, root_ + GetParam().directory, EMFILE);
+    for (int look = 0; look < 2; ++look) {
+      const auto seen = scan_.run();
+      EXPECT_TRUE(seen.notSeen);
+      EXPECT_THAT(seen.bundles, IsEmpty());
+    }
+    looks_.failWith({});
+  }
+
+  const std::string root_ = GetParam().origin == BundleOrigin::system ? house_.paths.systemBundles : house_.paths.userBundles;
+  const std::string first_ = root_ + "/first";
+  BundleScan scan_{house_.paths, house_.propertyLists, house_.log.defaultLog()};
+};
+
+TEST_P(UnseenFirstOfTwo, WhenItIsReplacedIsFollowedByNobody) {
+  BundleHouse::install(first_, "org.x");
+  expectNobody();
+  EXPECT_EQ(scan_.run({first_}).bundles.at("org.x").directory, first_) << "what is not settled counts as what it was";
+  EXPECT_EQ(scan_.run().bundles.at("org.x").directory, first_);
+}
+
+TEST_P(UnseenFirstOfTwo, WhenItIsGoneIsFollowedByTheSecondOnceNothingBeforeThatIsMissed) {
+  if (!GetParam().directory.empty()) BundleHouse::install(root_ + GetParam().directory, "org.y");
+  expectNobody();
+  EXPECT_EQ(scan_.run().bundles.at("org.x").directory, user("second"));
+}
+
+INSTANTIATE_TEST_SUITE_P(Places, UnseenFirstOfTwo,
+                         ::testing::Values(Unseen{BundleOrigin::system, "realpath", ""}, Unseen{BundleOrigin::system, "opendir", ""},
+                                           Unseen{BundleOrigin::system, "open", "/first"}, Unseen{BundleOrigin::user, "realpath", ""},
+                                           Unseen{BundleOrigin::user, "opendir", ""}, Unseen{BundleOrigin::user, "open", "/first"}),
+                         [](const auto& tested) {
+                           return tested.param.call + (tested.param.origin == BundleOrigin::system ? "OfTheSystems" : "OfTheUsers");
+                         });
+
+TEST_F(UnseenBundlesTest, TheFirstLookFindsOnlyWhatComesBeforeWhatItMisses) {
+  for (const std::string name : {"a", "b", "c"}) BundleHouse::install(user(name), "org." + name);
+  BundleScan scan(house_.paths, house_.propertyLists, house_.log.defaultLog());
+  looks_.failAt("open", user("b"), EMFILE);
+  for (int look = 0; look < 2; ++look) EXPECT_THAT(scan.run().bundles, ElementsAre(Pair("org.a", ::testing::_)));
+  looks_.failWith({});
+  EXPECT_THAT(scan.run().bundles, SizeIs(3));
+}
+
+TEST_F(UnseenBundlesTest, AnIdentifierStaysWithItsDirectoryWhileWhatComesBeforeIsMissed) {
+  BundleHouse::install(user("b"), "org.b");
+  BundleHouse::install(user("c"), "org.c");
+  BundleScan scan(house_.paths, house_.propertyLists, house_.log.defaultLog());
+  ASSERT_THAT(scan.run().bundles, SizeIs(2));
+  BundleHouse::install(user("a"), "org.b");
+  fs::rename(user("c"), house_.root() + "/aside");
+  BundleHouse::install(user("c"), "org.c");
+  looks_.failAt("opendir", house_.paths.systemBundles, EMFILE);
+  for (int look = 0; look < 2; ++look) {
+    const auto bundles = scan.run().bundles;
+    EXPECT_THAT(bundles, ElementsAre(Pair("org.b", ::testing::_))) << "another directory is in the place of org.c's";
+    EXPECT_EQ(bundles.at("org.b").directory, user("b"));
+  }
+  EXPECT_THAT(house_.log.texts(), IsEmpty());
+  looks_.failWith({});
+  const auto bundles = scan.run().bundles;
+  EXPECT_THAT(bundles, SizeIs(2));
+  EXPECT_EQ(bundles.at("org.b").directory, user("a"));
+}
+
 TEST_F(UnseenBundlesTest, AKnownBundleOfTheUsersIsUpdatedWhileTheSystemsCannotBeLookedAtUnlessItIsAnothersNow) {
   BundleHouse::install(user("a"), "org.a");
   BundleScan scan(house_.paths, house_.propertyLists, house_.log.defaultLog());

@@ -5,9 +5,7 @@
 
 #include <dirent.h>
 #include <fcntl.h>
-#include <linux/openat2.h>
 #include <sys/stat.h>
-#include <sys/syscall.h>
 #include <unistd.h>
 
 #include <algorithm>
@@ -21,6 +19,7 @@
 #include <vector>
 
 #include "platform/linux/bundles/BundleErrors.h"
+#include "platform/linux/bundles/OpenInBundle.h"
 
 namespace docuvend::linux_platform {
 namespace {
@@ -50,11 +49,7 @@ class Copy {
   // After everything was copied.
   Failure examineLinks() {
     for (const std::string& place : links_) {
-      open_how how{};
-      how.flags = O_PATH | O_CLOEXEC;
-      how.resolve = RESOLVE_BENEATH | RESOLVE_NO_MAGICLINKS;
-      const UniqueDescriptor end(static_cast<int>(::syscall(SYS_openat2, root_.get(), place.c_str(), &how, sizeof(how))));
-      if (end) continue;
+      if (openInBundle(root_.get(), place, LinksOnTheWay::thatStayInside)) continue;
       if (errno == EXDEV) return forbidden(place, "is a link that leads out");
       if (errno == ENOENT || errno == ENOTDIR || errno == ELOOP) return forbidden(place, "is a link that leads nowhere");
       return failure(place);

@@ -1,13 +1,12 @@
 #include "platform/linux/bundles/BundleParser.h"
 
 #include <fcntl.h>
-#include <linux/openat2.h>
 #include <sys/stat.h>
-#include <sys/syscall.h>
 #include <sys/sysmacros.h>
 #include <unistd.h>
 
 #include <cerrno>
+#include <filesystem>
 #include <initializer_list>
 #include <optional>
 #include <string_view>
@@ -15,6 +14,7 @@
 
 #include "platform/linux/base/UniqueDescriptor.h"
 #include "platform/linux/bundles/BundleIdentifier.h"
+#include "platform/linux/bundles/OpenInBundle.h"
 
 namespace docuvend::linux_platform {
 namespace {
@@ -108,21 +108,21 @@ class Parser {
   Problem takeExecutable() {
     const auto* relative = qxFind<std::string>(result_.bundle.info, kExecutableKey);
     if (relative == nullptr || relative->empty()) return problem("Info.plist has no string " + std::string(kExecutableKey));
-    open_how how{};
-    how.flags = O_PATH | O_CLOEXEC;
-    how.resolve = RESOLVE_BENEATH | RESOLVE_NO_SYMLINKS | RESOLVE_NO_MAGICLINKS;
-    const UniqueDescriptor file(static_cast<int>(::syscall(SYS_openat2, directoryDescriptor_.get(), relative->c_str(), &how, sizeof(how))));
+    // Not back through "..", where renames without end would keep it from being looked at, and others that wait for that.
+    const std::string path = std::filesystem::path(*relative).lexically_normal().string();
+    const UniqueDescriptor file = openInBundle(directoryDescriptor_.get(), path, LinksOnTheWay::none);
     if (!file) {
+      if (errno == EAGAIN) return notSeen(pathOf(path), errno);
       if (errno == EXDEV) return problem("its executable lies outside the bundle");
       if (errno == ELOOP) return problem("its executable is a link, or lies behind one");
-      return failure(pathOf(*relative), errno, "its executable cannot be opened: " + std::system_category().message(errno));
+      return failure(pathOf(path), errno, "its executable cannot be opened: " + std::system_category().message(errno));
     }
     struct stat status {};
-    if (::fstat(file.get(), &status) != 0) return notSeen(pathOf(*relative), errno);
+    if (::fstat(file.get(), &status) != 0) return notSeen(pathOf(path), errno);
     if (!S_ISREG(status.st_mode)) return problem("its executable is not a regular file");
     if ((status.st_mode & kExecutableBits) == 0) return problem("its executable may not be executed");
     addVersion(status);
-    result_.bundle.executable = pathOf(*relative);
+    result_.bundle.executable = pathOf(path);
     return std::nullopt;
   }
 

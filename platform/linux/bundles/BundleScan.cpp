@@ -87,12 +87,11 @@ Seen<std::vector<std::string>> directoriesOfBundle(const std::string& directory)
 }
 
 BundleLook BundleScan::run(const std::set<std::string>& unsettled) {
-  found_.clear();
+  lastFound_ = std::exchange(found_, {});
   reported_.clear();
   notSeen_.reset();
   const auto lastParsed = std::exchange(parsed_, {});
   scanDirectory(paths_.systemBundles, BundleOrigin::system, unsettled, lastParsed);
-  isSystemSeen_ = !notSeen_;
   scanDirectory(paths_.userBundles, BundleOrigin::user, unsettled, lastParsed);
   BundleLook result{resolve(), {}};
   result.notSeen = notSeen_;
@@ -142,15 +141,18 @@ void BundleScan::scanBundle(const std::string& directory, BundleOrigin origin, c
     if (last != lastParsed.end()) keep(last->second);
     return;
   }
-  const auto& parsed = std::get<ParsedBundle>(reading);
-  const bool isKnown = last != lastParsed.end() && last->second.bundle.identifier == parsed.bundle.identifier;
-  if (origin == BundleOrigin::system || isSystemSeen_ || isKnown) add(parsed);
+  add(std::get<ParsedBundle>(reading));
 }
 
-// As it was, if this very directory is still there and still nobody else's.
+// As it was, if this very directory is still there and still nobody else's. Another in its place may be the same bundle, updated: it is no
+// bundle until it is read, but what was there stays known, or a look that passes over it as unsettled would let another have its
+// identifier.
 void BundleScan::keep(const ParsedBundle& last) {
   const auto there = incarnationOf(last.bundle.directory);
-  if (const auto* incarnation = std::get_if<std::string>(&there); incarnation != nullptr && *incarnation != last.bundle.incarnation) return;
+  if (const auto* incarnation = std::get_if<std::string>(&there); incarnation != nullptr && *incarnation != last.bundle.incarnation) {
+    if (!incarnation->empty()) parsed_.insert_or_assign(last.bundle.directory, last);
+    return;
+  }
   const auto distrusted = distrustOf(last);
   if (const auto* problem = std::get_if<std::optional<BundleProblem>>(&distrusted); problem != nullptr && *problem) {
     return ignore(last.bundle.directory, **problem);
@@ -160,6 +162,7 @@ void BundleScan::keep(const ParsedBundle& last) {
 
 void BundleScan::add(const ParsedBundle& parsed) {
   parsed_.insert_or_assign(parsed.bundle.directory, parsed);
+  if (notSeen_ && !wasFound(parsed.bundle)) return;
   const auto same = std::find_if(found_.begin(), found_.end(),
                                  [&parsed](const ParsedBundle& other) { return other.bundle.identifier == parsed.bundle.identifier; });
   if (same == found_.end()) {
@@ -167,6 +170,13 @@ void BundleScan::add(const ParsedBundle& parsed) {
     return;
   }
   report(qxLogMessage("[ERROR] Ignoring the bundle at %@: %@ has the same identifier.", parsed.bundle.directory, same->bundle.directory));
+}
+
+bool BundleScan::wasFound(const Bundle& bundle) const {
+  return std::any_of(lastFound_.begin(), lastFound_.end(), [&bundle](const ParsedBundle& last) {
+    return last.bundle.identifier == bundle.identifier && last.bundle.directory == bundle.directory &&
+           last.bundle.incarnation == bundle.incarnation;
+  });
 }
 
 BundleMap BundleScan::resolve() {

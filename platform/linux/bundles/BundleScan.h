@@ -1,9 +1,11 @@
 // Looks through the bundle directories. What is wrong with a bundle is logged once, and again only after a look that found it mended.
 //
 // What cannot be looked at (Seen.h) counts as what the last look found there: a bundle by itself, or all bundles of a directory that cannot
-// be listed. Only what is known all the same to be gone, replaced or another user's work goes; that takes no descriptor. As long as
-// something of the system's cannot be looked at, it may be a bundle that comes before one of the user's; so the user's that the last look
-// did not find wait.
+// be listed. Only what is known all the same to be gone, replaced or another user's work goes; that takes no descriptor.
+//
+// It may as well be a bundle by now that comes before those that are looked at after it. So among these an identifier stays with the very
+// directory that the last look found it in, or is nobody's: one that was never found, or found second to another, waits for a look that
+// misses nothing before it, and so does one in the place of another.
 #pragma once
 
 #include <map>
@@ -46,6 +48,7 @@ class BundleScan {
   void scanBundle(const std::string& directory, BundleOrigin origin, const Parsed& lastParsed);
   void keep(const ParsedBundle& last);
   void add(const ParsedBundle& parsed);
+  [[nodiscard]] bool wasFound(const Bundle& bundle) const;
   [[nodiscard]] BundleMap resolve();
   // The real path, or what it was when it was last seen.
   [[nodiscard]] std::string placeOf(const std::string& path);
@@ -58,11 +61,11 @@ class BundleScan {
   QXLogHandle& log_;
 
   Parsed parsed_;                              // by the look that is going on, or else the last
-  std::vector<ParsedBundle> found_;            // of the look that is going on
+  std::vector<ParsedBundle> found_;            // likewise, of each identifier the one that has it
+  std::vector<ParsedBundle> lastFound_;        // by the look before that
   std::set<std::string> reported_;             // by the look that is going on
   std::set<std::string> lastReported_;         // by the one before
   std::optional<QXError> notSeen_;             // by the look that is going on
-  bool isSystemSeen_ = true;                   // likewise
   std::map<std::string, std::string> places_;  // the real paths of containers, as they were last seen
 };
 
