@@ -3,15 +3,19 @@
 #include "tests/files/system_calls.h"
 
 #include <fcntl.h>
+#include <linux/openat2.h>
 #include <sys/random.h>
 #include <sys/stat.h>
+#include <sys/syscall.h>
 #include <unistd.h>
 
 #include <algorithm>
+#include <array>
 #include <cassert>
 #include <cerrno>
 #include <cstdarg>
 #include <cstdio>
+#include <utility>
 
 namespace docuvend::test {
 namespace {
@@ -43,6 +47,14 @@ int SystemCalls::enter(const char* name) {
   return fails ? failure_.error : 0;
 }
 
+int SystemCalls::enterOpening(Opening opening) {
+  const bool fails = opening.isInCacheAlone && opening.path == cacheFailure_.path && cacheFailure_.times > 0;
+  openings_.push_back(std::move(opening));
+  if (!fails) return 0;
+  --cacheFailure_.times;
+  return cacheFailure_.error;
+}
+
 }  // namespace docuvend::test
 
 using docuvend::test::inForce;
@@ -50,6 +62,7 @@ using docuvend::test::mayPass;
 
 extern "C" {
 
+long __real_syscall(long, ...);
 int __real_open(const char*, int, ...);
 int __real_openat(int, const char*, int, ...);
 ssize_t __real_read(int, void*, size_t);
@@ -64,11 +77,30 @@ int __real_renameat2(int, const char*, int, const char*, unsigned);
 ssize_t __real_getrandom(void*, size_t, unsigned);
 uid_t __real_geteuid();
 
+long __wrap_syscall(long number, ...) {
+  constexpr std::size_t kArguments = 6;
+  std::array<long, kArguments> of{};
+  va_list rest;
+  va_start(rest, number);
+  for (long& argument : of) argument = va_arg(rest, long);
+  va_end(rest);
+  if (number == SYS_openat2 && inForce != nullptr) {
+    const auto& how = *reinterpret_cast<const open_how*>(of[2]);
+    const int error = inForce->enterOpening({reinterpret_cast<const char*>(of[1]), (how.resolve & RESOLVE_CACHED) != 0});
+    if (error != 0) {
+      errno = error;
+      return -1;
+    }
+  }
+  return __real_syscall(number, of[0], of[1], of[2], of[3], of[4], of[5]);
+}
+
 int __wrap_open(const char* path, int flags, ...) {
   va_list rest;
   va_start(rest, flags);
   const unsigned mode = (flags & (O_CREAT | O_TMPFILE)) != 0 ? va_arg(rest, unsigned) : 0;
   va_end(rest);
+  if (inForce != nullptr) inForce->enterOpening({path, /*isInCacheAlone=*/false});
   return mayPass("open") ? __real_open(path, flags, mode) : -1;
 }
 

@@ -24,6 +24,7 @@
 #include <array>
 #include <cerrno>
 #include <climits>
+#include <cstdint>
 #include <filesystem>
 #include <optional>
 #include <string_view>
@@ -54,13 +55,13 @@ bool leadsTo(const std::string& name, int file) {
   return ::lstat(name.c_str(), &there) == 0 && ::fstat(file, &here) == 0 && there.st_dev == here.st_dev && there.st_ino == here.st_ino;
 }
 
-// EAGAIN when the file has been removed since it was opened.
-Text kernelName(int file) {
+// EAGAIN when the file has been removed since it was opened, or may have been and the cache alone is to say so.
+Text kernelName(int file, Lookup lookup = Lookup::complete) {
   Text text = linkText(AT_FDCWD, ("/proc/self/fd/" + std::to_string(file)).c_str());
   const auto* name = std::get_if<std::string>(&text);
   if (name == nullptr) return text;
   if (name->front() != '/') return ESTALE;  // a thing without a place in this process's file system
-  if (name->ends_with(kRemovedMark) && !leadsTo(*name, file)) return EAGAIN;
+  if (name->ends_with(kRemovedMark) && (lookup == Lookup::inCacheAlone || !leadsTo(*name, file))) return EAGAIN;
   return text;
 }
 
@@ -163,6 +164,18 @@ Step step(const std::string& path, Lookups& lookups) {
   return errno == ENOENT ? placeOfMissing(path, lookups) : finished(errno);
 }
 
+UniqueDescriptor openDirectory(const std::string& path, LastLink lastLink, Lookup lookup) {
+  const int flags = O_PATH | O_DIRECTORY | O_CLOEXEC | (lastLink == LastLink::refused ? O_NOFOLLOW : 0);
+  if (lookup == Lookup::inCacheAlone) {
+    open_how how{};
+    how.flags = static_cast<std::uint64_t>(flags);
+    how.resolve = RESOLVE_CACHED;
+    UniqueDescriptor directory(static_cast<int>(::syscall(SYS_openat2, AT_FDCWD, path.c_str(), &how, sizeof how)));
+    if (directory || errno != EINVAL) return directory;
+  }
+  return UniqueDescriptor(::open(path.c_str(), flags));
+}
+
 }  // namespace
 
 FilePlace::Result FilePlace::ofItem(const std::string& path) {
@@ -183,12 +196,12 @@ FilePlace::Result FilePlace::ofItem(const std::string& path) {
   return EAGAIN;
 }
 
-FilePlace::Result FilePlace::ofDirectory(const std::string& path, LastLink lastLink) {
-  const int flags = O_PATH | O_DIRECTORY | O_CLOEXEC | (lastLink == LastLink::refused ? O_NOFOLLOW : 0);
+FilePlace::Result FilePlace::ofDirectory(const std::string& path, LastLink lastLink, Lookup lookup) {
   for (int round = 0; round < kRounds; ++round) {
-    const UniqueDescriptor file(::open(path.c_str(), flags));
+    const UniqueDescriptor file = openDirectory(path, lastLink, lookup);
+    if (!file && errno == EAGAIN) continue;  // the cache does not tell, perhaps only because a mount was under way
     if (!file) return errno;
-    Text name = kernelName(file.get());
+    Text name = kernelName(file.get(), lookup);
     if (auto* existing = std::get_if<std::string>(&name)) return FilePlace{std::move(*existing), {}};
     if (std::get<int>(name) != EAGAIN) return std::get<int>(name);
   }

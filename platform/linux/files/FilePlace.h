@@ -4,6 +4,8 @@
 #include <string>
 #include <variant>
 
+#include "platform/linux/base/Lookup.h"
+
 namespace docuvend::linux_platform {
 
 // What becomes of a link that is the path's last component. A link that is refused is no directory.
@@ -18,8 +20,10 @@ struct FilePlace {
 
   // Links are followed, those too that point to what does not exist yet. ENOENT when a missing component is followed by "..".
   [[nodiscard]] static Result ofItem(const std::string& path);
-  // ENOENT when there is no such directory, ENOTDIR when it is something else. Links on the way are followed.
-  [[nodiscard]] static Result ofDirectory(const std::string& path, LastLink lastLink = LastLink::followed);
+  // ENOENT when there is no such directory, ENOTDIR when it is something else. Links on the way are followed. A kernel that cannot look in
+  // its cache alone (before 5.12) looks completely.
+  [[nodiscard]] static Result ofDirectory(const std::string& path, LastLink lastLink = LastLink::followed,
+                                          Lookup lookup = Lookup::complete);
 
   // Its one name without links.
   [[nodiscard]] std::string path() const;

@@ -2,7 +2,9 @@
 //
 // A relationship is read off the kernel's names of the two places (see the source). One place seen through a bind mount elsewhere is
 // another place. A directory that is itself a link is none. An item that is named through a link lies elsewhere, wherever the link leads
-// (StraightURL.h). Errors other than the missing directory are of the system's domain, with the errno value.
+// (StraightURL.h). A missing directory is reported as such wherever the kernel knows of it without waiting; while somebody keeps the place
+// locked in which it would be looked for, an item that does not lie in that place is answered for at once, as one that lies elsewhere or
+// leads nowhere. Errors other than the missing directory are of the system's domain, with the errno value.
 #pragma once
 
 #include <optional>

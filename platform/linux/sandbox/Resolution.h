@@ -9,6 +9,7 @@
 #include <string>
 #include <variant>
 
+#include "platform/linux/base/Lookup.h"
 #include "platform/linux/base/UniqueDescriptor.h"
 
 namespace docuvend::linux_platform {
@@ -38,9 +39,6 @@ using OpenedPath = std::variant<UniqueDescriptor, SystemFailure>;
 [[nodiscard]] std::variant<ObjectStatus, SystemFailure> statusOf(int descriptor);
 
 enum class Expecting { anything, directory };
-
-// A name that the kernel has not in its cache is looked for in its directory, which may be locked by whoever changes something there.
-enum class Lookup { complete, inCacheAlone };
 
 // O_PATH of what `path` names below the directory: no symbolic link, no way up, no other mount. EAGAIN when more than the cache would have
 // to be looked at, and may not be.
