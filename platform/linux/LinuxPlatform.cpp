@@ -138,6 +138,7 @@ struct LinuxPlatform::Services {
                                         [this](const KeyedFile& file) { return remnants.hasPlaceholder(file); }, &log.defaultLog()}};
   FileAccesses fileAccesses{fileCoordinator};
 
+  const std::shared_ptr<QXQueue> storages = queues.serialQueue("com.orvane.docuvend.coordination.storages");
   const std::shared_ptr<QXQueue> settling = queues.serialQueue("com.orvane.docuvend.sandbox.settling");
   std::unique_ptr<LinuxSandbox> sandbox;  // made in `create`, never null after it
 
@@ -148,10 +149,11 @@ struct LinuxPlatform::Services {
   std::shared_ptr<QXRpcListener> coordinationListener;
 
   void publish() {
-    // Nothing of this goes before the process does.
-    bundles.onChange([this] { fileCoordinator.installedStoragesChanged(); });
+    // Nothing of this goes before the process does. Nothing here waits for what anybody does to his files, or who is removed would be
+    // served meanwhile.
     bundles.onChange([this] { followInstalledBundles(); });
     bundles.onChange([this] { rpc.endOutdatedConnections(); });
+    bundles.onChange([this] { storages->async([this] { fileCoordinator.installedStoragesChanged(); }); });
     sandboxDelegate = std::make_shared<SandboxListenerDelegate>(*sandbox, log.defaultLog());
     coordinationDelegate = std::make_shared<FileCoordinationListenerDelegate>(
         FileCoordinationServicer::Surroundings{fileCoordinator, fileAccesses, *sandbox, peers});

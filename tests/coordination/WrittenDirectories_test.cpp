@@ -110,6 +110,24 @@ TEST_F(WritesInARenamedDirectory, ThatLeftItsProvidersAreNobodys) {
   EXPECT_TRUE(told().empty());
 }
 
+// The room was asked for at whoever was the owner when the write began.
+TEST_F(WritesInARenamedDirectory, FindNoMoreRoomAtAnotherOwnerThanAnyWrite) {
+  provider->isSlow = true;
+  const std::string moving = outside + "/moving";
+  const auto writer = client(unconfinedAs("com.example.editor"));
+  constexpr std::size_t kMost = ChangeNotices::kMaximumNoticesUnderWay + ChangeNotices::kMaximumUntoldFiles;
+  const auto writeWhileItMovesIn = [&](std::size_t number) {
+    fs::create_directories(moving);
+    expectSuccess(*writer.write(fileAt(moving + "/" + std::to_string(number)), accessID(1)));
+    fs::rename(moving, renamed);
+    expectSuccess(*writer.end(accessID(1)));
+    fs::rename(renamed, moving);
+  };
+  for (std::size_t i = 0; i < kMost + 10; ++i) writeWhileItMovesIn(i);
+  while (!provider->unanswered.empty()) provider->answer();
+  EXPECT_EQ(provider->told.size(), kMost);
+}
+
 TEST_F(WritesInARenamedDirectory, HoldADescriptorOnlyUntilTheyAreOver) {
   const auto openDescriptors = [] { return std::distance(fs::directory_iterator("/proc/self/fd"), {}); };
   const auto writer = anybody();

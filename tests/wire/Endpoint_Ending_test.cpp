@@ -23,6 +23,71 @@ TEST_F(EndpointTest, WhenThePeerLeavesEveryWaitingMessageFailsOnceAndThenTheEndI
   EXPECT_EQ(client.blamed->count(), 0U);
 }
 
+// An exported object whose operation, and whose end, take as long as the test likes.
+class Lingering final : public QXRpcExportedObject {
+ public:
+  struct Watch {
+    Mailbox<std::thread::id> begun;  // by the operation, and by the end
+    Mailbox<bool> mayGoOn;
+  };
+
+  explicit Lingering(std::shared_ptr<Watch> watch) : watch_(std::move(watch)) {}
+  ~Lingering() override { linger(); }
+  void invoke(std::size_t, QXArray, QXRpcReply) override { linger(); }
+
+ private:
+  void linger() const {
+    watch_->begun.put(std::this_thread::get_id());
+    (void)watch_->mayGoOn.take();
+  }
+
+  const std::shared_ptr<Watch> watch_;
+};
+
+TEST_F(EndpointTest, OneThatIsClosedOnTheReadingThreadLetsGoOfItsObjectThereWhateverThatTakes) {
+  const auto watch = std::make_shared<Lingering::Watch>();
+  auto raw = connectRaw(std::make_shared<Lingering>(watch));
+  raw.sayHello();
+  ASSERT_TRUE(server.hellos->take());
+  server.endpoint->closeOnReadingThread(QXError::system(ECONNABORTED, "enough"));
+  ASSERT_TRUE(raw.read<Hello>());
+  EXPECT_TRUE(raw.read<EndFrame>()) << "the peer is told at once";
+  const auto thread = watch->begun.take();
+  ASSERT_TRUE(thread);
+  EXPECT_NE(*thread, std::this_thread::get_id());
+  EXPECT_EQ(server.closed->count(), 0U);
+  watch->mayGoOn.put(true);
+  EXPECT_THAT(server.closed->take(), IsSystemError(ECONNABORTED));
+}
+
+TEST_F(EndpointTest, OneThatIsClosedOnTheReadingThreadFinishesWhatRunsThereAndServesNothingMore) {
+  const auto watch = std::make_shared<Lingering::Watch>();
+  CallRules rules;
+  rules.lane = Reactor::makeLane();
+  auto raw = connectRaw(std::make_shared<Lingering>(watch), std::move(rules));
+  raw.sayHello();
+  for (std::uint64_t call : {1, 2}) ASSERT_TRUE(raw.write(Frame(RequestFrame{call, true, kEcho.name, {QXValue("a")}})));
+  ASSERT_TRUE(watch->begun.take());
+  server.endpoint->closeOnReadingThread(QXError::system(ECONNABORTED, "enough"));
+  ASSERT_TRUE(aTaskRuns());
+  EXPECT_EQ(watch->begun.count(), 0U) << "not while the request runs";
+  watch->mayGoOn.put(true);
+  ASSERT_TRUE(watch->begun.take());
+  EXPECT_EQ(server.closed->count(), 0U);
+  watch->mayGoOn.put(true);
+  EXPECT_THAT(server.closed->take(), IsSystemError(ECONNABORTED));
+  EXPECT_EQ(watch->begun.count(), 0U) << "the second request is never run";
+}
+
+TEST_F(EndpointTest, OneThatIsClosedOnTheReadingThreadBeforeThereIsOneEndsAtOnce) {
+  auto [one, two] = socketPair();
+  server = makeSide(std::move(one));
+  server.endpoint->setExportedObject(recorder);
+  server.endpoint->closeOnReadingThread(QXError::system(ECONNABORTED, "enough"));
+  EXPECT_EQ(recorder.use_count(), 1);
+  EXPECT_THAT(server.closed->take(), IsSystemError(ECONNABORTED));
+}
+
 TEST_F(EndpointTest, AMessageOnAnEndedConnectionFailsOnAnotherThread) {
   connect(recorder);
   client.endpoint->close(QXError::system(ECONNABORTED, "enough"));

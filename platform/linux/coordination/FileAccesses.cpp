@@ -95,11 +95,16 @@ void FileAccesses::end(AccessNumber number, std::function<void()> ended) {
 
 void FileAccesses::tellThenRelease(AccessNumber number, const Written& written, std::function<void()> ended) {
   const auto& [access, directory] = written;
-  KeyedFile file{access.file, access.url};
-  if (directory) file = directory->whereIsNow(file);
+  const KeyedFile before{access.file, access.url};
+  KeyedFile file = directory ? directory->whereIsNow(before) : before;
+  FileOwner owner = coordinator_.ownerOf(file, LinuxFileCoordinator::DirectoryItself::counts);
+  // The room for a write was asked for where it began, at whoever was the owner there.
+  if (file.url != before.url && coordinator_.refusalOfWrite(owner, access.holder, file)) {
+    file = before;
+    owner = coordinator_.ownerOf(file, LinuxFileCoordinator::DirectoryItself::counts);
+  }
   // This outlives the telling.
-  coordinator_.tellFinishedWriting(coordinator_.ownerOf(file, LinuxFileCoordinator::DirectoryItself::counts), access.holder, file,
-                                   [this, number, ended = std::move(ended)] { release(number, ended); });
+  coordinator_.tellFinishedWriting(owner, access.holder, file, [this, number, ended = std::move(ended)] { release(number, ended); });
 }
 
 void FileAccesses::release(AccessNumber number, std::function<void()> ended) {

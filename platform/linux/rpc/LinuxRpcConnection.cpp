@@ -80,6 +80,6 @@ std::shared_ptr<QXRpcProxy> LinuxRpcConnection::remoteObjectProxy(QXErrorHandler
   return endpoint_->remoteObjectProxy(std::move(errorHandler));
 }
 
-void LinuxRpcConnection::close(const QXError& reason) { endpoint_->close(reason); }
+void LinuxRpcConnection::close(const QXError& reason) { endpoint_->closeOnReadingThread(reason); }
 
 }  // namespace docuvend::linux_platform

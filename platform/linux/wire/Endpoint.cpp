@@ -57,4 +57,8 @@ bool Endpoint::awaitsAnswers() const { return state_->awaitsAnswers(); }
 
 void Endpoint::close(const QXError& reason) { state_->close(reason, State::Farewell::tellPeer); }
 
+void Endpoint::closeOnReadingThread(const QXError& reason) {
+  state_->close(reason, State::Farewell::tellPeer, State::Cause::ordinary, State::Thread::reading);
+}
+
 }  // namespace docuvend::linux_platform

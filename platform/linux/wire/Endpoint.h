@@ -67,6 +67,8 @@ class Endpoint : public std::enable_shared_from_this<Endpoint> {
 
   // Ends the connection and tells the peer why; messages that wait for an answer fail. Waits for nothing and calls no handler itself.
   void close(const QXError& reason);
+  // The same, but the exported object is let go of on the reading thread, when what runs there now is done: its end may take long.
+  void closeOnReadingThread(const QXError& reason);
 
  private:
   class State;

@@ -26,10 +26,11 @@
 // No handler is called with the mutex held. Replies and failures that arrive run on the reading thread; failures that this end finds by
 // itself, also those of the connection's end, are posted to the reactor, so that nobody is called back from inside `send` or `close`.
 //
-// The end comes once. Whoever brings it about takes everything out under the mutex: waiting calls, exported object, registration,
-// socket. A reading thread that is still at work has its own hold on the socket, so the descriptor's number is not reused under it. A
-// socket that cannot be written any more is not the end yet: what the peer has said by then, perhaps why it left, is still to be read.
-// Nothing is kept for it any more, and it says nothing further: who takes no answers is not served on.
+// The end comes once. Whoever brings it about takes everything out under the mutex: waiting calls, registration, socket. Letting go of the
+// exported object takes as long as its last users make it, so who must not wait for that leaves it to the reading thread. A reading thread
+// that is still at work has its own hold on the socket, so the descriptor's number is not reused under it. A socket that cannot be written
+// any more is not the end yet: what the peer has said by then, perhaps why it left, is still to be read. Nothing is kept for it any more,
+// and it says nothing further: who takes no answers is not served on.
 
 namespace docuvend::linux_platform {
 
@@ -221,21 +222,16 @@ void Endpoint::State::postFailure(std::shared_ptr<const FailureHandler> failureH
   post_([failureHandler = std::move(failureHandler), error = std::move(error), fate] { (*failureHandler)(error, fate); });
 }
 
-void Endpoint::State::close(const QXError& reason, Farewell farewell, Cause cause) {
-  std::shared_ptr<Reactor::Registration> registration;
-  std::shared_ptr<const UniqueDescriptor> socket;
-  std::vector<OutgoingCalls::Lost> failed;
-  OutgoingCalls::Forgotten forgotten;
-  std::function<void()> unheardPong;
+void Endpoint::State::close(const QXError& reason, Farewell farewell, Cause cause, Thread thread) {
+  std::optional<Ending> ending;
+  std::shared_ptr<Reactor::Registration> toBeWoken;
   {
     const std::lock_guard lock(mutex_);
     if (closed_) return;
     closed_ = reason;
-    unheardPong.swap(onPong_);
-    failed = outgoing_.settleAll(writer_.unwritten(), forgotten);
-    if (cause == Cause::neverTaken) {
-      for (auto& lost : failed) lost.fate = MessageFate::unsent;
-    }
+    ending.emplace(Ending{reason, cause, {}, {}, {}, {}, {}});
+    ending->unheardPong.swap(onPong_);
+    ending->failed = outgoing_.settleAll(writer_.unwritten(), ending->forgotten);
     if (farewell == Farewell::tellPeer && !writer_.isOver()) {
       auto encoded = encodeFrame(EndFrame{reason});
       if (auto* bytes = std::get_if<EncodedFrame>(&encoded)) {
@@ -244,16 +240,40 @@ void Endpoint::State::close(const QXError& reason, Farewell farewell, Cause caus
       }
     }
     writer_ = {};
-    registration.swap(registration_);
-    socket.swap(socket_);
-    ::shutdown(socket->get(), SHUT_RDWR);
+    ending->registration.swap(registration_);
+    ending->socket.swap(socket_);
+    ::shutdown(ending->socket->get(), SHUT_RDWR);
+    if (thread == Thread::reading && ending->registration) {
+      toBeWoken = ending->registration;
+      ending_.swap(ending);
+    }
   }
+  if (toBeWoken) {
+    toBeWoken->rearm(kReadable);
+  } else {
+    finish(*std::move(ending));
+  }
+}
+
+void Endpoint::State::finishEnding() {
+  std::optional<Ending> ending;
+  {
+    const std::lock_guard lock(mutex_);
+    ending.swap(ending_);
+  }
+  if (ending) finish(*std::move(ending));
+}
+
+void Endpoint::State::finish(Ending ending) {
   if (untaken_) static_cast<void>(untaken_->isEmpty());  // looks, and lets go of what need not be kept
-  registration.reset();                                  // while the socket is still held: its number must not be another's
+  ending.registration.reset();                           // while the socket is still held: its number must not be another's
   incoming.release();
-  unheardPong = nullptr;
-  post_([failed = std::move(failed), blame = cause == Cause::misbehaviour ? handlers_.onMisbehaviour : nullptr, onClose = handlers_.onClose,
-         reason] {
+  ending.unheardPong = nullptr;
+  if (ending.cause == Cause::neverTaken) {
+    for (auto& lost : ending.failed) lost.fate = MessageFate::unsent;
+  }
+  post_([failed = std::move(ending.failed), blame = ending.cause == Cause::misbehaviour ? handlers_.onMisbehaviour : nullptr,
+         onClose = handlers_.onClose, reason = std::move(ending.reason)] {
     if (blame) blame(reason);
     for (const auto& [call, fate] : failed) {
       if (*call.failureHandler) (*call.failureHandler)(reason, fate);

@@ -9,6 +9,7 @@
 #include <mutex>
 #include <optional>
 #include <utility>
+#include <vector>
 
 #include "platform/linux/wire/Endpoint.h"
 #include "platform/linux/wire/FrameReader.h"
@@ -45,7 +46,9 @@ class Endpoint::State final : public AnswerSink, public std::enable_shared_from_
   void sendFailure(FailureFrame failure) override;
   void ping(std::function<void()> onPong);
   [[nodiscard]] bool awaitsAnswers();
-  void close(const QXError& reason, Farewell farewell, Cause cause = Cause::ordinary);
+  // Which thread lets go of what the connection had: this one, or the reading one as soon as it has time.
+  enum class Thread { calling, reading };
+  void close(const QXError& reason, Farewell farewell, Cause cause = Cause::ordinary, Thread thread = Thread::calling);
 
   IncomingCalls incoming;
 
@@ -54,6 +57,17 @@ class Endpoint::State final : public AnswerSink, public std::enable_shared_from_
   static constexpr std::uint32_t kWritable = EPOLLOUT;
 
   enum class Delivery { underway, overBound, refused };
+
+  // What is taken out of a connection that is over.
+  struct Ending {
+    QXError reason;
+    Cause cause;
+    std::shared_ptr<Reactor::Registration> registration;
+    std::shared_ptr<const UniqueDescriptor> socket;
+    std::vector<OutgoingCalls::Lost> failed;
+    OutgoingCalls::Forgotten forgotten;
+    std::function<void()> unheardPong;
+  };
 
   // On the reading thread.
   std::uint32_t ready(std::uint32_t events);
@@ -74,6 +88,8 @@ class Endpoint::State final : public AnswerSink, public std::enable_shared_from_
   void closeMalformed(const Malformed& malformed);
   // The peer has ended the connection.
   void closeForPeer(const QXError& reason);
+  // What another thread has left to this one.
+  void finishEnding();
 
   // With the mutex held.
   Delivery write();
@@ -89,6 +105,7 @@ class Endpoint::State final : public AnswerSink, public std::enable_shared_from_
   void write(const Frame& frame);
   // Ends the connection when the peer cannot be given what is due to it; it would wait for ever.
   void closeUnlessUnderway(Delivery delivery);
+  void finish(Ending ending);
   std::shared_ptr<const UniqueDescriptor> openSocket();
   void postFailure(std::shared_ptr<const FailureHandler> failureHandler, QXError error, MessageFate fate) const;
 
@@ -114,6 +131,7 @@ class Endpoint::State final : public AnswerSink, public std::enable_shared_from_
   std::function<void()> onPong_;    // empty: none is awaited
   std::uint64_t lastPongsEnd_ = 0;  // in the writer's stream
   std::optional<QXError> closed_;
+  std::optional<Ending> ending_;  // left to the reading thread
 };
 
 }  // namespace docuvend::linux_platform

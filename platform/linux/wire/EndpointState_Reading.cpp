@@ -12,14 +12,14 @@ namespace docuvend::linux_platform {
 
 std::uint32_t Endpoint::State::ready(std::uint32_t events) {
   const auto socket = openSocket();
-  if (!socket) return 0;
-  if (isTakingAnswers()) {
+  if (socket && isTakingAnswers()) {
     if (mayHoldFrames_) {
       runFrames();
     } else if ((events & ~kWritable) != 0) {
       read(socket->get());
     }
   }
+  finishEnding();
   return wantedNext();
 }
 
