@@ -283,21 +283,23 @@ TEST_F(UnseenBundlesTest, TheFirstLookFindsOnlyWhatComesBeforeWhatItMisses) {
 TEST_F(UnseenBundlesTest, AnIdentifierStaysWithItsDirectoryWhileWhatComesBeforeIsMissed) {
   BundleHouse::install(user("b"), "org.b");
   BundleHouse::install(user("c"), "org.c");
+  BundleHouse::install(user("d"), "org.d");
   BundleScan scan(house_.paths, house_.propertyLists, house_.log.defaultLog());
-  ASSERT_THAT(scan.run().bundles, SizeIs(2));
+  ASSERT_THAT(scan.run().bundles, SizeIs(3));
   BundleHouse::install(user("a"), "org.b");
   fs::rename(user("c"), house_.root() + "/aside");
   BundleHouse::install(user("c"), "org.c");
+  fs::rename(user("d"), user("e"));
   looks_.failAt("opendir", house_.paths.systemBundles, EMFILE);
   for (int look = 0; look < 2; ++look) {
     const auto bundles = scan.run().bundles;
-    EXPECT_THAT(bundles, ElementsAre(Pair("org.b", ::testing::_))) << "another directory is in the place of org.c's";
+    EXPECT_THAT(bundles, ElementsAre(Pair("org.b", ::testing::_))) << "another is in the place of org.c's, and org.d's in another";
     EXPECT_EQ(bundles.at("org.b").directory, user("b"));
   }
   EXPECT_THAT(house_.log.texts(), IsEmpty());
   looks_.failWith({});
   const auto bundles = scan.run().bundles;
-  EXPECT_THAT(bundles, SizeIs(2));
+  EXPECT_THAT(bundles, SizeIs(3));
   EXPECT_EQ(bundles.at("org.b").directory, user("a"));
 }
 

@@ -144,13 +144,12 @@ void BundleScan::scanBundle(const std::string& directory, BundleOrigin origin, c
   add(std::get<ParsedBundle>(reading));
 }
 
-// As it was, if this very directory is still there and still nobody else's. Another in its place may be the same bundle, updated: it is no
-// bundle until it is read, but what was there stays known, or a look that passes over it as unsettled would let another have its
-// identifier.
+// As it was, if this very directory is still there and still nobody else's. Otherwise it is no bundle until it is read, but what was there
+// stays known: a look that then passes over its update as unsettled would let another have its identifier.
 void BundleScan::keep(const ParsedBundle& last) {
   const auto there = incarnationOf(last.bundle.directory);
   if (const auto* incarnation = std::get_if<std::string>(&there); incarnation != nullptr && *incarnation != last.bundle.incarnation) {
-    if (!incarnation->empty()) parsed_.insert_or_assign(last.bundle.directory, last);
+    parsed_.insert_or_assign(last.bundle.directory, last);
     return;
   }
   const auto distrusted = distrustOf(last);
