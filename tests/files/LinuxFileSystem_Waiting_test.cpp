@@ -103,6 +103,12 @@ TEST_F(LinuxFileSystemWaiting, WhatLiesBesideADirectoryOutsideTheCacheIsAnswered
   for (const char* item : {"group/items/file", "group/items", "group/file", "group/missing"}) EXPECT_EQ(lies(item), kMissing) << item;
 }
 
+TEST_F(LinuxFileSystemWaiting, ALinkOutsideTheCacheIsNoDirectoryEither) {
+  fs::create_directory_symlink("items", path("group/link"));
+  hideFromCache("group/link");
+  EXPECT_EQ(lies("group/items/file", "group/link"), kOfDirectory - ENOTDIR);
+}
+
 TEST_F(LinuxFileSystemWaiting, ADirectoryInTheCacheIsLookedAtThereAlone) {
   EXPECT_EQ(lies("group/items/file"), kContains);
   EXPECT_EQ(lies("group2/file"), kOther);
@@ -164,8 +170,12 @@ TEST_F(LinuxFileSystemWaiting, ADirectoryThatIsNamedByDotsDoesNotLieWhereItsName
     ASSERT_TRUE(std::holds_alternative<QXRelationship>(answer)) << name;
     EXPECT_EQ(std::get<QXRelationship>(answer), QXRelationship::contains) << name;
   }
+  hideFromCache("group/items/.");
+  EXPECT_EQ(lies("group/items", "group/items/."), kSame);
+  const QXURL root = QXURL::fileURL("/", QXURLKind::directory);
   calls_.failInCache("/", EAGAIN, kAlways);
-  EXPECT_EQ(std::get<QXRelationship>(fileSystem_.relationship(QXURL::fileURL("/", QXURLKind::directory), item)), QXRelationship::contains);
+  EXPECT_EQ(std::get<QXRelationship>(fileSystem_.relationship(root, item)), QXRelationship::contains);
+  EXPECT_EQ(std::get<QXRelationship>(fileSystem_.relationship(root, root)), QXRelationship::same);
 }
 
 TEST_F(LinuxFileSystemWaiting, ANameThatLooksRemovedIsNotLookedUpForWhatLiesElsewhere) {

@@ -38,14 +38,11 @@ bool isDirectory(const std::string& path) {
   return ::stat(path.c_str(), &status) == 0 && S_ISDIR(status.st_mode);
 }
 
-// Where the last name of the path is looked up. None when that name is none of a thing that lies there.
+// Where the last name of the absolute path is looked up. None when that name is none of a thing that lies there.
 std::optional<FilePlace> placeAround(const std::string& path) {
-  const std::size_t last = path.find_last_not_of('/');
-  if (last == std::string::npos) return std::nullopt;
-  const std::size_t slash = path.rfind('/', last);
-  if (slash == std::string::npos) return std::nullopt;
-  const std::string name = path.substr(slash + 1, last - slash);
-  if (name == "." || name == "..") return std::nullopt;
+  const std::size_t slash = path.rfind('/');
+  const std::string name = path.substr(slash + 1);
+  if (name.empty() || name == "." || name == "..") return std::nullopt;
   auto found = FilePlace::ofDirectory(path.substr(0, slash + 1));
   auto* place = std::get_if<FilePlace>(&found);
   if (place == nullptr) return std::nullopt;
