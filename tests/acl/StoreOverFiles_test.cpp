@@ -1,5 +1,6 @@
 // The store over this machine's files: what one store has written, the next one reads.
 #include <gtest/gtest.h>
+#include <sys/resource.h>
 
 #include <memory>
 #include <set>
@@ -88,6 +89,24 @@ TEST_F(StoreOverFiles, AFileThatMayNotBeReadIsAnErrorAndAnEmptyListAndIsKeptBesi
   std::filesystem::permissions(file() + ".unreadable-1", std::filesystem::perms::owner_read);
   EXPECT_NE(test::readText(file() + ".unreadable-1").find("old"), std::string::npos);
   EXPECT_EQ(test::readText(file()).find("old"), std::string::npos);
+}
+
+// The next grant would be all that is left of the list.
+TEST_F(StoreOverFiles, AFileThatThereWasNoDescriptorToReadWithAtTheStartIsKeptBeside) {
+  ASSERT_EQ(fileSystem_.createDirectory(home_.path("Library/Docuvend")), std::nullopt);
+  linux_platform::LinuxPropertyLists ofAnEarlierProcess;
+  ASSERT_TRUE(ofAnEarlierProcess.writeXMLAtomically(
+      {{kProvider.value, QXDictionary{{kConsumer.value, QXDictionary{{"AllowedItemIDs", QXArray{"old"}}}}}}}, file()));
+  rlimit usual{};
+  ASSERT_EQ(::getrlimit(RLIMIT_NOFILE, &usual), 0);
+  const rlimit none{0, usual.rlim_max};
+  ASSERT_EQ(::setrlimit(RLIMIT_NOFILE, &none), 0);
+  const auto next = nextStore();
+  ASSERT_EQ(::setrlimit(RLIMIT_NOFILE, &usual), 0);
+  next->allowProviderWithIdentifier(kProvider, ItemID{"new"}, kConsumer);
+  EXPECT_NE(test::readText(file() + ".unreadable-1").find("old"), std::string::npos);
+  next->allowProviderWithIdentifier(kProvider, ItemID{"newer"}, kConsumer);
+  EXPECT_FALSE(fileSystem_.exists(file() + ".unreadable-2")) << "once";
 }
 
 TEST_F(StoreOverFiles, TheFirstGrantReplacesAFileThatIsNoPropertyList) {

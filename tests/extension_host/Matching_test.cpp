@@ -74,7 +74,6 @@ TEST(Matching, ASuccessorHasAllThatAProcessHas) {
       {"executable", [](Bundle& changed) { changed.executable = "/e"; }},
       {"info", [](Bundle& changed) { changed.info.emplace("k", "v"); }},
       {"incarnation", [](Bundle& changed) { changed.incarnation = "2"; }},
-      {"directory", [](Bundle& changed) { changed.directory = "/d"; }},
       {"a group more", [](Bundle& changed) { changed.groups.emplace("f", "/f"); }},
   };
   for (const auto& [name, change] : successors) {
@@ -84,6 +83,7 @@ TEST(Matching, ASuccessorHasAllThatAProcessHas) {
   }
   const Changes others = {
       {"identifier", [](Bundle& changed) { changed.identifier = "b"; }},
+      {"directory", [](Bundle& changed) { changed.directory = "/d"; }},
       {"container", [](Bundle& changed) { changed.container = "/c"; }},
       {"an entitlement less", [](Bundle& changed) { changed.entitlements.clear(); }},
       {"a group less", [](Bundle& changed) { changed.groups.erase("g"); }},

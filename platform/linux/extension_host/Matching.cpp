@@ -22,7 +22,8 @@ bool isSameInstallation(const Bundle& a, const Bundle& b) {
 }
 
 bool isSuccessor(const Bundle& before, const Bundle& now) {
-  return before.identifier == now.identifier && before.container == now.container && before.entitlements == now.entitlements &&
+  return before.identifier == now.identifier && before.directory == now.directory && before.container == now.container &&
+         before.entitlements == now.entitlements &&
          std::includes(now.groups.begin(), now.groups.end(), before.groups.begin(), before.groups.end());
 }
 

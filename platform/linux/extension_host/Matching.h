@@ -12,8 +12,8 @@ namespace docuvend::linux_platform {
 // True when nothing has been installed, updated or decided anew between the two: a process started from one is as good as from the other.
 [[nodiscard]] bool isSameInstallation(const Bundle& a, const Bundle& b);
 
-// True when a process that was started from the bundle before has nothing which the one that is installed now under that identifier has
-// not: the container and the entitlements are the same, and it is still in all of its groups.
+// True when the bundle that is installed now is in the place of the one before, and a process that was started from that has nothing which
+// this one has not: the container and the entitlements are the same, and it is still in all of its groups.
 [[nodiscard]] bool isSuccessor(const Bundle& before, const Bundle& now);
 
 }  // namespace docuvend::linux_platform

@@ -25,7 +25,16 @@ bool isAbsence(int error) { return error == ENOENT || error == ENOTDIR; }
 
 std::unique_ptr<std::istream> LinuxPropertyLists::openStream(const std::string& path) {
   UniqueDescriptor file(::open(path.c_str(), O_RDONLY | O_NONBLOCK | O_NOCTTY | O_CLOEXEC));
-  if (!file && (isAbsence(errno) || isShortage(errno))) return nullptr;
+  const int error = errno;
+  {
+    const std::lock_guard lock(mutex_);
+    if (!file && isShortage(error)) {
+      unread_.insert(path);
+    } else {
+      unread_.erase(path);
+    }
+  }
+  if (!file && (isAbsence(error) || isShortage(error))) return nullptr;
   struct stat status {};
   if (file && (::fstat(file.get(), &status) != 0 || !S_ISREG(status.st_mode))) file.reset();
   return std::make_unique<DescriptorStream>(std::move(file));
@@ -76,6 +85,10 @@ bool LinuxPropertyLists::holdsSomethingElse(const std::string& path) {
   {
     const std::lock_guard lock(mutex_);
     if (const auto found = written_.find(path); found != written_.end() && found->second == stampOf(status)) return false;
+  }
+  {
+    const std::lock_guard lock(mutex_);
+    if (unread_.contains(path)) return true;
   }
   const auto stream = openStream(path);
   return !stream || read(*stream).error;

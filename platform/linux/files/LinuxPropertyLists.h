@@ -12,6 +12,7 @@
 #include <map>
 #include <memory>
 #include <mutex>
+#include <set>
 #include <string>
 
 #include "platform/property_list.h"
@@ -39,11 +40,14 @@ class LinuxPropertyLists : public QXPropertyLists {
   };
 
   [[nodiscard]] static Stamp stampOf(const struct stat& status);
-  // Whether something is at the path that is no property list. A file that this object wrote is not read again to know.
+  // Whether something is at the path that is no property list, or that nobody has been able to read. A file that this object wrote is not
+  // read again to know.
   [[nodiscard]] bool holdsSomethingElse(const std::string& path);
 
   std::mutex mutex_;
-  std::map<std::string, Stamp> written_;  // guarded by mutex_
+  // Guarded by mutex_.
+  std::map<std::string, Stamp> written_;
+  std::set<std::string> unread_;  // could not be opened when that was last tried, for want of descriptors or memory
 };
 
 }  // namespace docuvend::linux_platform
