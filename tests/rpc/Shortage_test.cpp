@@ -6,13 +6,14 @@
 #include <unistd.h>
 
 #include <memory>
+#include <optional>
 #include <string>
 #include <utility>
 #include <variant>
 
-#include "platform/linux/wire/FrameWriter.h"
 #include "tests/rpc/RpcDrivers.h"
 #include "tests/wire/TakingPeer.h"
+#include "tests/wire/UsedUpPassing.h"
 
 namespace docuvend::linux_platform {
 namespace {
@@ -92,24 +93,13 @@ TEST_F(ShortageTest, APeerThatCannotBeLookedAtIsTurnedAwayUntilItCanAndServedAsN
 TEST_F(ShortageTest, APeerToWhichTheSystemPassesNoFileOnIsToldSoAndSoIsTheUser) {
   auto peer = connect();
   ASSERT_TRUE(peer.take<Hello>());
-  auto [filled, unread] = tests::socketPair();
-  FrameWriter filler;
-  rlimit usual{};
-  ASSERT_EQ(::getrlimit(RLIMIT_NOFILE, &usual), 0);
-  const rlimit tight{64, usual.rlim_max};
-  ASSERT_EQ(::setrlimit(RLIMIT_NOFILE, &tight), 0);
-  auto progress = FrameWriter::Progress::drained;
-  for (int i = 0; i < 200 && progress == FrameWriter::Progress::drained; ++i) {
-    filler.add(std::get<EncodedFrame>(encodeFrame(ReplyFrame{1, {QXValue(toValue(nothing()))}})));
-    progress = filler.write(filled.get());
-  }
+  std::optional<tests::UsedUpPassing> usedUp(std::in_place);
   const bool isAsked = askForAFile(peer);
   const auto failure = peer.take<FailureFrame>();
-  ASSERT_EQ(::setrlimit(RLIMIT_NOFILE, &usual), 0);
+  usedUp.reset();
   ASSERT_TRUE(isAsked);
   ASSERT_TRUE(failure);
   EXPECT_EQ(failure->error.code, static_cast<std::int64_t>(QXRpcErrorCode::tooManyCalls));
-  unread.reset();
   expectServed();
   EXPECT_THAT(driver_.log.entries(),
               ElementsAre(fake_platform::FakeLogEntry{QXLogType::fault,

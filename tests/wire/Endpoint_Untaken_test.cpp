@@ -12,6 +12,7 @@
 #include "platform/linux/wire/FrameWriter.h"
 #include "tests/wire/EndpointTest.h"
 #include "tests/wire/TakingPeer.h"
+#include "tests/wire/UsedUpPassing.h"
 
 namespace docuvend::linux_platform {
 namespace {
@@ -202,22 +203,11 @@ TEST_F(UntakenEndpointTest, NothingOfAConnectionThatIsOverIsKeptWhenItsPeerHasTa
 TEST_F(UntakenEndpointTest, AnAnswerThatTheSystemDoesNotPassOnFailsWithATellingAndTheConnectionGoesOn) {
   auto peer = connectTaking({});
   ASSERT_TRUE(peer.take<Hello>());
-  auto [filled, unread] = socketPair();
-  FrameWriter filler;
-  rlimit usual{};
-  ASSERT_EQ(::getrlimit(RLIMIT_NOFILE, &usual), 0);
-  const rlimit tight{64, usual.rlim_max};
-  ASSERT_EQ(::setrlimit(RLIMIT_NOFILE, &tight), 0);
-  auto progress = FrameWriter::Progress::drained;
-  for (int i = 0; i < 200 && progress == FrameWriter::Progress::drained; ++i) {
-    filler.add(std::get<EncodedFrame>(encodeFrame(ReplyFrame{1, {QXValue(toValue(nothing()))}})));
-    progress = filler.write(filled.get());
-  }
+  std::optional<tests::UsedUpPassing> usedUp(std::in_place);
   const bool asked = askFor(peer, 1) && peer.write(Frame(RequestFrame{2, true, "unknown", {}}));
   const auto failure = peer.take<FailureFrame>();
   const auto next = peer.take<FailureFrame>();
-  ASSERT_EQ(::setrlimit(RLIMIT_NOFILE, &usual), 0);
-  EXPECT_EQ(progress, FrameWriter::Progress::refused);
+  usedUp.reset();
   ASSERT_TRUE(asked);
   ASSERT_TRUE(failure);
   EXPECT_EQ(failure->callID, 1U);
@@ -226,7 +216,6 @@ TEST_F(UntakenEndpointTest, AnAnswerThatTheSystemDoesNotPassOnFailsWithATellingA
   ASSERT_TRUE(next);
   EXPECT_EQ(next->callID, 2U);
   EXPECT_TRUE(server.unpassed->take());
-  unread.reset();
   ASSERT_TRUE(askFor(peer, 1, 3));
   EXPECT_TRUE(isFile(peer.take<ReplyFrame>())) << "it may be asked again";
   EXPECT_EQ(server.closed->count(), 0U);
